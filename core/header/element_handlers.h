@@ -1,0 +1,14 @@
+#pragma once
+// The handlers of the element walker's table. Each is called with the stream
+// at the element's data and answers a core status (0 taken, 5, 12, 48).
+
+#include "core/file_model.h"
+#include "stream/mkvvstream.h"
+
+int ebml_document_header_handler(mkv_file_info* info, mkvvstream* stream, uint32_t* id, uint64_t* size);
+int mkv_info_handler(mkv_file_info* info, mkvvstream* stream, uint32_t* id, uint64_t* size);
+
+// The bound of string elements: the creator's limit, or none.
+inline uint64_t string_limit(const mkv_file_info* info) {
+  return info->parse_limits ? info->parse_limits->max_string_size : UINT64_MAX;
+}

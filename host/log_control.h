@@ -1,0 +1,18 @@
+#pragma once
+// Controls of the host's AoLog: where messages go, for the tool and for tests.
+
+#include <functional>
+#include <string>
+
+namespace host {
+
+// Messages at this level or below go to stderr (lower numbers are more severe).
+// The default shows failures and degraded results (levels up to 3).
+void SetLogThreshold(int level);
+
+// Every message, whatever its level, is also handed to the capture function
+// while one is set. Pass an empty function to remove it.
+using LogCapture = std::function<void(int level, const std::string& text)>;
+void SetLogCapture(LogCapture capture);
+
+}  // namespace host

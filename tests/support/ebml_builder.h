@@ -1,0 +1,110 @@
+#pragma once
+// A readable builder for crafted EBML bytes:
+//   master(kSegment, {master(kInfo, {uinteger(kTimecodeScale, 1000000)})})
+// Sizes are written in their shortest form unless a width is given.
+
+#include <cstdint>
+#include <initializer_list>
+#include <string_view>
+#include <vector>
+
+namespace ebml {
+
+using Bytes = std::vector<uint8_t>;
+
+// IDs as read, with their length-marker bits.
+enum : uint32_t {
+  kEbmlHeader = 0x1A45DFA3,
+  kEbmlVersion = 0x4286,
+  kEbmlReadVersion = 0x42F7,
+  kEbmlMaxIdLength = 0x42F2,
+  kEbmlMaxSizeLength = 0x42F3,
+  kDocType = 0x4282,
+  kDocTypeVersion = 0x4287,
+  kDocTypeReadVersion = 0x4285,
+  kSegment = 0x18538067,
+  kVoid = 0xEC,
+  kCrc32 = 0xBF,
+  kSeekHead = 0x114D9B74,
+  kSeek = 0x4DBB,
+  kSeekId = 0x53AB,
+  kSeekPosition = 0x53AC,
+  kInfo = 0x1549A966,
+  kSegmentUid = 0x73A4,
+  kSegmentFilename = 0x7384,
+  kTimecodeScale = 0x2AD7B1,
+  kDuration = 0x4489,
+  kDateUtc = 0x4461,
+  kTitle = 0x7BA9,
+  kMuxingApp = 0x4D80,
+  kWritingApp = 0x5741,
+  kCluster = 0x1F43B675,
+  kTimecode = 0xE7,
+  kSimpleBlock = 0xA3,
+  kBlockGroup = 0xA0,
+  kBlock = 0xA1,
+  kBlockDuration = 0x9B,
+  kReferenceBlock = 0xFB,
+  kTracks = 0x1654AE6B,
+  kTrackEntry = 0xAE,
+  kTrackNumber = 0xD7,
+  kTrackUid = 0x73C5,
+  kTrackType = 0x83,
+  kCodecId = 0x86,
+  kCodecPrivate = 0x63A2,
+  kDefaultDuration = 0x23E383,
+  kVideo = 0xE0,
+  kPixelWidth = 0xB0,
+  kPixelHeight = 0xBA,
+  kAudio = 0xE1,
+  kSamplingFrequency = 0xB5,
+  kChannels = 0x9F,
+  kBitDepth = 0x6264,
+  kContentEncodings = 0x6D80,
+  kContentEncoding = 0x6240,
+  kContentCompression = 0x5034,
+  kContentCompAlgo = 0x4254,
+  kContentCompSettings = 0x4255,
+  kCues = 0x1C53BB6B,
+  kCuePoint = 0xBB,
+  kCueTime = 0xB3,
+  kCueTrackPositions = 0xB7,
+  kCueTrack = 0xF7,
+  kCueClusterPosition = 0xF1,
+  kCueBlockNumber = 0x5378,
+  kTags = 0x1254C367,
+  kTag = 0x7373,
+  kSimpleTag = 0x67C8,
+  kTagName = 0x45A3,
+  kTagString = 0x4487,
+  kTagBinary = 0x4485,
+  kAttachments = 0x1941A469,
+  kChapters = 0x1043A770,
+};
+
+// The EBML unknown-size value, as an 8-byte size field writes it.
+constexpr uint64_t kUnknownSize = 0x00FFFFFFFFFFFFFF;
+
+Bytes id_bytes(uint32_t id);
+// A size field; width 0 picks the shortest that holds the value.
+Bytes size_bytes(uint64_t size, int width = 0);
+
+Bytes element(uint32_t id, const Bytes& payload, int size_width = 0);
+Bytes master(uint32_t id, std::initializer_list<Bytes> children);
+// A master whose size field claims `size` whatever the children add up to.
+Bytes master_sized(uint32_t id, uint64_t size, std::initializer_list<Bytes> children, int size_width = 0);
+Bytes unknown_size(uint32_t id, std::initializer_list<Bytes> children);
+Bytes uinteger(uint32_t id, uint64_t value, int width = 0);  // width 0: shortest, at least one byte
+Bytes sinteger(uint32_t id, int64_t value, int width);
+Bytes str(uint32_t id, std::string_view text);
+Bytes f32(uint32_t id, float value);
+Bytes f64(uint32_t id, double value);
+Bytes bin(uint32_t id, const Bytes& payload);
+Bytes cat(std::initializer_list<Bytes> parts);
+// n bytes of `fill`.
+Bytes filler(size_t n, uint8_t fill = 0);
+
+// An EBML header with the usual versions and the given DocType.
+Bytes ebml_header(std::string_view doc_type = "matroska");
+
+}  // namespace ebml

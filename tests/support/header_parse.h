@@ -1,0 +1,45 @@
+#pragma once
+// Runs the header parse over bytes in memory, the way the filter's creators do,
+// and keeps everything alive for the test to inspect.
+
+#include <memory>
+
+#include "core/file_model.h"
+#include "host/input_streams.h"
+#include "stream/mkvvstream.h"
+#include "tests/support/ebml_builder.h"
+
+namespace testing_support {
+
+struct HeaderParseOptions {
+  int64_t buffer_size = 480;
+  bool seekable = true;
+  bool with_limits = true;  // the creators' limits: 8192-byte strings
+};
+
+class HeaderParse {
+ public:
+  explicit HeaderParse(ebml::Bytes bytes, HeaderParseOptions options = {});
+  ~HeaderParse();
+  HeaderParse(const HeaderParse&) = delete;
+  HeaderParse& operator=(const HeaderParse&) = delete;
+
+  // parse_mkvfile's answer; valid_mkv's with Validate().
+  int Parse();
+  int Validate();
+
+  mkv_file_info& info() { return *info_; }
+  mkvvstream& stream() { return stream_; }
+  host::InputStream& input() { return *input_; }
+  bool stream_ready() const { return stream_ready_; }
+
+ private:
+  ebml::Bytes bytes_;
+  std::unique_ptr<host::InputStream> input_;
+  mkvvstream stream_{};
+  bool stream_ready_ = false;
+  mkv_parse_limits limits_{kDefaultMaxStringSize, 1};
+  std::unique_ptr<mkv_file_info> info_;
+};
+
+}  // namespace testing_support

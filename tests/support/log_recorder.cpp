@@ -1,0 +1,34 @@
+#include "tests/support/log_recorder.h"
+
+#include "host/log_control.h"
+
+namespace testing_support {
+
+LogRecorder::LogRecorder() {
+  host::SetLogCapture([this](int level, const std::string& text) {
+    std::lock_guard lock(mutex_);
+    messages_.emplace_back(level, text);
+  });
+}
+
+LogRecorder::~LogRecorder() { host::SetLogCapture({}); }
+
+std::vector<std::pair<int, std::string>> LogRecorder::messages() const {
+  std::lock_guard lock(mutex_);
+  return messages_;
+}
+
+bool LogRecorder::Contains(int level, const std::string& text) const {
+  std::lock_guard lock(mutex_);
+  for (const auto& [l, t] : messages_) {
+    if (l == level && t == text) return true;
+  }
+  return false;
+}
+
+void LogRecorder::Clear() {
+  std::lock_guard lock(mutex_);
+  messages_.clear();
+}
+
+}  // namespace testing_support

@@ -1,0 +1,5 @@
+#pragma once
+// The kelvane tool's commands. Each takes the arguments after its name and
+// answers the process exit code: 0 ok, 1 the file was refused or failed, 2 usage.
+
+int RunInfo(int argc, char** argv);
