@@ -63,11 +63,11 @@ int mkvvstream_init(mkvvstream* stream, const MmfInputStream* input, int64_t buf
   stream->stream_length = input->Ops->Length(input->Handle);
   if (!buffered) return 0;
 
+  if (buffer_size < 0) return -1;
   int64_t size = buffer_size;
   if (stream->stream_length != 0 && stream->stream_length <= static_cast<uint64_t>(buffer_size)) {
     size = static_cast<int64_t>(stream->stream_length);
   }
-  if (size < 0) return -1;
   stream->buffer = static_cast<uint8_t*>(mem_alloc(static_cast<size_t>(size)));
   if (!stream->buffer) return -1;
   stream->buffer_size = size;
