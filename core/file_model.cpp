@@ -48,6 +48,11 @@ void free_track(mkv_track_info& track) {
 
 }  // namespace
 
+void free_cue_points(mkv_queue* cue_points) {
+  free_queue<mkv_cue_point>(*cue_points, free_cue_point);
+  *cue_points = mkv_queue{};
+}
+
 void destroy_mkv_file_info(mkv_file_info* info) {
   if (!info) return;
   int seek_lists = info->seek_head_count < kMaxSeekLists ? info->seek_head_count : kMaxSeekLists;

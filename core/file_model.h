@@ -104,6 +104,10 @@ struct mkv_file_info {
 // `parse_limits`. Afterwards the record is dead: a new parse needs a zeroed one.
 void destroy_mkv_file_info(mkv_file_info* info);
 
+// Frees every cue point of the list with its track positions and references,
+// and leaves the list empty.
+void free_cue_points(mkv_queue* cue_points);
+
 // Offsets of the Info block, for handlers that zero it as a unit.
 constexpr auto kInfoBlockBegin = __builtin_offsetof(mkv_file_info, segment_uid);
 constexpr auto kInfoBlockEnd = __builtin_offsetof(mkv_file_info, cue_points);

@@ -4,6 +4,7 @@
 
 #include "core/header/ebml_read.h"
 #include "core/header/element_handlers.h"
+#include "core/metadata_list.h"
 #include "core/status.h"
 #include "platform/ao_log.h"
 
@@ -17,15 +18,15 @@ const mkv_element_row element_list[] = {
     {kSegmentId, "Matroska Segment", nullptr},
     {0xEC, "Void", nullptr},
     {0xBF, "CRC-32", nullptr},
-    {0x114D9B74, "SeekHead", nullptr},
+    {0x114D9B74, "SeekHead", mkv_meta_seek_handler},
     {0x1549A966, "Info", mkv_info_handler},
     {kClusterId, "Cluster", nullptr},
     {0x1654AE6B, "Tracks", nullptr},
     {0xAE, "TrackEntry", nullptr},
-    {0x1C53BB6B, "Cues", nullptr},
+    {0x1C53BB6B, "Cues", mkv_cue_handler},
     {0x1941A469, "Attachments", nullptr},
     {0x1043A770, "Chapters", nullptr},
-    {0x1254C367, "Tags", nullptr},
+    {0x1254C367, "Tags", mkv_tag_handler},
     {0, nullptr, nullptr},
 };
 
@@ -128,6 +129,10 @@ int parse_mkvfile(mkv_file_info* info, mkvvstream* stream) {
   } while (status == kStatusOk);
 
   if (status == kStatusNoMemory) return kParseNoMemory;
-  if ((info->parse_flags & kRequiredParseFlags) == kRequiredParseFlags) return kParseSucceeded;
+  if ((info->parse_flags & kRequiredParseFlags) == kRequiredParseFlags) {
+    // A list that could not be completed still leaves a usable file.
+    (void)FinalizeMetadata(info);
+    return kParseSucceeded;
+  }
   return status == kStatusMalformed ? kParseMalformed : kParseIncomplete;
 }
