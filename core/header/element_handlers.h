@@ -7,6 +7,8 @@
 
 int ebml_document_header_handler(mkv_file_info* info, mkvvstream* stream, uint32_t* id, uint64_t* size);
 int mkv_info_handler(mkv_file_info* info, mkvvstream* stream, uint32_t* id, uint64_t* size);
+// One TrackEntry into the next track record; 12 once the file has 100 tracks.
+int mkv_track_handler(mkv_file_info* info, mkvvstream* stream, uint32_t* id, uint64_t* size);
 // A SeekHead becomes the next seek list, sorted by position; a damaged one is
 // dropped (0) and the walk goes on.
 int mkv_meta_seek_handler(mkv_file_info* info, mkvvstream* stream, uint32_t* id, uint64_t* size);

@@ -22,7 +22,7 @@ const mkv_element_row element_list[] = {
     {0x1549A966, "Info", mkv_info_handler},
     {kClusterId, "Cluster", nullptr},
     {0x1654AE6B, "Tracks", nullptr},
-    {0xAE, "TrackEntry", nullptr},
+    {0xAE, "TrackEntry", mkv_track_handler},
     {0x1C53BB6B, "Cues", mkv_cue_handler},
     {0x1941A469, "Attachments", nullptr},
     {0x1043A770, "Chapters", nullptr},
