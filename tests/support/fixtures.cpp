@@ -1,0 +1,220 @@
+#include "tests/support/fixtures.h"
+
+#include <charconv>
+#include <fstream>
+#include <iterator>
+#include <sstream>
+#include <string_view>
+#include <system_error>
+#include <type_traits>
+
+#include <gtest/gtest.h>
+
+namespace testing_support {
+namespace {
+
+std::string FixturePath(const std::string& file) { return std::string(KELVANE_FIXTURE_DIR) + "/" + file; }
+
+bool ReadWholeFile(const std::string& path, std::string* text) {
+  std::ifstream in(path, std::ios::binary);
+  if (!in) return false;
+  text->assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
+  return !in.bad();
+}
+
+std::string ReadTextOrFail(const std::string& file) {
+  std::string text;
+  if (!ReadWholeFile(FixturePath(file), &text)) ADD_FAILURE() << "cannot read fixture file " << FixturePath(file);
+  return text;
+}
+
+// Whole-token number parsers: a sign, trailing characters or an empty token fail.
+template <typename T>
+bool ParseNumber(std::string_view text, T* value, int base = 10) {
+  if (text.empty()) return false;
+  const char* end = text.data() + text.size();
+  std::from_chars_result r;
+  if constexpr (std::is_floating_point_v<T>) {
+    r = std::from_chars(text.data(), end, *value);
+  } else {
+    r = std::from_chars(text.data(), end, *value, base);
+  }
+  return r.ec == std::errc() && r.ptr == end;
+}
+
+std::vector<std::string_view> SplitOn(std::string_view text, char separator) {
+  std::vector<std::string_view> parts;
+  size_t start = 0;
+  while (true) {
+    size_t at = text.find(separator, start);
+    parts.push_back(text.substr(start, at == std::string_view::npos ? std::string_view::npos : at - start));
+    if (at == std::string_view::npos) return parts;
+    start = at + 1;
+  }
+}
+
+// Calls `parse_line(line)` for every line that is neither blank nor a `#`
+// comment; a false result is reported as a malformed line.
+template <typename ParseLine>
+void ForEachLine(const std::string& label, const std::string& text, ParseLine parse_line) {
+  std::istringstream in(text);
+  std::string line;
+  for (int number = 1; std::getline(in, line); ++number) {
+    if (!line.empty() && line.back() == '\r') line.pop_back();
+    if (line.empty() || line[0] == '#') continue;
+    if (!parse_line(std::string_view(line))) ADD_FAILURE() << label << ":" << number << ": malformed line: " << line;
+  }
+}
+
+bool ParseTrackToken(std::string_view token, ExpectedTrack* track) {
+  size_t eq = token.find('=');
+  if (eq == std::string_view::npos || eq == 0) return false;
+  std::string_view key = token.substr(0, eq);
+  std::string_view value = token.substr(eq + 1);
+  if (value.empty()) return false;
+  bool ok = true;
+  if (key == "number") ok = ParseNumber(value, &track->number);
+  else if (key == "uid") ok = ParseNumber(value, &track->uid);
+  else if (key == "type") track->type = value;
+  else if (key == "codec") track->codec = value;
+  else if (key == "language") track->language = value;
+  else if (key == "codec_private_size") ok = ParseNumber(value, &track->codec_private_size);
+  else if (key == "width") ok = ParseNumber(value, &track->width);
+  else if (key == "height") ok = ParseNumber(value, &track->height);
+  else if (key == "default_duration") ok = ParseNumber(value, &track->default_duration);
+  else if (key == "sampling_frequency") ok = ParseNumber(value, &track->sampling_frequency);
+  else if (key == "channels") ok = ParseNumber(value, &track->channels);
+  else if (key == "bit_depth") ok = ParseNumber(value, &track->bit_depth);
+  else if (key == "flac_sample_rate") ok = ParseNumber(value, &track->flac_sample_rate);
+  else if (key == "flac_channels") ok = ParseNumber(value, &track->flac_channels);
+  else if (key == "flac_bits") ok = ParseNumber(value, &track->flac_bits);
+  else if (key == "sar") {
+    std::vector<std::string_view> parts = SplitOn(value, ':');
+    ok = parts.size() == 2 && ParseNumber(parts[0], &track->sar_num) && ParseNumber(parts[1], &track->sar_den);
+  }
+  if (!ok) return false;
+  return track->fields.emplace(std::string(key), std::string(value)).second;  // a repeated key is malformed
+}
+
+bool ParseExpectedLine(std::string_view line, FixtureExpectation* fx) {
+  size_t space = line.find(' ');
+  std::string_view key = line.substr(0, space);
+  std::string_view rest = space == std::string_view::npos ? std::string_view() : line.substr(space + 1);
+  if (key == "doc_type") fx->doc_type = rest;
+  else if (key == "title") fx->title = rest;
+  else if (key == "muxing_app") fx->muxing_app = rest;
+  else if (key == "writing_app") fx->writing_app = rest;
+  else if (key == "timecode_scale") return ParseNumber(rest, &fx->timecode_scale);
+  else if (key == "file_size") return ParseNumber(rest, &fx->file_size);
+  else if (key == "cue_points") return ParseNumber(rest, &fx->cue_point_count);
+  else if (key == "duration_ns") return fx->has_duration = ParseNumber(rest, &fx->duration_ns);
+  else if (key == "tag") {
+    size_t name_end = rest.find(' ');
+    std::string_view name = rest.substr(0, name_end);
+    if (name.empty()) return false;
+    std::string_view text = name_end == std::string_view::npos ? std::string_view() : rest.substr(name_end + 1);
+    fx->tags.emplace_back(std::string(name), std::string(text));
+  } else if (key == "track") {
+    ExpectedTrack track;
+    for (std::string_view token : SplitOn(rest, ' ')) {
+      if (!ParseTrackToken(token, &track)) return false;
+    }
+    if (track.fields.count("number") == 0 || track.type.empty()) return false;
+    fx->tracks.push_back(std::move(track));
+  } else {
+    return false;
+  }
+  return space != std::string_view::npos;
+}
+
+bool ParseCueLine(std::string_view line, FixtureExpectation* fx) {
+  std::vector<std::string_view> parts = SplitOn(line, ' ');
+  ExpectedCue cue{};
+  if (parts.size() != 4 || !ParseNumber(parts[0], &cue.time_ticks) || !ParseNumber(parts[1], &cue.track) ||
+      !ParseNumber(parts[2], &cue.cluster_position) || !ParseNumber(parts[3], &cue.block_number)) {
+    return false;
+  }
+  fx->cues.push_back(cue);
+  return true;
+}
+
+bool ParseBlockLine(std::string_view line, FixtureExpectation* fx) {
+  std::vector<std::string_view> parts = SplitOn(line, ' ');
+  ExpectedBlock block{};
+  if (parts.size() != 5 || !ParseNumber(parts[0], &block.track) || !ParseNumber(parts[1], &block.ticks)) {
+    return false;
+  }
+  if (parts[2] != "S" && parts[2] != "B") return false;
+  if (parts[3] != "0" && parts[3] != "1") return false;
+  block.simple = parts[2] == "S";
+  block.key = parts[3] == "1";
+  for (std::string_view entry : SplitOn(parts[4], ',')) {
+    std::vector<std::string_view> size_sum = SplitOn(entry, ':');
+    ExpectedFrame frame{};
+    if (size_sum.size() != 2 || size_sum[1].size() > 8 || !ParseNumber(size_sum[0], &frame.size) ||
+        !ParseNumber(size_sum[1], &frame.adler32, 16)) {
+      return false;
+    }
+    block.frames.push_back(frame);
+  }
+  fx->blocks.push_back(std::move(block));
+  return true;
+}
+
+}  // namespace
+
+std::vector<std::string> FixtureNames() {
+  std::vector<std::string> names;
+  ForEachLine("index.txt", ReadTextOrFail("index.txt"), [&](std::string_view line) {
+    std::string_view name = line.substr(0, line.find_first_of(" \t"));
+    if (name.empty()) return false;
+    names.emplace_back(name);
+    return true;
+  });
+  return names;
+}
+
+FixtureExpectation ParseFixtureTexts(const std::string& name, const std::string& expected, const std::string& cues,
+                                     const std::string& blocks) {
+  FixtureExpectation fx;
+  fx.name = name;
+  fx.path = FixturePath(name + ".mkv");
+  ForEachLine(name + ".expected", expected, [&](std::string_view line) { return ParseExpectedLine(line, &fx); });
+  ForEachLine(name + ".cues", cues, [&](std::string_view line) { return ParseCueLine(line, &fx); });
+  ForEachLine(name + ".blocks", blocks, [&](std::string_view line) { return ParseBlockLine(line, &fx); });
+  return fx;
+}
+
+FixtureExpectation LoadFixture(const std::string& name) {
+  return ParseFixtureTexts(name, ReadTextOrFail(name + ".expected"), ReadTextOrFail(name + ".cues"),
+                           ReadTextOrFail(name + ".blocks"));
+}
+
+std::vector<uint8_t> ReadFixtureBytes(const std::string& name) {
+  std::string bytes;
+  if (!ReadWholeFile(FixturePath(name + ".mkv"), &bytes)) {
+    ADD_FAILURE() << "cannot read fixture file " << FixturePath(name + ".mkv");
+    return {};
+  }
+  return std::vector<uint8_t>(bytes.begin(), bytes.end());
+}
+
+uint32_t Adler32(const uint8_t* data, size_t size) {
+  constexpr uint32_t kModulus = 65521;
+  // 5552 is the longest run whose sums cannot overflow 32 bits before the reduction.
+  constexpr size_t kRun = 5552;
+  uint32_t a = 1, b = 0;
+  while (size > 0) {
+    size_t n = size < kRun ? size : kRun;
+    size -= n;
+    while (n-- > 0) {
+      a += *data++;
+      b += a;
+    }
+    a %= kModulus;
+    b %= kModulus;
+  }
+  return (b << 16) | a;
+}
+
+}  // namespace testing_support

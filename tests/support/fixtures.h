@@ -1,0 +1,82 @@
+#pragma once
+// The real Matroska files in tests/fixtures and the facts that mkvinfo and
+// ffprobe report about them (written by tests/fixtures/make_fixtures.sh):
+// NAME.mkv, NAME.expected, NAME.cues and NAME.blocks, listed in index.txt.
+
+#include <cstddef>
+#include <cstdint>
+#include <map>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace testing_support {
+
+// One TrackEntry. Keys absent from the file's line keep their zero defaults;
+// `fields` holds every key=value token exactly as written (also the keys that
+// have no typed member, such as display_width or compression).
+struct ExpectedTrack {
+  uint64_t number = 0;
+  uint64_t uid = 0;
+  std::string type, codec, language;  // type: video, audio, subtitles or other
+  uint32_t codec_private_size = 0;
+  uint64_t width = 0, height = 0, default_duration = 0;  // default_duration in ns
+  double sampling_frequency = 0;
+  uint64_t channels = 0, bit_depth = 0;
+  uint32_t sar_num = 0, sar_den = 0, flac_sample_rate = 0, flac_channels = 0, flac_bits = 0;
+  std::map<std::string, std::string> fields;
+};
+
+// One CueTrackPositions; cluster_position is relative to the Segment's data,
+// block_number is 1 when the file has none.
+struct ExpectedCue {
+  uint64_t time_ticks, track, cluster_position, block_number;
+};
+
+struct ExpectedFrame {
+  uint32_t size;
+  uint32_t adler32;
+};
+
+// One SimpleBlock (simple) or Block in a BlockGroup. ticks = Cluster timecode +
+// the block's relative timecode, in TimecodeScale units. key: the SimpleBlock
+// keyframe flag; for a Block, true when its group has no ReferenceBlock.
+struct ExpectedBlock {
+  uint64_t track;
+  int64_t ticks;
+  bool simple;
+  bool key;
+  std::vector<ExpectedFrame> frames;  // in lace order
+};
+
+struct FixtureExpectation {
+  std::string name, path, doc_type, title, muxing_app, writing_app;
+  uint64_t timecode_scale = 0, duration_ns = 0, file_size = 0;
+  bool has_duration = false;
+  std::vector<ExpectedTrack> tracks;  // in file order
+  uint32_t cue_point_count = 0;
+  std::vector<ExpectedCue> cues;
+  std::vector<std::pair<std::string, std::string>> tags;  // every SimpleTag: name, string
+  std::vector<ExpectedBlock> blocks;                       // in file order
+};
+
+// Fixture names in the order of index.txt.
+std::vector<std::string> FixtureNames();
+
+// Reads NAME.expected, NAME.cues and NAME.blocks. A missing file or a
+// malformed line is reported with ADD_FAILURE (file and line named) and the
+// line is skipped.
+FixtureExpectation LoadFixture(const std::string& name);
+
+// The same parse over texts in memory; `name` only labels the failures.
+FixtureExpectation ParseFixtureTexts(const std::string& name, const std::string& expected,
+                                     const std::string& cues, const std::string& blocks);
+
+// The whole NAME.mkv; empty (with ADD_FAILURE) when it cannot be read.
+std::vector<uint8_t> ReadFixtureBytes(const std::string& name);
+
+// Adler-32 (RFC 1950), the frame checksum that mkvinfo -c prints and the
+// .blocks files record.
+uint32_t Adler32(const uint8_t* data, size_t size);
+
+}  // namespace testing_support
