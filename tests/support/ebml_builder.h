@@ -108,3 +108,9 @@ Bytes filler(size_t n, uint8_t fill = 0);
 Bytes ebml_header(std::string_view doc_type = "matroska");
 
 }  // namespace ebml
+  kCueCodecState = 0xEA,
+  kCueReference = 0xDB,
+  kCueRefTime = 0x96,
+  kCueRelativePosition = 0xF0,
+  kTargets = 0x63C0,
+  kTagLanguage = 0x447A,

@@ -15,6 +15,7 @@ struct HeaderParseOptions {
   int64_t buffer_size = 480;
   bool seekable = true;
   bool with_limits = true;  // the creators' limits: 8192-byte strings
+  mkv_metadata_list* metadata = nullptr;  // handed in as the creators do; owned by the test
 };
 
 class HeaderParse {

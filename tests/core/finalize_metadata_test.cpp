@@ -1,0 +1,294 @@
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstring>
+#include <limits>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "core/memory.h"
+#include "core/metadata_list.h"
+#include "core/status.h"
+#include "host/heap_control.h"
+
+namespace {
+
+// One entry as "Key NUM4 value", "Key NUM8 value" or "Key UTF8 text".
+std::string describe_entry(const mkv_metadata_list& list, int i) {
+  std::string out = std::string(list.key[i]) + " ";
+  switch (list.value_type[i]) {
+    case kMetadataTypeNum4: {
+      uint32_t value;
+      EXPECT_EQ(list.value_size[i], 4);
+      std::memcpy(&value, list.value[i], 4);
+      return out + "NUM4 " + std::to_string(value);
+    }
+    case kMetadataTypeNum8: {
+      int64_t value;
+      EXPECT_EQ(list.value_size[i], 8);
+      std::memcpy(&value, list.value[i], 8);
+      return out + "NUM8 " + std::to_string(value);
+    }
+    case kMetadataTypeUtf8:
+      return out + "UTF8 " + std::string(static_cast<const char*>(list.value[i]), static_cast<size_t>(list.value_size[i]));
+    default:
+      return out + "?";
+  }
+}
+
+std::vector<std::string> describe(const mkv_metadata_list& list) {
+  std::vector<std::string> out;
+  for (int i = 0; i < list.entry_count; ++i) out.push_back(describe_entry(list, i));
+  return out;
+}
+
+// A file model filled by hand, as the handlers would leave it, with a list to build.
+class MetadataFixture {
+ public:
+  MetadataFixture() : info_(std::make_unique<mkv_file_info>()) {
+    std::memset(info_.get(), 0, sizeof(mkv_file_info));
+    info_->parse_limits = &limits_;
+    info_->metadata = mem_new_zeroed<mkv_metadata_list>();
+    info_->timecode_scale = 1000000;
+  }
+  ~MetadataFixture() { FreeMetadata(info_->metadata); }
+
+  mkv_file_info& info() { return *info_; }
+  mkv_parse_limits& limits() { return limits_; }
+  mkv_metadata_list& list() { return *info_->metadata; }
+
+  void AddTag(const char* name, const char* text) {
+    mkv_tag_entry& tag = info_->tags[info_->tag_count++];
+    tag.name = const_cast<char*>(name);
+    tag.string = const_cast<char*>(text);
+    tag.length = text ? static_cast<uint32_t>(std::strlen(text)) : 0;
+  }
+  mkv_track_info& AddTrack(uint64_t type, const char* codec_id = nullptr) {
+    mkv_track_info& track = info_->tracks[info_->track_count++];
+    track.track_type = type;
+    track.codec_id = const_cast<char*>(codec_id);
+    if (type == 1) ++info_->video_track_count;
+    if (type == 2) ++info_->audio_track_count;
+    return track;
+  }
+
+ private:
+  mkv_parse_limits limits_{kDefaultMaxStringSize, 1};
+  std::unique_ptr<mkv_file_info> info_;
+};
+
+TEST(FinalizeMetadataTest, EntriesComeInTagThenFileThenTrackOrder) {
+  MetadataFixture file;
+  file.AddTag("ARTIST", "Someone");
+  file.AddTag("title", "lower case is not offered");
+  file.AddTag("TITLE", "abc");
+  file.AddTag("GENRE", nullptr);  // a name without a string
+  file.AddTag("ALBUM", "Album");
+  file.AddTag("COMMENT", "c");
+  file.AddTag("ENCODER", "not offered");
+  file.info().duration = 5000.0;
+  file.info().parse_flags = kMetCues;
+  mkv_track_info& video = file.AddTrack(1, "V_MPEG4/ISO/AVC");
+  video.pixel_width = 0x100000140;  // only the low 32 bits are offered
+  video.pixel_height = 240;
+  video.default_duration = 41708333;
+  video.channels = 2;  // not offered for video
+  file.AddTrack(17, "S_TEXT/UTF8");
+  mkv_track_info& audio = file.AddTrack(2, "A_AAC/MPEG4/LC/SBR");
+  audio.sampling_frequency = 44100.0;
+  audio.channels = 6;
+  audio.pixel_width = 9;  // not offered for audio
+
+  EXPECT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
+  EXPECT_EQ(describe(file.list()), (std::vector<std::string>{
+                                       "Artist UTF8 Someone", "Name UTF8 abc", "Album UTF8 Album", "Comment UTF8 c",
+                                       "Seekable NUM4 1", "TrackCount NUM4 2",
+                                       "MediaType NUM4 2147483650", "Fourcc NUM4 1096172337", "Width NUM4 320",
+                                       "Height NUM4 240", "PixelWidth NUM4 1", "PixelHeight NUM4 1",
+                                       "Duration NUM8 5000000", "Channels NUM4 0", "SampleRate NUM4 24",
+                                       "MediaType NUM4 2147483652", "Fourcc NUM4 1295270211", "Width NUM4 0",
+                                       "Height NUM4 0", "PixelWidth NUM4 1", "PixelHeight NUM4 1",
+                                       "Duration NUM8 5000000", "Channels NUM4 6", "SampleRate NUM4 44100",
+                                   }));
+}
+
+TEST(FinalizeMetadataTest, TagValueStopsAtItsLengthAndAtItsTerminator) {
+  MetadataFixture file;
+  file.AddTag("TITLE", "abcdef");
+  file.info().tags[0].length = 3;  // only the first three bytes were the TagString
+  file.AddTag("ARTIST", "xy");
+  file.info().tags[1].length = 40;  // a longer TagBinary was read after the string
+  ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
+  EXPECT_EQ(describe_entry(file.list(), 0), "Name UTF8 abc");
+  EXPECT_EQ(describe_entry(file.list(), 1), "Artist UTF8 xy");
+}
+
+TEST(FinalizeMetadataTest, SeekableNeedsASeekableInputAndCues) {
+  const struct {
+    bool limits;
+    uint32_t input_seekable;
+    uint32_t flags;
+    uint32_t seekable;
+  } cases[] = {
+      {true, 1, kMetCues, 1}, {true, 1, 0, 0}, {true, 0, kMetCues, 0}, {false, 1, kMetCues, 0},
+  };
+  for (const auto& c : cases) {
+    MetadataFixture file;
+    file.limits().input_seekable = c.input_seekable;
+    if (!c.limits) file.info().parse_limits = nullptr;
+    file.info().parse_flags = c.flags;
+    ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
+    EXPECT_EQ(describe(file.list()), (std::vector<std::string>{"Seekable NUM4 " + std::to_string(c.seekable),
+                                                               "TrackCount NUM4 0"}));
+  }
+}
+
+uint32_t num4(const mkv_metadata_list& list, const char* key) {
+  for (int i = 0; i < list.entry_count; ++i) {
+    if (std::strcmp(list.key[i], key) == 0) return *static_cast<const uint32_t*>(list.value[i]);
+  }
+  ADD_FAILURE() << key << " missing";
+  return 0;
+}
+
+int64_t num8(const mkv_metadata_list& list, const char* key) {
+  for (int i = 0; i < list.entry_count; ++i) {
+    if (std::strcmp(list.key[i], key) == 0) return *static_cast<const int64_t*>(list.value[i]);
+  }
+  ADD_FAILURE() << key << " missing";
+  return 0;
+}
+
+TEST(FinalizeMetadataTest, VideoSampleRateIsTheRoundedFrameRate) {
+  const struct {
+    uint64_t default_duration;
+    uint32_t rate;
+  } cases[] = {
+      {41708333, 24}, {40000000, 25}, {33366667, 30}, {0, 0}, {16683333, 60}, {41666666, 24},
+      {1, 1000000000}, {1000000000000, 0}, {0xFFFFFFFFFFFFFFFF, 0},
+  };
+  for (const auto& c : cases) {
+    MetadataFixture file;
+    file.AddTrack(1).default_duration = c.default_duration;
+    ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
+    EXPECT_EQ(num4(file.list(), "SampleRate"), c.rate) << c.default_duration;
+  }
+}
+
+TEST(FinalizeMetadataTest, AudioSampleRateTruncatesTheSamplingFrequency) {
+  const struct {
+    double frequency;
+    int32_t rate;
+  } cases[] = {
+      {44100.0, 44100}, {22050.7, 22050}, {7999.999, 7999}, {0.0, 0}, {-2.5, -2},
+      {std::nan(""), 0}, {1e12, INT32_MAX}, {-1e12, INT32_MIN}, {std::numeric_limits<double>::infinity(), INT32_MAX},
+  };
+  for (const auto& c : cases) {
+    MetadataFixture file;
+    file.AddTrack(2).sampling_frequency = c.frequency;
+    ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
+    EXPECT_EQ(static_cast<int32_t>(num4(file.list(), "SampleRate")), c.rate) << c.frequency;
+  }
+}
+
+TEST(FinalizeMetadataTest, DurationIsScaleTimesTicksInMicrosecondsTruncated) {
+  const struct {
+    uint64_t timecode_scale;
+    double duration;
+    int64_t microseconds;
+  } cases[] = {
+      {1000000, 5000.0, 5000000}, {1000000, 0.0, 0}, {1000, 2.5, 2}, {1000, -1.5, -1}, {100000, 12345.0, 1234500},
+      {22675, 44100.0, 999967}, {1000000, std::nan(""), 0}, {1000000, 1e300, INT64_MAX}, {1000000, -1e300, INT64_MIN},
+  };
+  for (const auto& c : cases) {
+    MetadataFixture file;
+    file.info().timecode_scale = c.timecode_scale;
+    file.info().duration = c.duration;
+    file.AddTrack(2);
+    ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
+    EXPECT_EQ(num8(file.list(), "Duration"), c.microseconds) << c.timecode_scale << " x " << c.duration;
+  }
+}
+
+TEST(FinalizeMetadataTest, FourccComesFromTheCodecTableExactly) {
+  const struct {
+    const char* codec_id;
+    uint32_t fourcc;
+  } cases[] = {
+      {"A_AAC/MPEG4/LC/SBR", 0x4D344143}, {"A_AAC", 0x4D344143}, {"A_AAC/MPEG2/LC", 0x4D324143},
+      {"V_MPEG4/ISO/AVC", 0x41564331}, {"A_OPUS", 0}, {"a_aac", 0}, {"A_AAC/", 0}, {nullptr, 0},
+  };
+  for (const auto& c : cases) {
+    MetadataFixture file;
+    file.AddTrack(2, c.codec_id);
+    ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
+    EXPECT_EQ(num4(file.list(), "Fourcc"), c.fourcc) << (c.codec_id ? c.codec_id : "null");
+  }
+}
+
+TEST(FinalizeMetadataTest, PixelShapeStaysOneByOneWhenTheFrameworkCannotTell) {
+  static uint8_t garbage[] = {0xFF, 0x00, 0x13};
+  const struct {
+    const char* name;
+    uint64_t type;
+    const char* codec_id;
+    bool codec_private;
+  } cases[] = {
+      {"unsupported codec with configuration", 1, "V_VP8", true},
+      {"AVC without configuration", 1, "V_MPEG4/ISO/AVC", false},
+      {"AVC with unreadable configuration", 1, "V_MPEG4/ISO/AVC", true},
+      {"audio with configuration", 2, "A_AAC", true},
+  };
+  for (const auto& c : cases) {
+    MetadataFixture file;
+    mkv_track_info& track = file.AddTrack(c.type, c.codec_id);
+    if (c.codec_private) {
+      track.codec_private = garbage;
+      track.codec_private_size = sizeof garbage;
+    }
+    ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
+    EXPECT_EQ(num4(file.list(), "PixelWidth"), 1u) << c.name;
+    EXPECT_EQ(num4(file.list(), "PixelHeight"), 1u) << c.name;
+  }
+}
+
+TEST(FinalizeMetadataTest, ListHasTagsPlusTwoPlusNinePerTrackUntilItIsFull) {
+  const struct {
+    uint32_t tags;
+    uint32_t tracks;
+    int status;
+    int32_t entries;
+    const char* last_key;
+  } cases[] = {
+      {0, 0, kStatusOk, 2, "TrackCount"},
+      {3, 1, kStatusOk, 14, "SampleRate"},
+      {50, 22, kStatusOk, 250, "SampleRate"},
+      {50, 23, kStatusNoMemory, 250, "SampleRate"},  // the 23rd track's MediaType finds the list full
+      {49, 23, kStatusNoMemory, 250, "MediaType"},
+      {0, 28, kStatusNoMemory, 250, "PixelWidth"},
+  };
+  const char* names[] = {"TITLE", "ARTIST", "GENRE", "ALBUM", "COMMENT"};
+  for (const auto& c : cases) {
+    MetadataFixture file;
+    for (uint32_t i = 0; i < c.tags; ++i) file.AddTag(names[i % 5], "v");
+    for (uint32_t i = 0; i < c.tracks; ++i) file.AddTrack(1 + i % 2, "A_AC3");
+    EXPECT_EQ(FinalizeMetadata(&file.info()), c.status) << c.tags << "/" << c.tracks;
+    ASSERT_EQ(file.list().entry_count, c.entries) << c.tags << "/" << c.tracks;
+    EXPECT_STREQ(file.list().key[c.entries - 1], c.last_key) << c.tags << "/" << c.tracks;
+  }
+}
+
+TEST(FinalizeMetadataTest, FileWithoutAListBuildsNothing) {
+  MetadataFixture file;
+  mkv_metadata_list* list = file.info().metadata;
+  file.info().metadata = nullptr;
+  file.AddTag("TITLE", "t");
+  file.AddTrack(1);
+  uint64_t allocations = host::AllocationCount();
+  EXPECT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
+  EXPECT_EQ(host::AllocationCount(), allocations);
+  file.info().metadata = list;
+}
+
+}  // namespace
