@@ -91,9 +91,17 @@ int ebml_read_float(mkvvstream* stream, uint64_t size, double* value) {
   return complete ? kStatusOk : kStatusReadFailed;
 }
 
+bool ebml_payload_fits(const mkvvstream* stream, uint64_t size) {
+  // In peek mode nothing beyond the one buffer can ever be read.
+  uint64_t end = stream->fill_mode == kFillWithPeek ? stream->buffer_end : mkvvstream_length(stream);
+  uint64_t position = mkvvstream_tell(stream);
+  return end == 0 || (position <= end && size <= end - position);
+}
+
 int ebml_read_string(mkvvstream* stream, uint64_t size, uint64_t limit, char** text) {
   *text = nullptr;
   if (size > UINT32_MAX - 1 || size > limit) return kStatusNoMemory;
+  if (!ebml_payload_fits(stream, size)) return kStatusReadFailed;
   auto* block = static_cast<char*>(mem_alloc_zeroed(static_cast<size_t>(size) + 1));
   if (!block) return kStatusNoMemory;
   *text = block;

@@ -22,6 +22,11 @@
 [[nodiscard]] int ebml_read_float(mkvvstream* stream, uint64_t size, double* value);
 constexpr uint64_t kNoStringLimit = UINT64_MAX;
 
+// False when the input's length is known and fewer than `size` bytes are left
+// after the stream's position: such a payload can only end in a short read, so
+// it is not worth allocating (a hostile size would otherwise ask for gigabytes).
+[[nodiscard]] bool ebml_payload_fits(const mkvvstream* stream, uint64_t size);
+
 // A new zero-filled block of size + 1 bytes holding the text and a NUL. A size
 // above `limit` (or of 2^32 or more) is 12 with *text null. A short read is 5
 // and leaves the partly filled block in *text.

@@ -23,6 +23,10 @@ int read_tag_value(mkvvstream* stream, uint64_t size, uint64_t limit, bool text,
   *block = nullptr;
   *read = 0;
   void* data = nullptr;
+  // A value longer than the rest of the input can only end in a short read.
+  if (size <= limit && size < (uint64_t{1} << 32) - (text ? 1 : 0) && !ebml_payload_fits(stream, size)) {
+    return kStatusReadFailed;
+  }
   if (size <= limit && size < (uint64_t{1} << 32) - (text ? 1 : 0)) {
     auto bytes = static_cast<size_t>(size) + (text ? 1 : 0);
     data = text ? mem_alloc_zeroed(bytes) : mem_alloc(bytes == 0 ? 1 : bytes);

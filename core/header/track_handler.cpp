@@ -86,6 +86,7 @@ int read_codec_id(const track_entry& entry, uint64_t size) {
   *field = nullptr;
   uint64_t limit = string_limit(entry.info);
   if (size >= limit || size > UINT32_MAX - 2) return read_error(kStatusNoMemory, __LINE__);
+  if (!ebml_payload_fits(entry.stream, size)) return read_error(kStatusReadFailed, __LINE__);
   auto* text = static_cast<char*>(mem_alloc_zeroed(static_cast<size_t>(size) + 2));
   if (!text) return read_error(kStatusNoMemory, __LINE__);
   *field = text;

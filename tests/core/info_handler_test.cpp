@@ -85,7 +85,7 @@ TEST(InfoHandlerTest, WrongSizesFailTheInfoElement) {
 TEST(InfoHandlerTest, InfoCutInsideAChildHeaderEndsQuietly) {
   Bytes info = master(kInfo, {str(kTitle, "before the cut")});
   Bytes cut = cat({info, Bytes{0x7B}});  // the first byte of a Title ID
-  cut[5] += 1;                            // Info's one-byte size now covers it
+  cut[4] += 1;  // Info's one-byte size now covers it
   ASSERT_EQ(info[4], 0x80 | (info.size() - 5));
   HeaderParse parse(cat({ebml_header(), master(kSegment, {master(kTracks, {master(kTrackEntry, {})})}), cut}));
   EXPECT_EQ(parse.Parse(), kParseSucceeded);
