@@ -248,7 +248,7 @@ class ByteWalk {
     while (pos < segment_end) {
       if (!Header(&pos, &id, &size)) return std::nullopt;
       if (id == 0x1F43B675) return FirstBlockOfCluster(pos, End(pos, size));
-      pos += size;
+      pos = End(pos, size);
     }
     return std::nullopt;
   }
@@ -302,11 +302,11 @@ class ByteWalk {
         while (pos < group_end) {
           if (!Header(&pos, &id, &size)) return std::nullopt;
           if (id == 0xA1) return ReadBlock(pos, End(pos, size), false, cluster_timecode);
-          pos += size;
+          pos = End(pos, size);
         }
         return std::nullopt;
       }
-      pos += size;
+      pos = End(pos, size);
     }
     return std::nullopt;
   }
