@@ -1,0 +1,26 @@
+#pragma once
+// H.264 configuration as Matroska and MP4 carry it: the
+// AVCDecoderConfigurationRecord and the sequence parameter set inside it.
+
+#include <cstddef>
+#include <cstdint>
+#include <vector>
+
+#include "host/picture_shape.h"
+
+namespace host {
+
+// A NAL unit's payload with the emulation-prevention bytes (the 03 of every
+// 00 00 03) removed.
+std::vector<uint8_t> RemoveEmulationPrevention(const uint8_t* payload, size_t size);
+
+// One SPS NAL unit, header byte included. Fills the cropped picture size and,
+// when the VUI gives one, the sample aspect ratio. False when the unit is not
+// an SPS, is cut short before the fields read, or holds out-of-range values.
+bool ParseAvcSps(const uint8_t* nal, size_t size, PictureShape* shape);
+
+// The first SPS of an AVCDecoderConfigurationRecord. False when the record is
+// malformed or carries no SPS.
+bool ParseAvcDecoderConfig(const uint8_t* record, size_t size, PictureShape* shape);
+
+}  // namespace host
