@@ -1,0 +1,151 @@
+// BlockGroups: the children around the Block, what is copied, what is passed
+// over unread, and what running out inside a group gives.
+
+#include <gtest/gtest.h>
+
+#include "host/heap_control.h"
+#include "platform/ao_log.h"
+#include "tests/cluster/cluster_harness.h"
+#include "tests/support/cluster_driver.h"
+#include "tests/support/log_recorder.h"
+
+namespace {
+
+using cluster_testing::Bytes;
+using cluster_testing::Record;
+using cluster_testing::View;
+using namespace ebml;
+
+Bytes Block1() { return block(1, 0, 0, {filler(3, 0xA1)}); }
+
+Bytes ClusterOf(std::initializer_list<Bytes> children) {
+  return master(kCluster, {uinteger(kTimecode, 10), cat(children)});
+}
+
+TEST(ParseMkvBlockGroupTest, ChildrenAfterTheBlockAreReadByTheNextCall) {
+  Bytes bytes = ClusterOf({master(kBlockGroup, {Block1(), uinteger(kBlockDuration, 40)}),
+                           simple_block(2, 5, kKeyFrame, {filler(2)})});
+  Record record;
+  mkvinbuff in1 = View(bytes, 0, bytes.size());
+  ASSERT_EQ(cluster_testing::Call(record, &in1, nullptr).result, kClusterBlockReady);
+  EXPECT_EQ(record.c.in_blockgroup, 1);
+  EXPECT_EQ(record.c.block_duration, 0u);
+  in1.buff_pos += 3;
+  in1.buff_left -= 3;
+  mkvinbuff rest = in1;
+  EXPECT_EQ(parse_mkvblockgroup(&rest, nullptr, &record.c), kClusterGroupEnded);
+  EXPECT_EQ(record.c.block_duration, 40u);
+
+  record.c.block_duration = 0;
+  auto next = cluster_testing::Call(record, &in1, nullptr);  // passes the group's end on its own
+  EXPECT_EQ(next.result, kClusterBlockReady);
+  EXPECT_EQ(next.track, 2u);
+  EXPECT_EQ(record.c.block_duration, 40u);
+}
+
+struct GroupCase {
+  const char* name;
+  Bytes children;  // before the Block
+  int result;
+  int64_t reference_block = 0;
+  uint64_t reference_priority = 0;
+  uint64_t block_duration = 0;
+  Bytes codec_state = {};
+};
+
+void PrintTo(const GroupCase& c, std::ostream* os) { *os << c.name; }
+
+const GroupCase kGroupCases[] = {
+    {"OneByteReferenceBlockIsSignExtended", Bytes{0xFB, 0x81, 0xFE}, kClusterBlockReady, -2},
+    {"TwoByteReferenceBlockIsSignExtended", Bytes{0xFB, 0x82, 0xFF, 0x38}, kClusterBlockReady, -200},
+    {"EightByteReferenceBlockIsTakenWhole", sinteger(kReferenceBlock, -3, 8), kClusterBlockReady, -3},
+    {"ZeroSizeValuesAreZero", cat({bin(kReferenceBlock, {}), bin(kBlockDuration, {})}), kClusterBlockReady},
+    {"PriorityAndDurationAreRead", cat({uinteger(kReferencePriority, 2), uinteger(kBlockDuration, 0x123456)}),
+     kClusterBlockReady, 0, 2, 0x123456},
+    {"NineByteDurationIsRejected", bin(kBlockDuration, filler(9, 1)), kClusterInvalid},
+    {"NineByteReferenceIsRejected", bin(kReferenceBlock, filler(9, 1)), kClusterInvalid},
+    {"CodecStateIsCopied", bin(kCodecState, {1, 2, 3}), kClusterBlockReady, 0, 0, 0, {1, 2, 3}},
+    {"CodecStateOver32768BytesIsRefused", bin(kCodecState, filler(40000, 7)), kClusterNoMemory},
+    {"UnreadPayloadsAreNeverReadAsHeaders",
+     cat({bin(kVoid, block(9, 0, 0, {filler(1)})), master(kBlockAdditions, {bin(kBlockAdditional, Block1())}),
+          bin(kSlices, block(9, 0, 0, {})), bin(kBlockVirtual, block(9, 0, 0, {})), uinteger(kDiscardPadding, 5),
+          uinteger(kReferenceVirtual, 1), bin(kCrc32, {0xA1, 0x81, 0x81, 0x00})}),
+     kClusterBlockReady},
+};
+
+class GroupChildrenTest : public testing::TestWithParam<GroupCase> {};
+
+TEST_P(GroupChildrenTest, AreReadAsTheirCaseSays) {
+  const GroupCase& c = GetParam();
+  Record record;
+  auto got = cluster_testing::ParseWhole(record, ClusterOf({master(kBlockGroup, {c.children, Block1()})}));
+  EXPECT_EQ(got.result, c.result);
+  EXPECT_EQ(got.track, c.result == kClusterBlockReady ? 1u : 0u);
+  EXPECT_EQ(record.c.reference_block, c.reference_block);
+  EXPECT_EQ(record.c.reference_priority, c.reference_priority);
+  EXPECT_EQ(record.c.block_duration, c.block_duration);
+  EXPECT_EQ(Bytes(record.c.codec_state, record.c.codec_state + record.c.codec_state_size), c.codec_state);
+}
+
+INSTANTIATE_TEST_SUITE_P(Children, GroupChildrenTest, testing::ValuesIn(kGroupCases),
+                         [](const auto& info) { return std::string(info.param.name); });
+
+// Inside a group, running out is reported with three notices.
+TEST(ParseMkvBlockGroupTest, RunningOutInsideAChildLogsThePartialHeader) {
+  Bytes bytes = ClusterOf({master(kBlockGroup, {uinteger(kReferencePriority, 0x1234), Block1()})});
+  size_t cut = bytes.size() - 10;  // between the two bytes of the ReferencePriority value
+  testing_support::LogRecorder log;
+  Record record;
+  mkvinbuff in1 = View(bytes, 0, cut - 1), in2 = View(bytes, cut - 1, cut);
+  EXPECT_EQ(cluster_testing::Call(record, &in1, &in2).result, kClusterChildShort);
+  EXPECT_EQ(record.c.reference_priority, 0x12u);  // what was read is there
+  std::vector<std::pair<int, std::string>> want = {
+      {kAoLogNotice, "Partial header!  Not supposed to happen!"},
+      {kAoLogNotice, "                 inbuff1->buff_left = 0, inbuff2->buff_left = 0"},
+      {kAoLogNotice, "                 inbuff1->buff_fileoff = 0, inbuff2->buff_fileoff = " + std::to_string(cut - 1)},
+  };
+  EXPECT_EQ(log.messages(), want);
+}
+
+// Every BlockGroup child read across calls, at every buffer size.
+TEST(ParseMkvBlockGroupTest, EveryBufferSizeGivesTheSameBlocksAndKeys) {
+  Bytes bytes = cat({ClusterOf({master(kBlockGroup, {uinteger(kReferencePriority, 1), Block1(), bin(kVoid, filler(4)),
+                                                     uinteger(kBlockDuration, 40), sinteger(kReferenceBlock, -40, 2)}),
+                                master(kBlockGroup, {bin(kCodecState, {9}), block(2, 7, 0, {filler(5)}),
+                                                     uinteger(kBlockDuration, 20)})}),
+                     master(kCues, {})});
+  testing_support::DriveOptions whole;
+  whole.buffer_sizes = {bytes.size()};
+  auto want = testing_support::DriveClusters(bytes.data(), bytes.size(), 0, whole);
+  ASSERT_TRUE(want.complete);
+  ASSERT_EQ(want.blocks.size(), 2u);
+  EXPECT_FALSE(want.blocks[0].key);
+  EXPECT_TRUE(want.blocks[1].key);
+  EXPECT_EQ(want.blocks[1].ticks, 17);
+  for (size_t size = 1; size < bytes.size(); ++size) {
+    testing_support::DriveOptions options;
+    options.buffer_sizes = {size};
+    auto got = testing_support::DriveClusters(bytes.data(), bytes.size(), 0, options);
+    ASSERT_TRUE(got.complete) << size;
+    ASSERT_EQ(got.blocks.size(), 2u) << size;
+    for (size_t i = 0; i < 2; ++i) {
+      EXPECT_EQ(got.blocks[i].key, want.blocks[i].key) << size;
+      EXPECT_EQ(got.blocks[i].adler32, want.blocks[i].adler32) << size;
+    }
+  }
+}
+
+TEST(ParseMkvBlockGroupTest, FailedCodecStateCopyIsOutOfMemoryAndLeaksNothing) {
+  Bytes bytes = ClusterOf({master(kBlockGroup, {bin(kCodecState, {1, 2}), Block1()})});
+  int64_t live = host::LiveBlockCount();
+  {
+    Record record;
+    host::FailNthAllocation(1);
+    EXPECT_EQ(cluster_testing::ParseWhole(record, bytes).result, kClusterNoMemory);
+    host::FailNthAllocation(0);
+    EXPECT_EQ(record.c.codec_state, nullptr);
+  }
+  EXPECT_EQ(host::LiveBlockCount(), live);
+}
+
+}  // namespace

@@ -1,0 +1,153 @@
+// parse_mkvcluster at Cluster and Segment level: what is skipped, what is
+// passed over, where Clusters begin and end, and what running out gives.
+
+#include <gtest/gtest.h>
+
+#include "tests/cluster/cluster_harness.h"
+#include "platform/ao_log.h"
+#include "tests/support/log_recorder.h"
+
+namespace {
+
+using cluster_testing::Bytes;
+using cluster_testing::Outcome;
+using cluster_testing::Record;
+using cluster_testing::View;
+using namespace ebml;
+
+constexpr int kNoResult = 1;
+
+// Runs parse_mkvcluster over one buffer `blocks_before` + 1 times, consuming
+// each block's data and applying each skip between calls as the caller does.
+Outcome ParseAfterBlocks(Record& record, const Bytes& bytes, int blocks_before) {
+  mkvinbuff in1 = View(bytes, 0, bytes.size());
+  Outcome out;
+  for (int blocks = 0;;) {
+    out = cluster_testing::Call(record, &in1, nullptr);
+    if (out.result == kClusterBlockReady && blocks++ < blocks_before) {
+      auto data = static_cast<uint32_t>(record.c.block_data_left);
+      in1.buff_pos += data;
+      in1.buff_left -= data;
+    } else if (out.result == kClusterSkip && blocks < blocks_before) {
+      in1.buff_pos += static_cast<uint32_t>(out.skip);
+      in1.buff_left -= static_cast<uint32_t>(out.skip);
+    } else {
+      return out;
+    }
+  }
+}
+
+struct ClusterCase {
+  const char* name;
+  Bytes bytes;
+  int blocks_before;  // blocks consumed before the call that is checked
+  int result;
+  uint64_t skip = 0xDEAD;  // as set by -3; untouched otherwise
+  uint64_t cluster_timecode = 0;
+  uint64_t track = 0;
+  const char* message = nullptr;  // a level-5 message the calls must log
+};
+
+void PrintTo(const ClusterCase& c, std::ostream* os) { *os << c.name; }
+
+Bytes Block(uint64_t track) { return simple_block(track, 0, kKeyFrame, {filler(3, 0xA3)}); }
+
+const Bytes kCuesElement = master(kCues, {master(kCuePoint, {uinteger(kCueTime, 0)})});
+
+const ClusterCase kCases[] = {
+    {"CuesBetweenClustersAreSkippedWhole", kCuesElement, 0, kClusterSkip, kCuesElement.size() - 5},
+    {"VoidAfterABlockIsSkippedWithAMessage",
+     master(kCluster, {uinteger(kTimecode, 3), Block(1), bin(kVoid, filler(5))}), 1, kClusterSkip, 5, 3, 0,
+     "Expected BlockGroup or SimpleBlock, got 0xec instead, skipping 5"},
+    {"VoidReachingPastTheClusterEndIsCutToIt",
+     cat({master_sized(kCluster, 3 + 9 + 2 + 2, {uinteger(kTimecode, 3), Block(1)}), bin(kVoid, filler(5))}), 1,
+     kClusterSkip, 2, 3},
+    {"ZeroSizeVoidBetweenBlocksSkipsNothing",
+     master(kCluster, {uinteger(kTimecode, 3), Block(1), bin(kVoid, {}), Block(2)}), 1, kClusterSkip, 0, 3},
+    {"TimecodeOfNineBytesIsRejected", master(kCluster, {bin(kTimecode, filler(9, 1)), Block(1)}), 0,
+     kClusterInvalid},
+    {"ClusterOfOnlyATimecodeIsPassedInTheSameCall",
+     cat({master(kCluster, {uinteger(kTimecode, 1)}), master(kCluster, {uinteger(kTimecode, 2), Block(3)})}), 0,
+     kClusterBlockReady, 0xDEAD, 2, 3},
+    {"ZeroSizeClusterIsPassed", cat({master(kCluster, {}), master(kCluster, {uinteger(kTimecode, 5), Block(1)})}),
+     0, kClusterBlockReady, 0xDEAD, 5, 1},
+    {"LeadingCrcAndVoidPayloadsAreNotReadAsHeaders",
+     master(kCluster, {bin(kCrc32, {0xA3, 0x84, 0x81, 0x00}), bin(kVoid, Block(7)), uinteger(kTimecode, 4), Block(1)}),
+     0, kClusterBlockReady, 0xDEAD, 4, 1},
+    {"SilentTracksAndUnknownSizeVoidArePassedToTheClusterEnd",
+     cat({master(kCluster, {master(kSilentTracks, {uinteger(kSilentTrackNumber, 2)}), uinteger(kTimecode, 6),
+                            id_bytes(kVoid), size_bytes(kUnknownSize, 8), Block(7)}),
+          master(kCluster, {uinteger(kTimecode, 8), Block(2)})}),
+     0, kClusterBlockReady, 0xDEAD, 8, 2},
+    {"ZeroSizeBlockGroupIsPassed", master(kCluster, {uinteger(kTimecode, 1), master(kBlockGroup, {}), Block(2)}), 0,
+     kClusterBlockReady, 0xDEAD, 1, 2},
+    {"ClusterHeaderInsideAnUnknownSizeClusterStartsANewOne",
+     cat({unknown_size(kCluster, {uinteger(kTimecode, 1), Block(1)}), master(kCluster, {uinteger(kTimecode, 9), Block(2)})}),
+     1, kClusterBlockReady, 0xDEAD, 9, 2},
+    {"InvalidIdByteAmongChildrenIsDropped", master(kCluster, {uinteger(kTimecode, 4), Bytes{0x05}, Block(1)}), 0,
+     kClusterBlockReady, 0xDEAD, 4, 1, "Sub-element of cluster is invalid, skipping."},
+    {"ZeroSizeByteAmongChildrenIsDroppedWithItsId",
+     master(kCluster, {uinteger(kTimecode, 4), Bytes{0xEC, 0x00}, Block(1)}), 0, kClusterBlockReady, 0xDEAD, 4, 1,
+     "Sub-element of cluster is invalid, skipping."},
+    {"InvalidByteBetweenClustersFails", Bytes{0x05, 0x81}, 0, kClusterHeaderFailed},
+    {"InvalidByteBetweenBlocksFails", master(kCluster, {uinteger(kTimecode, 4), Block(1), Bytes{0x05}}), 1,
+     kClusterHeaderFailed, 0xDEAD, 4},
+};
+
+class ParseMkvClusterTest : public testing::TestWithParam<ClusterCase> {};
+
+TEST_P(ParseMkvClusterTest, GivesTheResultOfItsCase) {
+  const ClusterCase& c = GetParam();
+  testing_support::LogRecorder log;
+  Record record;
+  Outcome got = ParseAfterBlocks(record, c.bytes, c.blocks_before);
+  EXPECT_EQ(got.result, c.result);
+  EXPECT_EQ(got.skip, c.skip);
+  EXPECT_EQ(got.cluster_timecode, c.cluster_timecode);
+  EXPECT_EQ(got.track, c.track);
+  if (c.message) {
+    EXPECT_TRUE(log.Contains(kAoLogNotice, c.message)) << c.message;
+  }
+}
+
+INSTANTIATE_TEST_SUITE_P(Cases, ParseMkvClusterTest, testing::ValuesIn(kCases),
+                         [](const auto& info) { return std::string(info.param.name); });
+
+TEST(ParseMkvClusterStoredTest, PositionAndPrevSizeAreStored) {
+  Record record;
+  Bytes bytes = master(kCluster, {uinteger(kPosition, 300), uinteger(kPrevSize, 70000), uinteger(kTimecode, 2),
+                                  Block(1)});
+  ASSERT_EQ(cluster_testing::ParseWhole(record, bytes).result, kClusterBlockReady);
+  EXPECT_EQ(record.c.cluster_position, 300u);
+  EXPECT_EQ(record.c.cluster_prevsize, 70000u);
+}
+
+// Without inbuff2 the call ends where inbuff1 does; what it read stays read.
+TEST(ParseMkvClusterRanOutTest, EndOfInbuff1GivesTheResultOfTheLevelItEndsIn) {
+  Bytes bytes = master(kCluster, {uinteger(kTimecode, 2), Block(1), Block(2)});
+  struct {
+    size_t end;
+    bool after_first_block;
+    int result;
+  } const rows[] = {
+      {2, false, kClusterHeaderFailed},  // inside the Cluster's ID
+      {6, false, kClusterChildShort},    // inside the Timecode's header
+      {12, false, kClusterChildShort},   // inside the first SimpleBlock's header
+      {18, true, kClusterHeaderFailed},  // between the second SimpleBlock's ID and size
+      {21, true, kClusterChildShort},    // inside the second SimpleBlock's header
+  };
+  for (const auto& row : rows) {
+    Record record;
+    mkvinbuff in1 = View(bytes, 0, row.end);
+    if (row.after_first_block) {
+      ASSERT_EQ(cluster_testing::Call(record, &in1, nullptr).result, kClusterBlockReady);
+      in1.buff_pos += 3;
+      in1.buff_left -= 3;
+    }
+    EXPECT_EQ(cluster_testing::Call(record, &in1, nullptr).result, row.result) << "end " << row.end;
+    EXPECT_EQ(in1.buff_left, 0u);
+    EXPECT_TRUE(mkvcluster_inside_element(&record.c));
+  }
+}
+
+}  // namespace
