@@ -13,9 +13,7 @@ enum {
   kAoResourceSettable = 0x20000000,  // SetResource may change the value
   kAoResourceListed = 0x10000000,    // set on every row
   kAoResourceKindMask = 0xFF,
-};
-// Value kinds (the low byte of the type word).
-enum {
+  // Value kinds (the low byte of the type word).
   kAoResourceInt32 = 1,
   kAoResourceInt64 = 2,
   kAoResourceString = 7,  // the value is a char*

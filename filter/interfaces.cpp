@@ -1,0 +1,221 @@
+// The plug-in's C-linkage surface: the exported table `interfaces` and the
+// function tables it lists. Each operation checks its arguments here and
+// calls the C++ that implements it.
+
+#include "filter/events.h"
+#include "filter/instance.h"
+#include "filter/mkv_context.h"
+#include "filter/pending_operations.h"
+#include "filter/resource_table.h"
+#include "platform/interfaces.h"
+#include "platform/mmf_status.h"
+
+namespace {
+
+bool IsFilter(const MmfFilterHandle* handle) { return handle && handle->Kind == kMmfFilterKind; }
+
+// MediaFilter
+MmfFilterHandle* OpCreate() { return AsFrameworkHandle(Create()); }
+int OpDestroy(MmfFilterHandle* handle) { return handle ? Destroy(AsMkvFilter(handle)) : kMmfInvalidArgument; }
+
+// MediaInput
+int OpRateInputFormat(MmfChannel*, MmfMediaFormat*, uint32_t, uint32_t*) { return PendingRating(); }
+int OpSetInputFormat(MmfChannel* channel, const MmfMediaFormat* format) {
+  return channel && format ? PendingNotAvailable() : kMmfInvalidArgument;
+}
+int OpSetMediaOutput(MmfChannel* channel, const MmfMediaOutputOps* upstream) {
+  return channel && upstream ? PendingNotAvailable() : kMmfInvalidArgument;
+}
+int OpSetInputChannelMemoryPool(MmfChannel* channel, const MmfMemoryPoolOps* pool, MmfMemoryPool* param) {
+  return channel && pool && param && channel->Filter ? PendingNotAvailable() : kMmfInvalidArgument;
+}
+
+// MediaOutput
+MmfChannel* OpIterateOutputChannels(MmfFilterHandle*, int32_t*) {
+  return AsFrameworkChannel(PendingIterateOutputChannels());
+}
+int OpAcquireOutputChannel(MmfChannel* channel) { return channel ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpReleaseOutputChannel(MmfChannel* channel) { return channel ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpIterateOutputFormats(MmfChannel* channel, MmfMediaFormat* format, int32_t* iterator) {
+  return channel && format && iterator ? PendingIterateOutputFormats() : kMmfInvalidArgument;
+}
+int OpVerifyOutputFormat(MmfChannel*, const MmfMediaFormat*, const MmfMediaFormat*) {
+  return PendingVerifyOutputFormat();
+}
+int OpSetOutputFormat(MmfChannel* channel, const MmfMediaFormat* format) {
+  return channel && format ? PendingNotAvailable() : kMmfInvalidArgument;
+}
+int OpNextBuffer(MmfChannel* channel, MmfMra** buffer) {
+  return channel && buffer ? PendingNextBuffer(buffer) : kMmfInvalidArgument;
+}
+int OpSetOutputChannelMemoryPool(MmfChannel* channel, const MmfMemoryPoolOps* pool, MmfMemoryPool* param) {
+  return channel && pool && param && channel->Filter ? PendingNotAvailable() : kMmfInvalidArgument;
+}
+
+// MediaFlush
+int OpFlush(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+
+// MediaTimeConverter
+int OpConvertToPosition(MmfFilterHandle* handle, uint32_t, uint64_t, uint64_t* position) {
+  return handle && position ? PendingConversion() : kMmfInvalidArgument;
+}
+int OpConvertToTime(MmfFilterHandle* handle, uint32_t, uint64_t, uint64_t* time) {
+  return handle && time ? PendingConversion() : kMmfInvalidArgument;
+}
+
+// MediaSeeker
+int OpSeekQuery(MmfFilterHandle* handle) { return handle ? PendingSeekQuery() : kMmfInvalidArgument; }
+int OpSeek(MmfFilterHandle* handle, uint32_t, uint64_t, uint64_t) {
+  return handle ? PendingNotAvailable() : kMmfInvalidArgument;
+}
+
+// AOStreamInspector
+int OpSniffStream(MmfInputStream*) { return PendingRating(); }
+
+// AOResourceAccess
+AoResource* OpGetResources(MmfFilterHandle* handle) {
+  return IsFilter(handle) ? GetResources(AsMkvFilter(handle)) : nullptr;
+}
+int OpSetResource(MmfFilterHandle* handle, const char* name, const void* value) {
+  if (!IsFilter(handle) || !name) return kMmfInvalidArgument;
+  return SetResource(AsMkvFilter(handle), name, value);
+}
+
+// MediaControl
+int OpStart(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpStop(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpPause(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpResume(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpStatus(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+
+// MediaEventProducer
+int OpEventList(MmfFilterHandle* handle, uint32_t* event, uint32_t* iterator) {
+  if (!handle || !event || !iterator) return kMmfInvalidArgument;
+  return EventList(AsMkvFilter(handle), event, iterator);
+}
+void OpEventSetPostFunction(MmfFilterHandle* handle, MmfEventPost post) {
+  if (handle && handle->Context) EventSetPostFunction(AsMkvFilter(handle), post);
+}
+int OpEventRegister(MmfFilterHandle*, uint32_t, void*) { return EventRegister(); }
+
+// MediaSetInputPosition
+int OpSetInputPosition(MmfFilterHandle*, uint64_t) { return SetInputPosition(); }
+
+// MediaTrickPlay
+int OpTrickQuery(MmfFilterHandle*) { return PendingTrickQuery(); }
+int OpScanForward(MmfFilterHandle* handle, uint32_t) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpScanBackward(MmfFilterHandle* handle, uint32_t) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpScanEnd(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+
+// MediaListMaker
+int OpGetNextReadList(MmfChannel* channel, MmfReadListEntry** entry, MmfReadListEntry*) {
+  return channel && entry ? PendingNotAvailable() : kMmfInvalidArgument;
+}
+
+// MediaMetadataParser
+int OpParseMetadata(MmfInputStream* stream, uint32_t, MmfMetadata** metadata) {
+  return stream && metadata ? PendingNotAvailable() : kMmfInvalidArgument;
+}
+int OpGetMetadata(MmfFilterHandle* handle, MmfMetadata** metadata) {
+  return handle && metadata ? PendingNotAvailable() : kMmfInvalidArgument;
+}
+void OpFreeMetadata(MmfMetadata*) {}
+int OpQueryMetadata(MmfMetadata* metadata, const char* key, uint32_t, MmfMetadataValue* value) {
+  return metadata && key && value ? 0 : kMmfInvalidArgument;
+}
+int OpIterateMetadata(MmfMetadata* metadata, int32_t* index, char** key, MmfMetadataValue* value) {
+  return metadata && index && key && value ? 0 : kMmfInvalidArgument;
+}
+
+constexpr MmfMediaFilterOps media_filter = {.Create = OpCreate, .Destroy = OpDestroy};
+
+constexpr MmfMediaInputOps media_input = {
+    .Reserved0 = nullptr,
+    .Reserved1 = nullptr,
+    .Reserved2 = nullptr,
+    .RateInputFormat = OpRateInputFormat,
+    .SetInputFormat = OpSetInputFormat,
+    .SetMediaOutput = OpSetMediaOutput,
+    .SetInputChannelMemoryPool = OpSetInputChannelMemoryPool,
+};
+
+constexpr MmfMediaOutputOps media_output = {
+    .IterateOutputChannels = OpIterateOutputChannels,
+    .AcquireOutputChannel = OpAcquireOutputChannel,
+    .ReleaseOutputChannel = OpReleaseOutputChannel,
+    .IterateOutputFormats = OpIterateOutputFormats,
+    .VerifyOutputFormat = OpVerifyOutputFormat,
+    .SetOutputFormat = OpSetOutputFormat,
+    .NextBuffer = OpNextBuffer,
+    .SetOutputChannelMemoryPool = OpSetOutputChannelMemoryPool,
+};
+
+constexpr MmfMediaFlushOps media_flush = {.Flush = OpFlush};
+
+constexpr MmfTimeConverterOps media_timeconverter = {
+    .ConvertToPosition = OpConvertToPosition,
+    .ConvertToTime = OpConvertToTime,
+};
+
+constexpr MmfSeekerOps media_seeker = {.SeekQuery = OpSeekQuery, .Seek = OpSeek};
+
+constexpr AoStreamInspectorOps stream_inspector = {.SniffStream = OpSniffStream};
+
+constexpr AoResourceAccessOps resource_access = {.GetResources = OpGetResources, .SetResource = OpSetResource};
+
+constexpr MmfMediaControlOps media_control = {
+    .Start = OpStart,
+    .Stop = OpStop,
+    .Pause = OpPause,
+    .Resume = OpResume,
+    .Status = OpStatus,
+};
+
+constexpr MmfEventProducerOps media_event_producer = {
+    .EventList = OpEventList,
+    .EventSetPostFunction = OpEventSetPostFunction,
+    .EventRegister = OpEventRegister,
+};
+
+constexpr MmfSetInputPositionOps media_setinput_position = {.SetInputPosition = OpSetInputPosition};
+
+constexpr MmfTrickPlayOps media_trickplay = {
+    .TrickQuery = OpTrickQuery,
+    .ScanForward = OpScanForward,
+    .ScanBackward = OpScanBackward,
+    .ScanEnd = OpScanEnd,
+};
+
+constexpr MmfListMakerOps media_listmaker = {.GetNextReadList = OpGetNextReadList};
+
+constexpr MmfMetadataParserOps md_parser = {
+    .Parser_ParseMetadata = OpParseMetadata,
+    .Parser_GetMetadata = OpGetMetadata,
+    .Parser_FreeMetadata = OpFreeMetadata,
+    .Parser_QueryMetadata = OpQueryMetadata,
+    .Parser_IterateMetadata = OpIterateMetadata,
+};
+
+constexpr char kModuleName[] = "kelvane";
+
+}  // namespace
+
+extern "C" __attribute__((visibility("default"))) const AoInterface interfaces[] = {
+    {"Name", 1, kModuleName},
+    {"Version", 100, nullptr},
+    {"MediaFilter", 110, &media_filter},
+    {"MediaInput", 101, &media_input},
+    {"MediaOutput", 101, &media_output},
+    {"MediaFlush", 100, &media_flush},
+    {"MediaTimeConverter", 100, &media_timeconverter},
+    {"MediaSeeker", 102, &media_seeker},
+    {"AOStreamInspector", 100, &stream_inspector},
+    {"AOResourceAccess", 100, &resource_access},
+    {"MediaControl", 101, &media_control},
+    {"MediaEventProducer", 100, &media_event_producer},
+    {"MediaSetInputPosition", 100, &media_setinput_position},
+    {"MediaTrickPlay", 100, &media_trickplay},
+    {"MediaListMaker", 100, &media_listmaker},
+    {"MediaMetadataParser", 100, &md_parser},
+    {nullptr, 0, nullptr},
+};
