@@ -69,10 +69,7 @@ int continue_codec_state(buff_cursor* cursor, mkvcluster* cluster) {
   if (size == 0) return kGoOn;
   auto* copy = static_cast<uint8_t*>(mem_alloc(size));
   if (!copy) return kClusterNoMemory;
-  if (!cursor->copy_exact(copy, size)) {
-    mem_free(copy);
-    return kClusterChildShort;
-  }
+  cursor->copy_out(copy, size);
   cluster->codec_state = copy;
   cluster->codec_state_size = size;
   return kGoOn;

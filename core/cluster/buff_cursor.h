@@ -39,14 +39,14 @@ struct buff_cursor {
     return done;
   }
 
-  // Copies and consumes exactly `count` bytes, or nothing when fewer are there.
-  [[nodiscard]] bool copy_exact(uint8_t* destination, uint32_t count) {
-    if (available() < count) return false;
+  // Copies and consumes `count` bytes, inbuff1's first. The caller has made
+  // sure that available() holds them; never more than is there is read.
+  void copy_out(uint8_t* destination, uint32_t count) {
     uint32_t head = count < first->buff_left ? count : first->buff_left;
+    uint32_t tail = second ? (count - head < second->buff_left ? count - head : second->buff_left) : 0;
     if (head) std::memcpy(destination, first->buff + first->buff_pos, head);
-    if (count > head) std::memcpy(destination + head, second->buff + second->buff_pos, count - head);
-    skip_up_to(count);
-    return true;
+    if (tail) std::memcpy(destination + head, second->buff + second->buff_pos, tail);
+    skip_up_to(uint64_t{head} + tail);
   }
 
  private:

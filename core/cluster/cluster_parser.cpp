@@ -83,7 +83,9 @@ int read_first_children(buff_cursor* cursor, mkvcluster* cluster, uint64_t* skip
       case header_result::done:
         break;
     }
-    if (is_block_id(child.id)) return start_newmkvblock(cursor->first, cursor->second, cluster, skip, child.id, child.size);
+    if (is_block_id(child.id)) {
+      return start_newmkvblock(cursor->first, cursor->second, cluster, skip, child.id, child.size);
+    }
     if (child.id == cluster_id::kCluster) {
       open_cluster(cluster, cursor->position(), child.size);
     } else if (uint64_t* field = child_value_field(cluster, child.id)) {

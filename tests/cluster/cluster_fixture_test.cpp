@@ -54,7 +54,8 @@ TEST_P(ClusterFixtureTest, EveryBufferSizeGivesTheMkvinfoBlockList) {
   ASSERT_FALSE(file.empty());
   uint64_t start = FirstClusterOffset(file.data(), file.size());
   int64_t live_before = host::LiveBlockCount();
-  for (size_t size : {size_t{1}, size_t{2}, size_t{3}, size_t{7}, size_t{64}, size_t{4096}, size_t{32768}, file.size()}) {
+  const size_t sizes[] = {1, 2, 3, 7, 64, 4096, 32768, file.size()};
+  for (size_t size : sizes) {
     for (bool group_tail : {true, false}) {
       DriveOptions options;
       options.buffer_sizes = {size};

@@ -34,8 +34,10 @@ struct DriveOptions {
   // ReferenceBlock decides the Block's key flag. Off: keys of Blocks are not
   // known (false).
   bool read_group_tail = true;
-  // Sees every result with the record as the call left it.
-  std::function<void(int result, const mkvcluster& cluster)> observe;
+  // Sees every result with the record as the call left it; `group_tail` is
+  // set for parse_mkvblockgroup calls (read_group_tail), else the call was
+  // parse_mkvcluster.
+  std::function<void(int result, const mkvcluster& cluster, bool group_tail)> observe;
 };
 
 struct DriveOutcome {
@@ -147,9 +149,9 @@ class Driver {
     }
   }
 
-  int observed(int result) {
+  int observed(int result, bool group_tail = false) {
     ++outcome_.calls;
-    if (options_.observe) options_.observe(result, *cluster_);
+    if (options_.observe) options_.observe(result, *cluster_, group_tail);
     return result;
   }
 
@@ -173,7 +175,7 @@ class Driver {
                   (c.in_blockgroup && position < c.blockgroup_end && position < c.cluster_end);
     if (!inside) return finish_group_tail();
     destroy_mkvcluster(cluster_.get());
-    int result = observed(parse_mkvblockgroup(&in1_, has_in2_ ? &in2_ : nullptr, cluster_.get()));
+    int result = observed(parse_mkvblockgroup(&in1_, has_in2_ ? &in2_ : nullptr, cluster_.get()), true);
     if (result == kClusterGroupEnded) return finish_group_tail();
     if (result == kClusterBlockReady) {  // a further Block in the same group
       finish_group_tail();
