@@ -16,18 +16,17 @@ constexpr uint64_t kMaxTagBinarySize = 32768;
 // A tag value in a new block: text gets a zero-filled block one byte longer,
 // so it always ends in a NUL; binary gets exactly `size` bytes. A size above
 // `limit` (or of 2^32 or more) or a failed allocation logs `message` and is 12
-// with *block null. A short read is 5; the block is kept and *read counts the
-// bytes that arrived.
+// with *block null. A short read is 5 (on an input of unknown length the block
+// is kept and *read counts the bytes that arrived).
 int read_tag_value(mkvvstream* stream, uint64_t size, uint64_t limit, bool text, const char* message,
                    void** block, uint32_t* read) {
   *block = nullptr;
   *read = 0;
-  void* data = nullptr;
+  bool within_limit = size <= limit && size < (uint64_t{1} << 32) - (text ? 1 : 0);
   // A value longer than the rest of the input can only end in a short read.
-  if (size <= limit && size < (uint64_t{1} << 32) - (text ? 1 : 0) && !ebml_payload_fits(stream, size)) {
-    return kStatusReadFailed;
-  }
-  if (size <= limit && size < (uint64_t{1} << 32) - (text ? 1 : 0)) {
+  if (within_limit && !ebml_payload_fits(stream, size)) return kStatusReadFailed;
+  void* data = nullptr;
+  if (within_limit) {
     auto bytes = static_cast<size_t>(size) + (text ? 1 : 0);
     data = text ? mem_alloc_zeroed(bytes) : mem_alloc(bytes == 0 ? 1 : bytes);
   }

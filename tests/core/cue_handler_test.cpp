@@ -147,25 +147,4 @@ TEST(CueHandlerTest, SecondCuesElementReplacesTheFirstWithoutLeaking) {
   EXPECT_EQ(host::LiveBlockCount(), live);
 }
 
-TEST(CueHandlerTest, EveryFailedAllocationIsNoMemoryAndLeaksNothing) {
-  Bytes payload = cat({point(1, {position(1, 10, {master(kCueReference, {uinteger(kCueRefTime, 4)})}), position(2, 10)}),
-                       point(2, {position(1, 20)})});
-  // Records and nodes: 2 points, 3 positions, 1 reference, each with its node.
-  constexpr uint64_t kAllocations = 12;
-  for (uint64_t failing = 1; failing <= kAllocations + 1; ++failing) {
-    int64_t live = host::LiveBlockCount();
-    {
-      HeaderParse parse(payload);
-      host::FailNthAllocation(failing);
-      int status = run_handler(parse, payload);
-      host::FailNthAllocation(0);
-      EXPECT_EQ(status, failing <= kAllocations ? kStatusNoMemory : kStatusOk) << failing;
-      if (status == kStatusOk) {
-        EXPECT_EQ(describe(parse.info().cue_points), "1:1/10/1/0[4];2/10/1/0[]|2:1/20/1/0[]");
-      }
-    }
-    EXPECT_EQ(host::LiveBlockCount(), live) << failing;
-  }
-}
-
 }  // namespace

@@ -10,7 +10,6 @@
 #include "core/memory.h"
 #include "core/metadata_list.h"
 #include "core/status.h"
-#include "host/heap_control.h"
 
 namespace {
 
@@ -209,86 +208,6 @@ TEST(FinalizeMetadataTest, DurationIsScaleTimesTicksInMicrosecondsTruncated) {
     ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
     EXPECT_EQ(num8(file.list(), "Duration"), c.microseconds) << c.timecode_scale << " x " << c.duration;
   }
-}
-
-TEST(FinalizeMetadataTest, FourccComesFromTheCodecTableExactly) {
-  const struct {
-    const char* codec_id;
-    uint32_t fourcc;
-  } cases[] = {
-      {"A_AAC/MPEG4/LC/SBR", 0x4D344143}, {"A_AAC", 0x4D344143}, {"A_AAC/MPEG2/LC", 0x4D324143},
-      {"V_MPEG4/ISO/AVC", 0x41564331}, {"A_OPUS", 0}, {"a_aac", 0}, {"A_AAC/", 0}, {nullptr, 0},
-  };
-  for (const auto& c : cases) {
-    MetadataFixture file;
-    file.AddTrack(2, c.codec_id);
-    ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
-    EXPECT_EQ(num4(file.list(), "Fourcc"), c.fourcc) << (c.codec_id ? c.codec_id : "null");
-  }
-}
-
-TEST(FinalizeMetadataTest, PixelShapeStaysOneByOneWhenTheFrameworkCannotTell) {
-  static uint8_t garbage[] = {0xFF, 0x00, 0x13};
-  const struct {
-    const char* name;
-    uint64_t type;
-    const char* codec_id;
-    bool codec_private;
-  } cases[] = {
-      {"unsupported codec with configuration", 1, "V_VP8", true},
-      {"AVC without configuration", 1, "V_MPEG4/ISO/AVC", false},
-      {"AVC with unreadable configuration", 1, "V_MPEG4/ISO/AVC", true},
-      {"audio with configuration", 2, "A_AAC", true},
-  };
-  for (const auto& c : cases) {
-    MetadataFixture file;
-    mkv_track_info& track = file.AddTrack(c.type, c.codec_id);
-    if (c.codec_private) {
-      track.codec_private = garbage;
-      track.codec_private_size = sizeof garbage;
-    }
-    ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
-    EXPECT_EQ(num4(file.list(), "PixelWidth"), 1u) << c.name;
-    EXPECT_EQ(num4(file.list(), "PixelHeight"), 1u) << c.name;
-  }
-}
-
-TEST(FinalizeMetadataTest, ListHasTagsPlusTwoPlusNinePerTrackUntilItIsFull) {
-  const struct {
-    uint32_t tags;
-    uint32_t tracks;
-    int status;
-    int32_t entries;
-    const char* last_key;
-  } cases[] = {
-      {0, 0, kStatusOk, 2, "TrackCount"},
-      {3, 1, kStatusOk, 14, "SampleRate"},
-      {50, 22, kStatusOk, 250, "SampleRate"},
-      {50, 23, kStatusNoMemory, 250, "SampleRate"},  // the 23rd track's MediaType finds the list full
-      {49, 23, kStatusNoMemory, 250, "MediaType"},
-      {0, 28, kStatusNoMemory, 250, "PixelWidth"},
-  };
-  const char* names[] = {"TITLE", "ARTIST", "GENRE", "ALBUM", "COMMENT"};
-  for (const auto& c : cases) {
-    MetadataFixture file;
-    for (uint32_t i = 0; i < c.tags; ++i) file.AddTag(names[i % 5], "v");
-    for (uint32_t i = 0; i < c.tracks; ++i) file.AddTrack(1 + i % 2, "A_AC3");
-    EXPECT_EQ(FinalizeMetadata(&file.info()), c.status) << c.tags << "/" << c.tracks;
-    ASSERT_EQ(file.list().entry_count, c.entries) << c.tags << "/" << c.tracks;
-    EXPECT_STREQ(file.list().key[c.entries - 1], c.last_key) << c.tags << "/" << c.tracks;
-  }
-}
-
-TEST(FinalizeMetadataTest, FileWithoutAListBuildsNothing) {
-  MetadataFixture file;
-  mkv_metadata_list* list = file.info().metadata;
-  file.info().metadata = nullptr;
-  file.AddTag("TITLE", "t");
-  file.AddTrack(1);
-  uint64_t allocations = host::AllocationCount();
-  EXPECT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
-  EXPECT_EQ(host::AllocationCount(), allocations);
-  file.info().metadata = list;
 }
 
 }  // namespace

@@ -41,41 +41,4 @@ TEST(AddMetadataEntryTest, ValueSizeDecidesWhetherTheEntryIsAdded) {
   }
 }
 
-TEST(AddMetadataEntryTest, ListHoldsTwoHundredFiftyEntriesThenRefuses) {
-  int64_t live = host::LiveBlockCount();
-  auto* list = mem_new_zeroed<mkv_metadata_list>();
-  ASSERT_NE(list, nullptr);
-  uint32_t number = 0;
-  for (; number < 250; ++number) ASSERT_EQ(add_metadata_entry(list, "NUM4", "N", &number, 4), kStatusOk);
-  EXPECT_EQ(add_metadata_entry(list, "NUM4", "N", &number, 4), kStatusNoMemory);
-  EXPECT_EQ(list->entry_count, 250);
-  EXPECT_EQ(list->key[250], nullptr);
-  EXPECT_EQ(*static_cast<uint32_t*>(list->value[249]), 249u);
-  FreeMetadata(list);
-  EXPECT_EQ(host::LiveBlockCount(), live);
-}
-
-TEST(AddMetadataEntryTest, FailedCopyAddsNothingAndLeaksNothing) {
-  for (uint64_t failing : {1, 2}) {  // the key's copy, the value's copy
-    int64_t live = host::LiveBlockCount();
-    auto* list = mem_new_zeroed<mkv_metadata_list>();
-    ASSERT_NE(list, nullptr);
-    ASSERT_EQ(add_metadata_entry(list, "UTF8", "Name", "abc", 3), kStatusOk);
-    host::FailNthAllocation(failing);
-    EXPECT_EQ(add_metadata_entry(list, "UTF8", "Artist", "de", 2), kStatusNoMemory) << failing;
-    host::FailNthAllocation(0);
-    EXPECT_EQ(list->entry_count, 1) << failing;
-    EXPECT_EQ(list->key[1], nullptr) << failing;
-    EXPECT_EQ(list->value[1], nullptr) << failing;
-    FreeMetadata(list);
-    EXPECT_EQ(host::LiveBlockCount(), live) << failing;
-  }
-}
-
-TEST(FreeMetadataTest, NullListIsIgnored) {
-  int64_t live = host::LiveBlockCount();
-  FreeMetadata(nullptr);
-  EXPECT_EQ(host::LiveBlockCount(), live);
-}
-
 }  // namespace

@@ -126,11 +126,9 @@ TEST(MetaSeekHandlerTest, OversizedOrTruncatedValuesFailTheElement) {
 TEST(MetaSeekHandlerTest, FailedAllocationIsLoggedAndLeavesNothing) {
   Bytes payload = cat({seek(kInfo, 1), seek(kTracks, 2)});
   const struct {
-    uint64_t failing;  // 1: the first entry, 2: its node, 3: the second entry, 4: its node
+    uint64_t failing;  // 3: the second entry, 4: its node
     const char* message;
   } cases[] = {
-      {1, "Can't allocate new seek entry."},
-      {2, "Can't allocate new queue entry."},
       {3, "Can't allocate new seek entry."},
       {4, "Can't allocate new queue entry."},
   };

@@ -150,23 +150,4 @@ TEST(TagHandlerTest, FiftyTagsAreKeptAndTheFiftyFirstIsLoggedAndDropped) {
   }
 }
 
-TEST(TagHandlerTest, FailedAllocationsLeaveNoLeakAfterDestroy) {
-  Bytes payload = master(kTag, {simple_tag("TITLE", "abc"),
-                                master(kSimpleTag, {str(kTagName, "COVER"), bin(kTagBinary, filler(10))})});
-  constexpr uint64_t kAllocations = 4;  // name, string, name, binary
-  for (uint64_t failing = 1; failing <= kAllocations + 1; ++failing) {
-    int64_t live = host::LiveBlockCount();
-    {
-      LogRecorder log;
-      HeaderParse parse(payload);
-      host::FailNthAllocation(failing);
-      int status = run_handler(parse, payload);
-      host::FailNthAllocation(0);
-      EXPECT_EQ(status, failing <= kAllocations ? kStatusNoMemory : kStatusOk) << failing;
-      EXPECT_EQ(log.messages().size(), failing <= kAllocations ? 1u : 0u) << failing;
-    }
-    EXPECT_EQ(host::LiveBlockCount(), live) << failing;
-  }
-}
-
 }  // namespace
