@@ -161,6 +161,18 @@ bool ParseBlockLine(std::string_view line, FixtureExpectation* fx) {
   return true;
 }
 
+bool ParseFullFrameLine(std::string_view line, std::vector<ExpectedFullFrame>* frames) {
+  std::vector<std::string_view> parts = SplitOn(line, ' ');
+  ExpectedFullFrame frame{};
+  if (parts.size() != 4 || parts[3].size() > 8 || !ParseNumber(parts[0], &frame.track) ||
+      !ParseNumber(parts[1], &frame.ticks) || !ParseNumber(parts[2], &frame.size) ||
+      !ParseNumber(parts[3], &frame.adler32, 16)) {
+    return false;
+  }
+  frames->push_back(frame);
+  return true;
+}
+
 }  // namespace
 
 std::vector<std::string> FixtureNames() {
@@ -188,6 +200,16 @@ FixtureExpectation ParseFixtureTexts(const std::string& name, const std::string&
 FixtureExpectation LoadFixture(const std::string& name) {
   return ParseFixtureTexts(name, ReadTextOrFail(name + ".expected"), ReadTextOrFail(name + ".cues"),
                            ReadTextOrFail(name + ".blocks"));
+}
+
+std::vector<ExpectedFullFrame> ParseFullFramesText(const std::string& name, const std::string& text) {
+  std::vector<ExpectedFullFrame> frames;
+  ForEachLine(name + ".frames", text, [&](std::string_view line) { return ParseFullFrameLine(line, &frames); });
+  return frames;
+}
+
+std::vector<ExpectedFullFrame> LoadFullFrames(const std::string& name) {
+  return ParseFullFramesText(name, ReadTextOrFail(name + ".frames"));
 }
 
 std::vector<uint8_t> ReadFixtureBytes(const std::string& name) {

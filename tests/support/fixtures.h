@@ -1,7 +1,8 @@
 #pragma once
 // The real Matroska files in tests/fixtures and the facts that mkvinfo and
 // ffprobe report about them (written by tests/fixtures/make_fixtures.sh):
-// NAME.mkv, NAME.expected, NAME.cues and NAME.blocks, listed in index.txt.
+// NAME.mkv, NAME.expected, NAME.cues and NAME.blocks, listed in index.txt
+// (and NAME.frames for a track stored with header removal).
 
 #include <cstddef>
 #include <cstdint>
@@ -60,6 +61,17 @@ struct FixtureExpectation {
   std::vector<ExpectedBlock> blocks;                       // in file order
 };
 
+// One line of NAME.frames, written only for a fixture whose track is stored
+// with header removal: a frame of that track as a player must see it once the
+// removed prefix is put back (size and Adler-32 that mkvinfo reported for the
+// file before the prefix was removed), in file order.
+struct ExpectedFullFrame {
+  uint64_t track;
+  int64_t ticks;
+  uint32_t size;
+  uint32_t adler32;
+};
+
 // Fixture names in the order of index.txt.
 std::vector<std::string> FixtureNames();
 
@@ -71,6 +83,11 @@ FixtureExpectation LoadFixture(const std::string& name);
 // The same parse over texts in memory; `name` only labels the failures.
 FixtureExpectation ParseFixtureTexts(const std::string& name, const std::string& expected,
                                      const std::string& cues, const std::string& blocks);
+
+// Reads NAME.frames, and the same parse over a text in memory; failures are
+// reported as LoadFixture reports them.
+std::vector<ExpectedFullFrame> LoadFullFrames(const std::string& name);
+std::vector<ExpectedFullFrame> ParseFullFramesText(const std::string& name, const std::string& text);
 
 // The whole NAME.mkv; empty (with ADD_FAILURE) when it cannot be read.
 std::vector<uint8_t> ReadFixtureBytes(const std::string& name);
