@@ -1,0 +1,107 @@
+#pragma once
+// One fuzz input for the playback parser, decoded and driven; shared by the
+// libFuzzer target and the test that replays the inputs it found.
+//
+// Input: a flags byte (bit 0: read group tails, bit 1: start at byte 0 rather
+// than at the first Cluster, bits 2-4: buffer-size count - 1), that many
+// buffer-size bytes, one allocation-failure byte (the nth allocation fails;
+// 0: none), then the file.
+//
+// Every result must be a declared one, no fixed capacity may be exceeded,
+// every block allocated must be freed again, and when the bytes parse
+// completely both in the chosen buffers and in one buffer, the block lists
+// must agree.
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+
+#include "core/cluster/cluster_status.h"
+#include "core/cluster/mkv_cluster.h"
+#include "host/heap_control.h"
+#include "tests/support/cluster_driver.h"
+
+namespace testing_support {
+
+namespace cluster_fuzz_detail {
+
+// 0..127 as they are, above that in steps of 64 up to 8192.
+inline size_t BufferSize(uint8_t code) { return code < 128 ? code : static_cast<size_t>(code - 127) * 64; }
+
+// "" when the result and the record are as declared, else what is wrong.
+inline std::string BrokenInvariant(int result, const mkvcluster& c, bool group_tail) {
+  bool declared = group_tail ? (result == kClusterBlockReady || result == kClusterChildShort ||
+                                result == kClusterInvalid || result == kClusterNoMemory ||
+                                result == kClusterGroupEnded)
+                             : (result <= kClusterBlockReady && result >= kClusterNoMemory);
+  if (!declared) return "undeclared result " + std::to_string(result);
+  if (result == kClusterBlockReady &&
+      (c.frame_count < 1 || c.frame_count > kMaxLaceFrames || !c.frame_sizes ||
+       c.resume.step != mkv_resume_step::none)) {
+    return "block without a frame table";
+  }
+  if (c.resume.lace_count > kMaxLaceFrames || c.resume.lace_index >= kMaxLaceFrames) return "lace table overrun";
+  if (c.resume.number.left > 8 || c.resume.number.length > 8) return "number longer than 8 bytes";
+  // destroy_mkvcluster leaves codec_state_size as it was; a copy is never empty.
+  if (c.codec_state_size > kMaxCodecStateSize || (c.codec_state && c.codec_state_size == 0)) {
+    return "CodecState of " + std::to_string(c.codec_state_size) + " bytes";
+  }
+  if (c.in_blockgroup > 1) return "in_blockgroup not 0 or 1";
+  return "";
+}
+
+inline bool SameBlocks(const DriveOutcome& a, const DriveOutcome& b, bool keys) {
+  if (a.blocks.size() != b.blocks.size()) return false;
+  for (size_t i = 0; i < a.blocks.size(); ++i) {
+    const DrivenBlock& x = a.blocks[i];
+    const DrivenBlock& y = b.blocks[i];
+    if (x.track != y.track || x.ticks != y.ticks || x.flags != y.flags || x.frame_sizes != y.frame_sizes ||
+        x.adler32 != y.adler32 || (keys && x.key != y.key)) {
+      return false;
+    }
+  }
+  return true;
+}
+
+}  // namespace cluster_fuzz_detail
+
+// "" when the input passed every check, else the first check that failed.
+inline std::string RunClusterFuzzInput(const uint8_t* data, size_t size) {
+  using namespace cluster_fuzz_detail;
+  if (size < 3) return "";
+  uint8_t flags = data[0];
+  size_t size_count = 1 + (flags >> 2 & 7);
+  if (size < 2 + size_count) return "";
+  DriveOptions options;
+  options.read_group_tail = flags & 1;
+  options.buffer_sizes.clear();
+  for (size_t i = 0; i < size_count; ++i) options.buffer_sizes.push_back(BufferSize(data[1 + i]));
+  uint8_t fail_at = data[1 + size_count];
+  const uint8_t* file = data + 2 + size_count;
+  size_t file_size = size - 2 - size_count;
+  uint64_t start = flags & 2 ? 0 : FirstClusterOffset(file, file_size);
+  if (start >= file_size) start = 0;
+
+  std::string broken;
+  options.observe = [&broken](int result, const mkvcluster& cluster, bool group_tail) {
+    if (broken.empty()) broken = BrokenInvariant(result, cluster, group_tail);
+  };
+  int64_t live = host::LiveBlockCount();
+  host::FailNthAllocation(fail_at);
+  DriveOutcome split = DriveClusters(file, file_size, start, options);
+  host::FailNthAllocation(0);
+  if (!broken.empty()) return broken;
+  if (host::LiveBlockCount() != live) return "blocks leaked";
+
+  DriveOptions whole_options = options;
+  whole_options.buffer_sizes = {file_size};
+  DriveOutcome whole = DriveClusters(file, file_size, start, whole_options);
+  if (!broken.empty()) return broken + " (one buffer)";
+  if (host::LiveBlockCount() != live) return "blocks leaked (one buffer)";
+  if (fail_at == 0 && split.complete && whole.complete && !SameBlocks(split, whole, options.read_group_tail)) {
+    return "blocks differ from the one-buffer parse";
+  }
+  return "";
+}
+
+}  // namespace testing_support
