@@ -4,6 +4,7 @@
 
 #include "filter/events.h"
 #include "filter/instance.h"
+#include "filter/metadata_parser.h"
 #include "filter/mkv_context.h"
 #include "filter/pending_operations.h"
 #include "filter/resource_table.h"
@@ -112,19 +113,31 @@ int OpGetNextReadList(MmfChannel* channel, MmfReadListEntry** entry, MmfReadList
   return channel && entry ? PendingNotAvailable() : kMmfInvalidArgument;
 }
 
-// MediaMetadataParser
+// MediaMetadataParser: the framework's opaque block is the core's metadata list.
+mkv_metadata_list* AsList(MmfMetadata* metadata) { return reinterpret_cast<mkv_metadata_list*>(metadata); }
+
 int OpParseMetadata(MmfInputStream* stream, uint32_t, MmfMetadata** metadata) {
-  return stream && metadata ? PendingNotAvailable() : kMmfInvalidArgument;
+  if (!stream || !metadata) return kMmfInvalidArgument;
+  mkv_metadata_list* list = nullptr;
+  int result = Parser_ParseMetadata(stream, &list);
+  if (result == kMmfOk) *metadata = reinterpret_cast<MmfMetadata*>(list);
+  return result;
 }
 int OpGetMetadata(MmfFilterHandle* handle, MmfMetadata** metadata) {
-  return handle && metadata ? PendingNotAvailable() : kMmfInvalidArgument;
+  if (!handle || !metadata) return kMmfInvalidArgument;
+  mkv_metadata_list* list = nullptr;
+  int result = Parser_GetMetadata(AsMkvFilter(handle), &list);
+  if (result == kMmfOk) *metadata = reinterpret_cast<MmfMetadata*>(list);
+  return result;
 }
-void OpFreeMetadata(MmfMetadata*) {}
-int OpQueryMetadata(MmfMetadata* metadata, const char* key, uint32_t, MmfMetadataValue* value) {
-  return metadata && key && value ? 0 : kMmfInvalidArgument;
+void OpFreeMetadata(MmfMetadata* metadata) { Parser_FreeMetadata(AsList(metadata)); }
+int OpQueryMetadata(MmfMetadata* metadata, const char* key, uint32_t occurrence, MmfMetadataValue* value) {
+  if (!metadata || !key || !value) return kMmfInvalidArgument;
+  return Parser_QueryMetadata(AsList(metadata), key, occurrence, value);
 }
 int OpIterateMetadata(MmfMetadata* metadata, int32_t* index, char** key, MmfMetadataValue* value) {
-  return metadata && index && key && value ? 0 : kMmfInvalidArgument;
+  if (!metadata || !index || !key || !value) return kMmfInvalidArgument;
+  return Parser_IterateMetadata(AsList(metadata), index, key, value);
 }
 
 constexpr MmfMediaFilterOps media_filter = {.Create = OpCreate, .Destroy = OpDestroy};

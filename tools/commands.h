@@ -3,3 +3,4 @@
 // answers the process exit code: 0 ok, 1 the file was refused or failed, 2 usage.
 
 int RunInfo(int argc, char** argv);
+int RunMetadata(int argc, char** argv);

@@ -13,6 +13,7 @@ struct Command {
 
 const Command kCommands[] = {
     {"info", RunInfo, "parse the headers of a Matroska file and print what they say"},
+    {"metadata", RunMetadata, "print the metadata entries the plug-in offers for a file"},
 };
 
 void PrintUsage(FILE* out) {
