@@ -1,0 +1,221 @@
+// Media buffers (MRAs) and their pools. A buffer element holds a reference to
+// its pool buffer from the moment it is set until the media buffer is released
+// or the element is replaced.
+
+#include <condition_variable>
+#include <mutex>
+#include <type_traits>
+#include <vector>
+
+#include "host/memory_pools.h"
+#include "platform/channel.h"
+#include "platform/mra_pool.h"
+
+namespace {
+
+struct Element {
+  uint32_t kind;  // kMmfElement...
+  uint32_t type;  // property type
+  uint32_t low;
+  uint16_t high;
+  MmfPoolBuffer* handle;  // buffer element: holds one reference
+  uint8_t* address;
+  uint32_t size;
+};
+
+struct MraPoolState;
+
+// The framework record comes first so that a media buffer is the record's address.
+struct HostMra {
+  MmfMra record;
+  Element* elements;  // Capacity of them
+  MraPoolState* pool;
+  uint32_t in_use;
+};
+static_assert(std::is_standard_layout_v<HostMra>);
+
+struct MraPoolState {
+  std::mutex mutex;
+  std::condition_variable returned;
+  std::vector<HostMra> mras;
+  std::vector<Element> elements;
+  std::vector<HostMra*> free;
+  uint32_t in_use = 0;
+  bool closed = false;  // freed by its owner; deleted with the last media buffer
+};
+
+constexpr int kInvalid = 22;
+constexpr int kOutOfRange = 28;
+constexpr int kNoneFree = 11;
+constexpr int kNoMemory = 12;
+
+HostMra* Host(MmfMra* mra) { return reinterpret_cast<HostMra*>(mra); }
+MraPoolState* State(MmfMraPool* pool) { return reinterpret_cast<MraPoolState*>(pool); }
+
+const Element* Find(MmfMra* mra, uint32_t index) {
+  if (!mra || index >= mra->ElementCount) return nullptr;
+  return &Host(mra)->elements[index];
+}
+
+void ClearElement(Element* element) {
+  if (element->kind == kMmfElementBuffer && element->handle) host::DropBufferReference(element->handle);
+  *element = Element{};
+}
+
+// The element to set at index: an existing one (cleared) or the next free one.
+int PrepareSet(MmfMra* mra, uint32_t index, Element** element) {
+  if (!mra) return kInvalid;
+  if (index > mra->ElementCount || index >= mra->Capacity) return kOutOfRange;
+  *element = &Host(mra)->elements[index];
+  if (index < mra->ElementCount) {
+    ClearElement(*element);
+  } else {
+    ++mra->ElementCount;
+  }
+  return 0;
+}
+
+}  // namespace
+
+namespace host {
+
+MmfMraPool* MakeMraPool(uint32_t count, uint32_t capacity) {
+  if (count == 0 || capacity == 0) return nullptr;
+  auto* state = new MraPoolState;
+  state->mras.resize(count);
+  state->elements.resize(static_cast<size_t>(count) * capacity);
+  for (uint32_t i = 0; i < count; ++i) {
+    HostMra& mra = state->mras[i];
+    mra.record.Capacity = capacity;
+    mra.record.ElementCount = 0;
+    mra.elements = &state->elements[static_cast<size_t>(i) * capacity];
+    mra.pool = state;
+    mra.in_use = 0;
+    state->free.push_back(&mra);
+  }
+  return reinterpret_cast<MmfMraPool*>(state);
+}
+
+uint32_t MraPoolFreeCount(MmfMraPool* pool) {
+  std::lock_guard lock(State(pool)->mutex);
+  return static_cast<uint32_t>(State(pool)->free.size());
+}
+
+}  // namespace host
+
+extern "C" int MmfAllocateMraPool(MmfMraPool** pool, MmfChannel* channel, uint32_t capacity) {
+  if (!pool || !channel || capacity == 0) return kInvalid;
+  uint32_t count = channel->Format.buffer_count ? channel->Format.buffer_count : 1;
+  MmfMraPool* made = host::MakeMraPool(count, capacity);
+  if (!made) return kNoMemory;
+  *pool = made;
+  return 0;
+}
+
+extern "C" int MmfFreeMraPool(MmfMraPool* pool) {
+  if (!pool) return kInvalid;
+  MraPoolState* state = State(pool);
+  bool last;
+  {
+    std::lock_guard lock(state->mutex);
+    state->closed = true;
+    last = state->in_use == 0;
+    state->returned.notify_all();
+  }
+  if (last) delete state;
+  return 0;
+}
+
+extern "C" int MmfAcquireMra(MmfMraPool* pool, MmfMra** mra, uint32_t flags) {
+  if (!pool || !mra) return kInvalid;
+  MraPoolState* state = State(pool);
+  std::unique_lock lock(state->mutex);
+  if (!(flags & kMmfAcquireNoWait)) {
+    state->returned.wait(lock, [state] { return !state->free.empty() || state->closed; });
+  }
+  if (state->free.empty() || state->closed) return kNoneFree;
+  HostMra* taken = state->free.back();
+  state->free.pop_back();
+  taken->in_use = 1;
+  taken->record.ElementCount = 0;
+  ++state->in_use;
+  *mra = &taken->record;
+  return 0;
+}
+
+extern "C" int MmfReleaseMra(MmfMra* mra) {
+  if (!mra) return kInvalid;
+  HostMra* host_mra = Host(mra);
+  for (uint32_t i = 0; i < mra->ElementCount; ++i) ClearElement(&host_mra->elements[i]);
+  mra->ElementCount = 0;
+  MraPoolState* state = host_mra->pool;
+  bool delete_pool = false;
+  {
+    std::lock_guard lock(state->mutex);
+    if (!host_mra->in_use) return kInvalid;
+    host_mra->in_use = 0;
+    state->free.push_back(host_mra);
+    --state->in_use;
+    delete_pool = state->closed && state->in_use == 0;
+    state->returned.notify_one();
+  }
+  if (delete_pool) delete state;
+  return 0;
+}
+
+extern "C" int MmfGetMraElementType(MmfMra* mra, uint32_t index, uint32_t* kind) {
+  const Element* element = Find(mra, index);
+  if (!element || !kind) return kInvalid;
+  *kind = element->kind;
+  return 0;
+}
+
+extern "C" int MmfGetMraBufferElement(MmfMra* mra, uint32_t index, MmfPoolBuffer** handle, uint8_t** address,
+                                      uint32_t* size) {
+  const Element* element = Find(mra, index);
+  if (!element || element->kind != kMmfElementBuffer || !handle || !address || !size) return kInvalid;
+  *handle = element->handle;
+  *address = element->address;
+  *size = element->size;
+  return 0;
+}
+
+extern "C" int MmfGetMraPropertyElement(MmfMra* mra, uint32_t index, uint32_t* type, uint32_t* low,
+                                        uint16_t* high) {
+  const Element* element = Find(mra, index);
+  if (!element || element->kind != kMmfElementProperty || !type || !low || !high) return kInvalid;
+  *type = element->type;
+  *low = element->low;
+  *high = element->high;
+  return 0;
+}
+
+extern "C" int MmfSetMraPropertyElement(MmfMra* mra, uint32_t index, uint32_t type, uint32_t low, uint16_t high) {
+  Element* element = nullptr;
+  int result = PrepareSet(mra, index, &element);
+  if (result != 0) return result;
+  element->kind = kMmfElementProperty;
+  element->type = type;
+  element->low = low;
+  element->high = high;
+  return 0;
+}
+
+extern "C" int MmfSetMraBufferElement(MmfMra* mra, uint32_t index, MmfPoolBuffer* handle, uint8_t* address,
+                                      uint32_t size) {
+  if (!mra || !handle || !address) return kInvalid;
+  // The bytes must lie inside the pool buffer that keeps them alive.
+  if (address < handle->Data || address > handle->Data + handle->Size ||
+      size > static_cast<uint32_t>(handle->Data + handle->Size - address)) {
+    return kInvalid;
+  }
+  Element* element = nullptr;
+  int result = PrepareSet(mra, index, &element);
+  if (result != 0) return result;
+  host::ReferenceBuffer(handle);
+  element->kind = kMmfElementBuffer;
+  element->handle = handle;
+  element->address = address;
+  element->size = size;
+  return 0;
+}

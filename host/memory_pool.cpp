@@ -1,0 +1,167 @@
+// Memory pools: fixed buffers with reference counts behind the framework's
+// operation table.
+
+#include <condition_variable>
+#include <cstring>
+#include <mutex>
+#include <type_traits>
+#include <vector>
+
+#include "host/memory_pools.h"
+
+namespace {
+
+struct PoolState;
+
+// The framework record comes first so that a buffer handle is the record's address.
+struct HostBuffer {
+  MmfPoolBuffer record;
+  uint32_t references;
+  uint32_t mapped;
+};
+static_assert(std::is_standard_layout_v<HostBuffer>);
+
+struct PoolState {
+  std::mutex mutex;
+  std::condition_variable returned;
+  uint32_t size = 0;
+  std::vector<HostBuffer> buffers;
+  std::vector<uint8_t> bytes;
+  std::vector<HostBuffer*> free;
+  uint32_t in_use = 0;
+  bool closed = false;  // the owner has gone; delete with the last buffer
+};
+
+PoolState* State(MmfMemoryPool* pool) { return reinterpret_cast<PoolState*>(pool); }
+HostBuffer* Host(MmfPoolBuffer* buffer) { return reinterpret_cast<HostBuffer*>(buffer); }
+
+// With the pool's lock held: a free buffer with one reference, or null.
+MmfPoolBuffer* TakeLocked(PoolState* state) {
+  if (state->free.empty()) return nullptr;
+  HostBuffer* buffer = state->free.back();
+  state->free.pop_back();
+  buffer->references = 1;
+  buffer->mapped = 0;
+  ++state->in_use;
+  return &buffer->record;
+}
+
+uint32_t OpBufferSize(MmfMemoryPool* pool) { return pool ? State(pool)->size : 0; }
+uint32_t OpBufferCount(MmfMemoryPool* pool) {
+  return pool ? static_cast<uint32_t>(State(pool)->buffers.size()) : 0;
+}
+uint32_t OpFreeCount(MmfMemoryPool* pool) {
+  if (!pool) return 0;
+  std::lock_guard lock(State(pool)->mutex);
+  return static_cast<uint32_t>(State(pool)->free.size());
+}
+
+int OpAcquireBuffer(MmfMemoryPool* pool, MmfPoolBuffer** buffer, uint32_t) {
+  if (!pool || !buffer) return 22;
+  PoolState* state = State(pool);
+  std::lock_guard lock(state->mutex);
+  MmfPoolBuffer* taken = TakeLocked(state);
+  if (!taken) return 11;
+  *buffer = taken;
+  return 0;
+}
+
+int OpMapBuffer(MmfPoolBuffer* buffer) {
+  if (!buffer) return 22;
+  std::lock_guard lock(State(buffer->Pool)->mutex);
+  Host(buffer)->mapped = 1;
+  return 0;
+}
+
+int OpReleaseMappedBuffer(MmfPoolBuffer* buffer) {
+  if (!buffer) return 22;
+  host::DropBufferReference(buffer);
+  return 0;
+}
+
+int OpReleaseBuffer(MmfPoolBuffer* buffer) {
+  if (!buffer) return 22;
+  host::DropBufferReference(buffer);
+  return 0;
+}
+
+const MmfMemoryPoolOps kPoolOps = {
+    .BufferSize = OpBufferSize,
+    .BufferCount = OpBufferCount,
+    .FreeCount = OpFreeCount,
+    .AcquireBuffer = OpAcquireBuffer,
+    .MapBuffer = OpMapBuffer,
+    .ReleaseMappedBuffer = OpReleaseMappedBuffer,
+    .ReleaseBuffer = OpReleaseBuffer,
+};
+
+}  // namespace
+
+namespace host {
+
+MemoryPool::MemoryPool(uint32_t size, uint32_t count) {
+  auto* state = new PoolState;
+  state->size = size;
+  state->bytes.resize(static_cast<size_t>(size) * count);
+  state->buffers.resize(count);
+  for (uint32_t i = 0; i < count; ++i) {
+    HostBuffer& buffer = state->buffers[i];
+    buffer.record.Pool = reinterpret_cast<MmfMemoryPool*>(state);
+    buffer.record.Data = state->bytes.data() + static_cast<size_t>(size) * i;
+    buffer.record.Size = size;
+    state->free.push_back(&buffer);
+  }
+  handle_ = reinterpret_cast<MmfMemoryPool*>(state);
+}
+
+MemoryPool::~MemoryPool() {
+  PoolState* state = State(handle_);
+  bool last;
+  {
+    std::lock_guard lock(state->mutex);
+    state->closed = true;
+    last = state->in_use == 0;
+  }
+  if (last) delete state;
+}
+
+const MmfMemoryPoolOps* MemoryPool::Ops() { return &kPoolOps; }
+
+MmfPoolBuffer* MemoryPool::AcquireWaiting(std::chrono::milliseconds timeout) {
+  PoolState* state = State(handle_);
+  std::unique_lock lock(state->mutex);
+  state->returned.wait_for(lock, timeout, [state] { return !state->free.empty(); });
+  return TakeLocked(state);
+}
+
+uint32_t MemoryPool::FreeCount() const { return OpFreeCount(handle_); }
+
+uint32_t BufferReferences(const MmfPoolBuffer* buffer) {
+  PoolState* state = State(buffer->Pool);
+  std::lock_guard lock(state->mutex);
+  return reinterpret_cast<const HostBuffer*>(buffer)->references;
+}
+
+void ReferenceBuffer(MmfPoolBuffer* buffer) {
+  std::lock_guard lock(State(buffer->Pool)->mutex);
+  ++Host(buffer)->references;
+}
+
+void DropBufferReference(MmfPoolBuffer* buffer) {
+  PoolState* state = State(buffer->Pool);
+  bool delete_pool = false;
+  {
+    std::lock_guard lock(state->mutex);
+    HostBuffer* host_buffer = Host(buffer);
+    if (host_buffer->references == 0) return;  // already back in the pool
+    if (--host_buffer->references != 0) return;
+    host_buffer->mapped = 0;
+    state->free.push_back(host_buffer);
+    --state->in_use;
+    delete_pool = state->closed && state->in_use == 0;
+    state->returned.notify_one();
+  }
+  if (delete_pool) delete state;
+}
+
+}  // namespace host

@@ -1,0 +1,50 @@
+#pragma once
+// The host's memory pools and media-buffer (MRA) pools. Pool buffers are
+// reference counted: the acquirer holds one reference, every buffer element of
+// a media buffer that points into the buffer holds another, and the buffer
+// returns to its pool when the last reference goes. So an output media buffer
+// that refers to the bytes of an input buffer keeps them valid after the
+// input buffer itself was given back. Every operation is thread-safe.
+
+#include <chrono>
+#include <cstdint>
+
+#include "platform/media_buffer.h"
+#include "platform/memory_pool.h"
+
+namespace host {
+
+// `count` buffers of `size` bytes. Destroying the object closes the pool:
+// buffers still referenced stay valid, and the storage goes with the last one.
+class MemoryPool {
+ public:
+  MemoryPool(uint32_t size, uint32_t count);
+  ~MemoryPool();
+  MemoryPool(const MemoryPool&) = delete;
+  MemoryPool& operator=(const MemoryPool&) = delete;
+
+  // The framework's view: the operation table and the pool argument.
+  static const MmfMemoryPoolOps* Ops();
+  MmfMemoryPool* handle() const { return handle_; }
+
+  // A buffer with one reference for the caller, waiting up to `timeout` for one
+  // to come back; null when none did.
+  MmfPoolBuffer* AcquireWaiting(std::chrono::milliseconds timeout);
+  uint32_t FreeCount() const;
+
+ private:
+  MmfMemoryPool* handle_;
+};
+
+// References held on a buffer (0 once it is back in its pool).
+uint32_t BufferReferences(const MmfPoolBuffer* buffer);
+// One more reference; the holder gives it back with DropBufferReference.
+void ReferenceBuffer(MmfPoolBuffer* buffer);
+void DropBufferReference(MmfPoolBuffer* buffer);
+
+// A pool of `count` media buffers with `capacity` elements each, for the host's
+// own filters; freed with MmfFreeMraPool.
+MmfMraPool* MakeMraPool(uint32_t count, uint32_t capacity);
+uint32_t MraPoolFreeCount(MmfMraPool* pool);
+
+}  // namespace host
