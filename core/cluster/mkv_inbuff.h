@@ -4,6 +4,7 @@
 // begin in one buffer and end in the next without being copied.
 
 #include <cstdint>
+#include <type_traits>
 
 struct mkvinbuff {
   const uint8_t* buff;    // first byte of the buffer's data
@@ -12,6 +13,9 @@ struct mkvinbuff {
   uint32_t buff_left;     // bytes not consumed: buff_size - buff_pos while the view is in use
   uint64_t buff_fileoff;  // file offset of buff[0]
 };
+
+// The output path copies views (inbuff1 = inbuff2) and zeroes them on a flush.
+static_assert(std::is_standard_layout_v<mkvinbuff> && std::is_trivially_copyable_v<mkvinbuff>);
 
 // Results of ebml_get_byte_from_buff and skip_buffbytes.
 constexpr int kBuffGotByte = 1;
