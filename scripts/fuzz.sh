@@ -15,8 +15,8 @@ for fuzzer in build/fuzz/fuzz/*_fuzzer; do
   seeds=()
   [[ -d tests/fixtures ]] && seeds+=(tests/fixtures)
   [[ -d fuzz/corpus/$name ]] && seeds+=("fuzz/corpus/$name")
-  dict=()
-  [[ -f fuzz/matroska.dict ]] && dict=(-dict=fuzz/matroska.dict)
+  dict=(-dict=fuzz/matroska.dict)
+  [[ -f fuzz/${name%_fuzzer}.dict ]] && dict=(-dict="fuzz/${name%_fuzzer}.dict")
   echo "--- $name for ${seconds}s"
   if ! "$fuzzer" "${dict[@]}" -max_total_time="$seconds" -timeout=10 -rss_limit_mb=2048 \
       -artifact_prefix=build/fuzz/ -print_final_stats=1 "$corpus" "${seeds[@]}" 2>build/fuzz/"$name".log; then
