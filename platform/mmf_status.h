@@ -5,6 +5,7 @@
 enum {
   kMmfOk = 0,
   kMmfReadOnly = 1,            // a resource that cannot be set; also a generic error
+  kMmfEndOfStream = 2,         // NextBuffer: the stream has ended; not a control state, so it sticks
   kMmfFormatMatch = 100,       // a format is offered or verified
   kMmfBufferDelivered = 256,   // NextBuffer handed out a media buffer
   kMmfInvalidArgument = 22,
