@@ -1,5 +1,7 @@
 #include "host/avc_sps.h"
 
+#include <vector>
+
 #include "host/bit_reader.h"
 
 namespace host {
@@ -94,8 +96,8 @@ void read_sample_aspect_ratio(BitReader& bits, PictureShape* shape) {
   shape->aspect_height = height;
 }
 
-}  // namespace
-
+// A NAL unit's payload without its emulation-prevention bytes (the 03 of
+// every 00 00 03).
 std::vector<uint8_t> RemoveEmulationPrevention(const uint8_t* payload, size_t size) {
   std::vector<uint8_t> rbsp;
   rbsp.reserve(size);
@@ -110,6 +112,8 @@ std::vector<uint8_t> RemoveEmulationPrevention(const uint8_t* payload, size_t si
   }
   return rbsp;
 }
+
+}  // namespace
 
 bool ParseAvcSps(const uint8_t* nal, size_t size, PictureShape* shape) {
   if (size < 2 || (nal[0] & 0x1F) != kSpsNalType) return false;

@@ -4,15 +4,10 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <vector>
 
 #include "host/picture_shape.h"
 
 namespace host {
-
-// A NAL unit's payload with the emulation-prevention bytes (the 03 of every
-// 00 00 03) removed.
-std::vector<uint8_t> RemoveEmulationPrevention(const uint8_t* payload, size_t size);
 
 // One SPS NAL unit, header byte included. Fills the cropped picture size and,
 // when the VUI gives one, the sample aspect ratio. False when the unit is not
