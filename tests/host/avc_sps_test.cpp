@@ -56,7 +56,7 @@ struct Sps {
 
 Bytes sps_nal(const Sps& s) {
   testing_support::BitWriter w;
-  w.Bits(8, 100).Bits(16, 40).Golomb(0).Golomb(s.chroma_format_idc);
+  w.Bits(8, 0x67).Bits(8, 100).Bits(16, 40).Golomb(0).Golomb(s.chroma_format_idc);
   if (s.chroma_format_idc == 3) w.Bits(1, 0);
   w.Golomb(s.bit_depth_minus8).Golomb(s.bit_depth_minus8).Bits(1, 0).Bits(1, s.scaling_lists);
   for (int i = 0; s.scaling_lists && i < (s.chroma_format_idc == 3 ? 12 : 8); ++i) {
@@ -76,10 +76,7 @@ Bytes sps_nal(const Sps& s) {
   if (s.aspect_idc >= 0) w.Bits(8, static_cast<uint64_t>(s.aspect_idc));
   if (s.aspect_idc == 255) w.Bits(16, s.sar_width).Bits(16, s.sar_height);
   w.Bits(9, 1);  // the rest of the VUI absent, stop bit
-  Bytes nal = {0x67};
-  Bytes payload = testing_support::EscapeRbsp(w.bytes());
-  nal.insert(nal.end(), payload.begin(), payload.end());
-  return nal;
+  return testing_support::EscapeRbsp(w.bytes());  // the header byte 0x67 needs no escape
 }
 
 TEST(AvcSpsTest, RareButValidFieldsAreStepped) {

@@ -48,7 +48,7 @@ struct Vol {
 
 Bytes vol_with_start_code(const Vol& v, uint8_t code = 0x20) {
   testing_support::BitWriter w;
-  w.Bits(1, 0).Bits(8, v.object_type).Bits(1, v.verid != 0);
+  w.Bits(24, 1).Bits(8, code).Bits(1, 0).Bits(8, v.object_type).Bits(1, v.verid != 0);
   if (v.verid) w.Bits(4, v.verid).Bits(3, 1);
   w.Bits(4, v.aspect);
   if (v.aspect == 15) w.Bits(16, v.par);
@@ -58,9 +58,7 @@ Bytes vol_with_start_code(const Vol& v, uint8_t code = 0x20) {
   if (v.shape == 3 && v.verid > 1) w.Bits(4, 0);
   w.Bits(1, 1).Bits(16, v.time_resolution).Bits(1, 1).Bits(1, v.increment_bits != 0).Bits(v.increment_bits, 1);
   if (v.shape == 0) w.Bits(1, 1).Bits(13, 352).Bits(1, 1).Bits(13, 288).Bits(1, 1);
-  Bytes bytes = {0x00, 0x00, 0x01, code};
-  bytes.insert(bytes.end(), w.bytes().begin(), w.bytes().end());
-  return bytes;
+  return w.bytes();
 }
 
 TEST(Mpeg4VolTest, OptionalFieldsAndAspectCodesAreRead) {
