@@ -3,11 +3,15 @@
 // calls the C++ that implements it.
 
 #include "filter/events.h"
+#include "filter/input_channel.h"
 #include "filter/instance.h"
 #include "filter/metadata_parser.h"
 #include "filter/mkv_context.h"
+#include "filter/output_channels.h"
 #include "filter/pending_operations.h"
+#include "filter/rating.h"
 #include "filter/resource_table.h"
+#include "filter/time_converter.h"
 #include "platform/interfaces.h"
 #include "platform/mmf_status.h"
 
@@ -20,58 +24,60 @@ MmfFilterHandle* OpCreate() { return AsFrameworkHandle(Create()); }
 int OpDestroy(MmfFilterHandle* handle) { return handle ? Destroy(AsMkvFilter(handle)) : kMmfInvalidArgument; }
 
 // MediaInput
-int OpRateInputFormat(MmfChannel*, MmfMediaFormat*, uint32_t, uint32_t*) { return PendingRating(); }
+int OpRateInputFormat(MmfChannel* channel, MmfMediaFormat* format, uint32_t request, uint32_t* claim) {
+  return RateInputFormat(AsMkvChannel(channel), format, request, claim);
+}
 int OpSetInputFormat(MmfChannel* channel, const MmfMediaFormat* format) {
-  return channel && format ? PendingNotAvailable() : kMmfInvalidArgument;
+  return SetInputFormat(AsMkvChannel(channel), format);
 }
 int OpSetMediaOutput(MmfChannel* channel, const MmfMediaOutputOps* upstream) {
-  return channel && upstream ? PendingNotAvailable() : kMmfInvalidArgument;
+  return SetMediaOutput(AsMkvChannel(channel), upstream);
 }
 int OpSetInputChannelMemoryPool(MmfChannel* channel, const MmfMemoryPoolOps* pool, MmfMemoryPool* param) {
-  return channel && pool && param && channel->Filter ? PendingNotAvailable() : kMmfInvalidArgument;
+  return SetInputChannelMemoryPool(AsMkvChannel(channel), pool, param);
 }
 
 // MediaOutput
-MmfChannel* OpIterateOutputChannels(MmfFilterHandle*, int32_t*) {
-  return AsFrameworkChannel(PendingIterateOutputChannels());
+MmfChannel* OpIterateOutputChannels(MmfFilterHandle* handle, int32_t* iterator) {
+  return AsFrameworkChannel(handle ? IterateOutputChannels(AsMkvFilter(handle), iterator) : nullptr);
 }
-int OpAcquireOutputChannel(MmfChannel* channel) { return channel ? PendingNotAvailable() : kMmfInvalidArgument; }
-int OpReleaseOutputChannel(MmfChannel* channel) { return channel ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpAcquireOutputChannel(MmfChannel* channel) { return AcquireOutputChannel(AsMkvChannel(channel)); }
+int OpReleaseOutputChannel(MmfChannel* channel) { return ReleaseOutputChannel(AsMkvChannel(channel)); }
 int OpIterateOutputFormats(MmfChannel* channel, MmfMediaFormat* format, int32_t* iterator) {
-  return channel && format && iterator ? PendingIterateOutputFormats() : kMmfInvalidArgument;
+  return IterateOutputFormats(AsMkvChannel(channel), format, iterator);
 }
-int OpVerifyOutputFormat(MmfChannel*, const MmfMediaFormat*, const MmfMediaFormat*) {
-  return PendingVerifyOutputFormat();
+int OpVerifyOutputFormat(MmfChannel* channel, const MmfMediaFormat* a, const MmfMediaFormat* b) {
+  return VerifyOutputFormat(AsMkvChannel(channel), a, b);
 }
 int OpSetOutputFormat(MmfChannel* channel, const MmfMediaFormat* format) {
-  return channel && format ? PendingNotAvailable() : kMmfInvalidArgument;
+  return SetOutputFormat(AsMkvChannel(channel), format);
 }
 int OpNextBuffer(MmfChannel* channel, MmfMra** buffer) {
   return channel && buffer ? PendingNextBuffer(buffer) : kMmfInvalidArgument;
 }
 int OpSetOutputChannelMemoryPool(MmfChannel* channel, const MmfMemoryPoolOps* pool, MmfMemoryPool* param) {
-  return channel && pool && param && channel->Filter ? PendingNotAvailable() : kMmfInvalidArgument;
+  return SetOutputChannelMemoryPool(AsMkvChannel(channel), pool, param);
 }
 
 // MediaFlush
 int OpFlush(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
 
 // MediaTimeConverter
-int OpConvertToPosition(MmfFilterHandle* handle, uint32_t, uint64_t, uint64_t* position) {
-  return handle && position ? PendingConversion() : kMmfInvalidArgument;
+int OpConvertToPosition(MmfFilterHandle* handle, uint32_t, uint64_t time, uint64_t* position) {
+  return handle && position ? ConvertToPosition(AsMkvFilter(handle), time, position) : kMmfInvalidArgument;
 }
-int OpConvertToTime(MmfFilterHandle* handle, uint32_t, uint64_t, uint64_t* time) {
-  return handle && time ? PendingConversion() : kMmfInvalidArgument;
+int OpConvertToTime(MmfFilterHandle* handle, uint32_t, uint64_t position, uint64_t* time) {
+  return handle && time ? ConvertToTime(AsMkvFilter(handle), position, time) : kMmfInvalidArgument;
 }
 
 // MediaSeeker
-int OpSeekQuery(MmfFilterHandle* handle) { return handle ? PendingSeekQuery() : kMmfInvalidArgument; }
-int OpSeek(MmfFilterHandle* handle, uint32_t, uint64_t, uint64_t) {
-  return handle ? PendingNotAvailable() : kMmfInvalidArgument;
+int OpSeekQuery(MmfFilterHandle* handle) { return handle ? SeekQuery(AsMkvFilter(handle)) : kMmfInvalidArgument; }
+int OpSeek(MmfFilterHandle* handle, uint32_t, uint64_t time, uint64_t position) {
+  return handle ? Seek(AsMkvFilter(handle), time, position) : kMmfInvalidArgument;
 }
 
 // AOStreamInspector
-int OpSniffStream(MmfInputStream*) { return PendingRating(); }
+int OpSniffStream(MmfInputStream* stream) { return stream ? SniffStream(stream) : kRatingRefused; }
 
 // AOResourceAccess
 AoResource* OpGetResources(MmfFilterHandle* handle) {

@@ -1,0 +1,149 @@
+// The order rules of the input and output channel operations, and their
+// error codes, on a rated two-channel stream.
+
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "host/memory_pools.h"
+#include "tests/plugin/graph_harness.h"
+
+namespace {
+
+using plugin_test::Connected;
+using plugin_test::ConnectFile;
+using plugin_test::HostPlugin;
+
+enum class Op { kAcquire, kRelease, kSetFormat, kSetPool };
+
+struct Step {
+  Op op;
+  int result;
+};
+
+struct Sequence {
+  const char* name;
+  std::vector<Step> steps;
+};
+
+// avc_aac offers two channels; nothing is acquired by the set-up.
+Connected Unconfigured() {
+  host::SetupOptions options;
+  options.configure_outputs = false;
+  return ConnectFile("avc_aac", true, options);
+}
+
+TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {
+  const std::vector<Sequence> sequences = {
+      {"nothing before acquisition", {{Op::kSetFormat, 4014}, {Op::kSetPool, 4014}, {Op::kRelease, 4015}}},
+      {"acquire twice", {{Op::kAcquire, 0}, {Op::kAcquire, 4013}, {Op::kRelease, 0}, {Op::kRelease, 4015}}},
+      {"pool needs a format", {{Op::kAcquire, 0}, {Op::kSetPool, 4017}, {Op::kRelease, 0}}},
+      {"format once per lifetime",
+       {{Op::kAcquire, 0}, {Op::kSetFormat, 0}, {Op::kSetFormat, 4016}, {Op::kRelease, 0}, {Op::kAcquire, 0},
+        {Op::kSetFormat, 4016}, {Op::kSetPool, 0}, {Op::kRelease, 0}}},
+  };
+  const MmfMediaOutputOps& ops = *HostPlugin().output();
+  host::MemoryPool pool(4096, 4);
+  for (const Sequence& sequence : sequences) {
+    SCOPED_TRACE(sequence.name);
+    Connected c = Unconfigured();
+    ASSERT_EQ(c.channel_count(), 2);
+    MmfChannel* channel = AsFrameworkChannel(&c.channel(0));
+    MmfMediaFormat format = c.channel(0).Format;
+    for (size_t i = 0; i < sequence.steps.size(); ++i) {
+      const Step& step = sequence.steps[i];
+      int32_t acquired_before = c.context()->AcquiredChannelCount;
+      int result = -1;
+      switch (step.op) {
+        case Op::kAcquire: result = ops.AcquireOutputChannel(channel); break;
+        case Op::kRelease: result = ops.ReleaseOutputChannel(channel); break;
+        case Op::kSetFormat: result = ops.SetOutputFormat(channel, &format); break;
+        case Op::kSetPool: result = ops.SetOutputChannelMemoryPool(channel, host::MemoryPool::Ops(), pool.handle()); break;
+      }
+      EXPECT_EQ(result, step.result) << "step " << i;
+      const MkvChannelState& state = *c.channel(0).State;
+      EXPECT_EQ(state.Acquired, (c.channel(0).Flags & 1) ? 1u : 0u) << "step " << i;
+      EXPECT_EQ(c.context()->ReadList != nullptr, state.Acquired == 1) << "step " << i;
+      if (step.op == Op::kSetPool) {
+        EXPECT_EQ(state.MraPool != nullptr, result == 0) << "step " << i;
+      }
+      if (step.result != 0) {
+        EXPECT_EQ(c.context()->AcquiredChannelCount, acquired_before) << "step " << i;
+      }
+    }
+    EXPECT_EQ(c.context()->AcquiredChannelCount, 0);
+  }
+}
+
+TEST(OutputChannelOrderTest, NullArgumentsAnswer22) {
+  const MmfMediaOutputOps& ops = *HostPlugin().output();
+  Connected c = Unconfigured();
+  MmfChannel* channel = AsFrameworkChannel(&c.channel(0));
+  MmfMediaFormat format{};
+  int32_t iterator = 0;
+  host::MemoryPool pool(4096, 1);
+  EXPECT_EQ(ops.AcquireOutputChannel(nullptr), 22);
+  EXPECT_EQ(ops.ReleaseOutputChannel(nullptr), 22);
+  EXPECT_EQ(ops.SetOutputFormat(channel, nullptr), 22);
+  EXPECT_EQ(ops.IterateOutputFormats(channel, &format, nullptr), 22);
+  EXPECT_EQ(ops.IterateOutputFormats(nullptr, &format, &iterator), 22);
+  EXPECT_EQ(ops.SetOutputChannelMemoryPool(channel, nullptr, pool.handle()), 22);
+  EXPECT_EQ(ops.SetOutputChannelMemoryPool(channel, host::MemoryPool::Ops(), nullptr), 22);
+  EXPECT_EQ(ops.IterateOutputChannels(c.graph->handle(), nullptr), nullptr);
+  EXPECT_EQ(ops.IterateOutputChannels(nullptr, &iterator), nullptr);
+}
+
+TEST(OutputChannelListTest, ChannelsAndFormatsAreListedOncePerChannelIndex) {
+  const MmfMediaOutputOps& ops = *HostPlugin().output();
+  Connected c = Unconfigured();
+  int32_t iterator = 0;
+  EXPECT_EQ(ops.IterateOutputChannels(c.graph->handle(), &iterator), AsFrameworkChannel(&c.channel(0)));
+  EXPECT_EQ(ops.IterateOutputChannels(c.graph->handle(), &iterator), AsFrameworkChannel(&c.channel(1)));
+  EXPECT_EQ(ops.IterateOutputChannels(c.graph->handle(), &iterator), nullptr);
+  EXPECT_EQ(iterator, 2);
+
+  MmfChannel* second = AsFrameworkChannel(&c.channel(1));
+  MmfMediaFormat offered{};
+  iterator = 0;
+  for (int i = 0; i < 2; ++i) {
+    ASSERT_EQ(ops.IterateOutputFormats(second, &offered, &iterator), 100);
+    EXPECT_EQ(offered.fourcc, c.channel(1).Format.fourcc);
+    EXPECT_EQ(offered.buffer_count, 42u + uint32_t(c.context()->ExtraBufferCount));
+  }
+  EXPECT_EQ(ops.IterateOutputFormats(second, &offered, &iterator), 0);
+  EXPECT_EQ(c.channel(1).Format.buffer_count, 0u);
+
+  MmfMediaFormat other = offered;
+  EXPECT_EQ(ops.VerifyOutputFormat(second, &offered, &other), 100);
+  other.buffer_size += 1;
+  other.fourcc = offered.fourcc;
+  EXPECT_EQ(ops.VerifyOutputFormat(second, &offered, &other), 0);
+  EXPECT_EQ(ops.VerifyOutputFormat(second, &offered, nullptr), 0);
+}
+
+TEST(InputChannelOrderTest, FormatThenMediaOutputThenPool) {
+  const MmfMediaInputOps& ops = *HostPlugin().input();
+  static const MmfMediaOutputOps upstream{};
+  host::MemoryPool pool(4096, 1);
+  Connected c = Unconfigured();
+  MmfChannel* input = c.graph->handle()->InputChannel;
+  MmfMediaFormat format = c.graph->input_format();
+
+  input->Flags &= ~1u;  // as if the framework had not acquired it
+  EXPECT_EQ(ops.SetInputFormat(input, &format), 4009);
+  EXPECT_EQ(ops.SetInputChannelMemoryPool(input, host::MemoryPool::Ops(), pool.handle()), 4009);
+  input->Flags |= 1u;
+  EXPECT_EQ(ops.SetInputChannelMemoryPool(input, host::MemoryPool::Ops(), pool.handle()), 4012);
+  EXPECT_EQ(ops.SetInputFormat(input, nullptr), 22);
+  EXPECT_EQ(ops.SetInputFormat(input, &format), 0);
+  EXPECT_EQ(ops.SetMediaOutput(input, nullptr), 22);
+  EXPECT_EQ(ops.SetMediaOutput(input, &upstream), 0);
+  EXPECT_EQ(ops.SetInputFormat(input, &format), 4011);
+  EXPECT_EQ(ops.SetInputChannelMemoryPool(input, nullptr, pool.handle()), 22);
+  EXPECT_EQ(ops.SetInputChannelMemoryPool(input, host::MemoryPool::Ops(), pool.handle()), 0);
+  EXPECT_EQ(c.context()->MediaOutput, &upstream);
+  EXPECT_EQ(c.context()->InputPoolParam, pool.handle());
+}
+
+}  // namespace
