@@ -131,6 +131,15 @@ TEST(ParseMkvfileFixtureTest, CuesTagsAndMetadataAgreeWithTheTools) {
       EXPECT_EQ(listed_widths[i], pixel_widths[i]) << "track " << i;
       EXPECT_EQ(listed_heights[i], pixel_heights[i]) << "track " << i;
     }
+    // A track is offered only with a codec the player supports: Opus parses
+    // like any other track but gets no four-character code.
+    std::vector<int64_t> fourccs = numbers(*list, "Fourcc");
+    ASSERT_EQ(fourccs.size(), widths.size());
+    size_t av_index = 0;
+    for (const auto& track : expected.tracks) {
+      if (track.type != "video" && track.type != "audio") continue;
+      EXPECT_EQ(fourccs[av_index++] == 0, track.codec == "A_OPUS" || track.codec.rfind("V_VP", 0) == 0) << track.codec;
+    }
     std::vector<int64_t> listed_durations = numbers(*list, "Duration");
     ASSERT_EQ(listed_durations.size(), durations.size());
     for (size_t i = 0; i < durations.size(); ++i) {
