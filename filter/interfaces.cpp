@@ -5,12 +5,16 @@
 #include "filter/events.h"
 #include "filter/input_channel.h"
 #include "filter/instance.h"
+#include "filter/media_control.h"
 #include "filter/metadata_parser.h"
 #include "filter/mkv_context.h"
+#include "filter/output_assembly.h"
 #include "filter/output_channels.h"
 #include "filter/pending_operations.h"
 #include "filter/rating.h"
+#include "filter/read_list.h"
 #include "filter/resource_table.h"
+#include "filter/ring_buffer.h"
 #include "filter/time_converter.h"
 #include "platform/interfaces.h"
 #include "platform/mmf_status.h"
@@ -53,14 +57,15 @@ int OpSetOutputFormat(MmfChannel* channel, const MmfMediaFormat* format) {
   return SetOutputFormat(AsMkvChannel(channel), format);
 }
 int OpNextBuffer(MmfChannel* channel, MmfMra** buffer) {
-  return channel && buffer ? PendingNextBuffer(buffer) : kMmfInvalidArgument;
+  if (!channel || !buffer || !channel->Filter || !channel->State) return kMmfInvalidArgument;
+  return NextBuffer(AsMkvChannel(channel), buffer);
 }
 int OpSetOutputChannelMemoryPool(MmfChannel* channel, const MmfMemoryPoolOps* pool, MmfMemoryPool* param) {
   return SetOutputChannelMemoryPool(AsMkvChannel(channel), pool, param);
 }
 
 // MediaFlush
-int OpFlush(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpFlush(MmfFilterHandle* handle) { return IsFilter(handle) ? Flush(AsMkvFilter(handle)) : kMmfInvalidArgument; }
 
 // MediaTimeConverter
 int OpConvertToPosition(MmfFilterHandle* handle, uint32_t, uint64_t time, uint64_t* position) {
@@ -89,11 +94,11 @@ int OpSetResource(MmfFilterHandle* handle, const char* name, const void* value) 
 }
 
 // MediaControl
-int OpStart(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
-int OpStop(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
-int OpPause(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
-int OpResume(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
-int OpStatus(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpStart(MmfFilterHandle* handle) { return IsFilter(handle) ? Start(AsMkvFilter(handle)) : kMmfInvalidArgument; }
+int OpStop(MmfFilterHandle* handle) { return IsFilter(handle) ? Stop(AsMkvFilter(handle)) : kMmfInvalidArgument; }
+int OpPause(MmfFilterHandle* handle) { return IsFilter(handle) ? Pause(AsMkvFilter(handle)) : kMmfInvalidArgument; }
+int OpResume(MmfFilterHandle* handle) { return IsFilter(handle) ? Resume(AsMkvFilter(handle)) : kMmfInvalidArgument; }
+int OpStatus(MmfFilterHandle* handle) { return IsFilter(handle) ? Status(AsMkvFilter(handle)) : kMmfInvalidArgument; }
 
 // MediaEventProducer
 int OpEventList(MmfFilterHandle* handle, uint32_t* event, uint32_t* iterator) {
@@ -115,8 +120,9 @@ int OpScanBackward(MmfFilterHandle* handle, uint32_t) { return handle ? PendingN
 int OpScanEnd(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
 
 // MediaListMaker
-int OpGetNextReadList(MmfChannel* channel, MmfReadListEntry** entry, MmfReadListEntry*) {
-  return channel && entry ? PendingNotAvailable() : kMmfInvalidArgument;
+int OpGetNextReadList(MmfChannel* channel, MmfReadListEntry** entry, MmfReadListEntry* previous) {
+  if (!channel || !entry || !channel->Filter) return kMmfInvalidArgument;
+  return GetNextReadList(AsMkvChannel(channel), entry, previous);
 }
 
 // MediaMetadataParser: the framework's opaque block is the core's metadata list.

@@ -50,4 +50,10 @@ struct MkvChannelState {
   MmfPoolBuffer* ConfigBuffer;       // the frame prefix; null when none is held
   uint32_t ConfigBufferSize;
   uint32_t SendSkipMark;             // 1: the next block gets a skip mark first
+  // 1 from the parser's block result until the block's last frame went out or
+  // the block was skipped; bytes of the block after its last frame are skipped.
+  uint8_t BlockActive;
+  // 1 when the output filled up in the middle of inbuff1: the next call goes on
+  // parsing inbuff1 before it walks on to the element after ReadElement.
+  uint8_t ParsePending;
 };

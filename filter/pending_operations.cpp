@@ -4,9 +4,4 @@
 
 int PendingNotAvailable() { return kPendingNotAvailable; }
 
-int PendingNextBuffer(MmfMra** buffer) {
-  *buffer = nullptr;
-  return 1;
-}
-
 int PendingTrickQuery() { return 0; }

@@ -2,7 +2,6 @@
 // Stand-ins for the operations whose behaviour is not built yet. Each answers
 // the refusal its operation already knows, so a framework that calls them sees
 // a filter that cannot do the thing rather than a crash:
-//  - NextBuffer: 1, the error result, with no media buffer;
 //  - TrickQuery: 0, no trick-play capability;
 //  - every other operation: 4044, not available.
 // The thin interface file has already answered 22 for null arguments.
@@ -15,5 +14,4 @@
 constexpr int kPendingNotAvailable = 4044;
 
 int PendingNotAvailable();
-int PendingNextBuffer(MmfMra** buffer);
 int PendingTrickQuery();

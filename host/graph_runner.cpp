@@ -1,0 +1,303 @@
+#include "host/graph_runner.h"
+
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <memory>
+#include <thread>
+
+#include "host/file_streamer.h"
+#include "host/graph_setup.h"
+#include "host/input_streams.h"
+#include "host/memory_pools.h"
+#include "platform/media_buffer.h"
+#include "platform/mmf_status.h"
+
+namespace host {
+namespace {
+
+constexpr uint32_t kPrefixBufferSize = 4096;
+constexpr uint32_t kPrefixBuffers = 16;
+constexpr uint32_t kConfigBufferSize = 65536;
+constexpr uint32_t kConfigBuffers = 8;
+// Input buffers referenced at once: the ring's 39 plus what output media
+// buffers still point into; small buffers need many.
+constexpr uint32_t kInputPoolBytes = 16u << 20;
+constexpr uint32_t kMinInputBuffers = 48;
+constexpr uint32_t kMaxInputBuffers = 2048;
+constexpr int kMaxShortInputRetries = 1000;
+
+class Adler32 {
+ public:
+  void Update(const uint8_t* data, size_t n) {
+    constexpr uint32_t kBase = 65521;
+    constexpr size_t kBlock = 5552;  // the longest run without overflow of b
+    while (n > 0) {
+      size_t run = n < kBlock ? n : kBlock;
+      n -= run;
+      for (size_t i = 0; i < run; ++i) {
+        a_ += data[i];
+        b_ += a_;
+      }
+      data += run;
+      a_ %= kBase;
+      b_ %= kBase;
+    }
+  }
+  uint32_t Value() const { return b_ << 16 | a_; }
+
+ private:
+  uint32_t a_ = 1, b_ = 0;
+};
+
+// One output channel's consumer: whole frames out of output media buffers.
+class Sink {
+ public:
+  Sink(ChannelRun* run, const RunnerOptions& options, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool)
+      : run_(run), options_(options), config_pool_(config_pool), prefix_pool_(prefix_pool) {}
+
+  void Consume(MmfMra* mra) {
+    uint32_t kind = 0;
+    for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
+      if (kind == kMmfElementProperty) {
+        uint32_t type = 0, low = 0;
+        uint16_t high = 0;
+        if (MmfGetMraPropertyElement(mra, i, &type, &low, &high) == 0) Property(type, MmfPropertyValue(low, high));
+      } else if (kind == kMmfElementBuffer) {
+        MmfPoolBuffer* handle = nullptr;
+        uint8_t* address = nullptr;
+        uint32_t size = 0;
+        if (MmfGetMraBufferElement(mra, i, &handle, &address, &size) == 0) Buffer(handle, address, size);
+      }
+    }
+  }
+
+  void Finish() { run_->incomplete_frame = in_parts_; }
+
+ private:
+  void Property(uint32_t type, uint64_t value) {
+    switch (type) {
+      case kMmfPropVideoTime:
+      case kMmfPropAudioTime:
+      case kMmfPropSubtitleTime:
+        time_ = value;
+        break;
+      case kMmfPropTimeMarker:
+        ++run_->time_markers;
+        break;
+      case kMmfPropSkipMark:
+        ++run_->skip_marks;
+        break;
+      case kMmfPropConfigCount:
+        config_left_ = static_cast<uint32_t>(value);
+        break;
+      case kMmfPropFramePart:
+        if (!in_parts_) StartFrame();
+        in_parts_ = true;
+        break;
+      case kMmfPropFrameEnd:
+        if (!in_parts_) StartFrame();
+        in_parts_ = true;
+        last_part_ = true;
+        break;
+      default:
+        break;
+    }
+  }
+
+  void StartFrame() {
+    frame_ = RunFrame{time_, 0, 0};
+    adler_ = Adler32{};
+  }
+
+  bool PointsIntoInput(const MmfPoolBuffer* handle, const uint8_t* address, uint32_t size) const {
+    if (!handle || address < handle->Data || address + size > handle->Data + handle->Size) return false;
+    if (handle->Pool == config_pool_) return false;
+    // The frame prefix is the one piece held by the input pool of the filter.
+    return handle->Pool != prefix_pool_ || (in_parts_ && !last_part_);
+  }
+
+  void Buffer(MmfPoolBuffer* handle, const uint8_t* address, uint32_t size) {
+    if (config_left_ > 0) {
+      --config_left_;
+      Adler32 adler;
+      if (options_.checksum) adler.Update(address, size);
+      run_->config.push_back(RunFrame{0, size, options_.checksum ? adler.Value() : 0});
+      return;
+    }
+    if (!PointsIntoInput(handle, address, size)) ++run_->foreign_elements;
+    if (!in_parts_) StartFrame();
+    frame_.size += size;
+    if (options_.checksum) adler_.Update(address, size);
+    if (in_parts_ && !last_part_) return;
+    frame_.adler32 = options_.checksum ? adler_.Value() : 0;
+    run_->frames.push_back(frame_);
+    in_parts_ = false;
+    last_part_ = false;
+  }
+
+  ChannelRun* run_;
+  const RunnerOptions& options_;
+  MmfMemoryPool* config_pool_;
+  MmfMemoryPool* prefix_pool_;
+  uint64_t time_ = 0;
+  uint32_t config_left_ = 0;
+  bool in_parts_ = false;   // a frame announced by property 7 is being put together
+  bool last_part_ = false;  // property 8 came: the next buffer element ends the frame
+  RunFrame frame_;
+  Adler32 adler_;
+};
+
+void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun* run, const RunnerOptions& options,
+                uint32_t delay_us, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool) {
+  Sink sink(run, options, config_pool, prefix_pool);
+  int short_inputs = 0;
+  for (;;) {
+    MmfMra* mra = nullptr;
+    int result = output->NextBuffer(channel, &mra);
+    run->end_result = result;
+    if (result == 4 && ++short_inputs < kMaxShortInputRetries) continue;  // delivery goes on
+    if (result != kMmfBufferDelivered || !mra) break;
+    short_inputs = 0;
+    ++run->buffers;
+    sink.Consume(mra);
+    if (options.on_buffer) options.on_buffer(options.user, run->index, mra);
+    (void)MmfReleaseMra(mra);
+    if (delay_us) std::this_thread::sleep_for(std::chrono::microseconds(delay_us));
+  }
+  sink.Finish();
+}
+
+// The streamer's upstream as the plug-in sees it. Playback from the first
+// Cluster is not a seek, yet the streamer heads the first buffer after its
+// Seek with a time marker; that marker becomes a copy of the file-offset
+// property that follows it. The streamer's output record's framework word
+// holds the flag.
+struct StartOfPlay {
+  std::atomic<bool> marker_pending{true};
+};
+
+int StreamFromStart(MmfChannel* output, MmfMra** buffer) {
+  int result = FileStreamer::Ops()->NextBuffer(output, buffer);
+  auto* start = static_cast<StartOfPlay*>(output->Reserved);
+  if (result != kMmfBufferDelivered || !start || !start->marker_pending.exchange(false)) return result;
+  uint32_t type = 0, low = 0, next_type = 0, next_low = 0;
+  uint16_t high = 0, next_high = 0;
+  if (MmfGetMraPropertyElement(*buffer, 0, &type, &low, &high) == 0 && type == kMmfPropTimeMarker &&
+      MmfGetMraPropertyElement(*buffer, 1, &next_type, &next_low, &next_high) == 0 &&
+      next_type == kMmfPropFileOffset) {
+    (void)MmfSetMraPropertyElement(*buffer, 0, next_type, next_low, next_high);
+  }
+  return result;
+}
+
+const MmfMediaOutputOps* StreamerFromStartOps() {
+  static const MmfMediaOutputOps ops = [] {
+    MmfMediaOutputOps copy = *FileStreamer::Ops();
+    copy.NextBuffer = StreamFromStart;
+    return copy;
+  }();
+  return &ops;
+}
+
+uint32_t InputBufferCount(uint32_t size) {
+  uint32_t count = size ? kInputPoolBytes / size : kMaxInputBuffers;
+  return std::clamp(count, kMinInputBuffers, kMaxInputBuffers);
+}
+
+}  // namespace
+
+RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOptions& options) {
+  RunResult out;
+  auto rating_stream = OpenFileStream(path, true);
+  auto source = OpenFileStream(path, true);
+  if (!rating_stream || !source) {
+    out.error = "cannot open " + path;
+    return out;
+  }
+  const MmfMediaOutputOps* output = plugin.output();
+  const auto* control = plugin.Get<MmfMediaControlOps>("MediaControl");
+  const auto* flush = plugin.Get<MmfMediaFlushOps>("MediaFlush");
+  if (!output || !control || !flush) {
+    out.error = "the plug-in lacks an interface the runner needs";
+    return out;
+  }
+
+  MemoryPool prefix_pool(kPrefixBufferSize, kPrefixBuffers);
+  MemoryPool config_pool(kConfigBufferSize, kConfigBuffers);
+  FileStreamer streamer(source.get(), StreamerConfig{options.input_buffer_size,
+                                                     InputBufferCount(options.input_buffer_size)});
+  SetupOptions setup;
+  setup.buffer_size = options.input_buffer_size;
+  setup.configure_outputs = false;
+  const bool own_upstream = options.upstream && options.upstream_output;
+  setup.upstream = own_upstream ? options.upstream : StreamerFromStartOps();
+  setup.input_pool = MemoryPool::Ops();
+  setup.input_pool_param = prefix_pool.handle();
+  FilterGraph graph(plugin, *rating_stream, setup);
+  out.rating = graph.rating();
+  if (!graph.rated()) {
+    out.error = "the plug-in refused the file";
+    return out;
+  }
+  MmfFilterHandle* handle = graph.handle();
+  StartOfPlay start_of_play;
+  streamer.output()->Reserved = &start_of_play;
+  handle->InputChannel->Peer = own_upstream ? options.upstream_output : streamer.output();
+  if (const auto* list_maker = plugin.Get<MmfListMakerOps>("MediaListMaker")) {
+    streamer.ConnectListMaker(list_maker, handle->InputChannel);
+  }
+  const int64_t first_cluster = rating_stream->Tell();
+
+  std::vector<int32_t> wanted = options.channels;
+  if (wanted.empty()) {
+    for (size_t k = 0; k < graph.outputs().size(); ++k) wanted.push_back(static_cast<int32_t>(k));
+  }
+  std::vector<MmfChannel*> acquired;
+  for (int32_t k : wanted) {
+    if (k < 0 || static_cast<size_t>(k) >= graph.outputs().size()) {
+      out.error = "no output channel " + std::to_string(k);
+      break;
+    }
+    const OutputChannelSetup& channel = graph.outputs()[static_cast<size_t>(k)];
+    if (output->AcquireOutputChannel(channel.channel) != kMmfOk) {
+      out.error = "cannot acquire output channel " + std::to_string(k);
+      break;
+    }
+    acquired.push_back(channel.channel);
+    if (output->SetOutputFormat(channel.channel, &channel.offered) != kMmfOk ||
+        output->SetOutputChannelMemoryPool(channel.channel, MemoryPool::Ops(), config_pool.handle()) != kMmfOk) {
+      out.error = "cannot configure output channel " + std::to_string(k);
+      break;
+    }
+    ChannelRun run;
+    run.index = k;
+    run.name = channel.channel->Name ? channel.channel->Name : "";
+    run.fourcc = channel.offered.fourcc;
+    out.channels.push_back(std::move(run));
+  }
+
+  if (out.error.empty() && first_cluster >= 0) {
+    (void)control->Start(handle);
+    if (!own_upstream) (void)streamer.Seek(static_cast<uint64_t>(first_cluster), 0);
+    std::vector<std::thread> sinks;
+    for (size_t i = 0; i < acquired.size(); ++i) {
+      uint32_t delay = i < options.sink_delay_us.size() ? options.sink_delay_us[i] : 0;
+      sinks.emplace_back(SinkThread, output, acquired[i], &out.channels[i], std::cref(options), delay,
+                         config_pool.handle(), prefix_pool.handle());
+    }
+    for (std::thread& sink : sinks) sink.join();
+    (void)control->Stop(handle);
+    out.ok = std::all_of(out.channels.begin(), out.channels.end(),
+                         [](const ChannelRun& run) { return run.end_result == kMmfEndOfStream; });
+    if (!out.ok) out.error = "a channel ended with an error";
+  } else if (out.error.empty()) {
+    out.error = "the input has no position after rating";
+  }
+  (void)flush->Flush(handle);
+  for (MmfChannel* channel : acquired) (void)output->ReleaseOutputChannel(channel);
+  out.bytes_read = streamer.bytes_read();
+  return out;
+}
+
+}  // namespace host

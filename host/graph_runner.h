@@ -1,0 +1,67 @@
+#pragma once
+// Runs a parser graph as the framework does: the file streamer feeds the
+// plug-in's input channel, and each acquired output channel has a sink on its
+// own thread that calls the plug-in's NextBuffer until the end of the stream
+// and gives every output media buffer back once it has consumed it. Sinks
+// put split frames back together and prepend frame prefixes, so what they
+// record are whole frames (checksummed piece by piece, never copied). They
+// also check that each frame element points into an input buffer.
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "host/plugin_loader.h"
+
+namespace host {
+
+struct RunnerOptions {
+  uint32_t input_buffer_size = 32768;
+  // Indexes of the output channels to acquire; empty: all of them.
+  std::vector<int32_t> channels;
+  // Per acquired channel (in the order of `channels`), microseconds a sink
+  // sleeps after each output buffer; missing entries are 0.
+  std::vector<uint32_t> sink_delay_us;
+  bool checksum = true;  // Adler-32 of every frame
+  // Called on a sink's thread once per output buffer it consumed, before the
+  // buffer goes back; the buffer's elements are readable.
+  void (*on_buffer)(void* user, int32_t channel, MmfMra* buffer) = nullptr;
+  void* user = nullptr;
+  // Another upstream filter in place of the file streamer: its output channel
+  // and operations. It delivers from the first Cluster on.
+  const MmfMediaOutputOps* upstream = nullptr;
+  MmfChannel* upstream_output = nullptr;
+};
+
+struct RunFrame {
+  uint64_t time_us = 0;  // the last timestamp property before the frame
+  uint32_t size = 0;
+  uint32_t adler32 = 0;  // 0 when checksums are off
+};
+
+struct ChannelRun {
+  int32_t index = -1;  // output channel index
+  std::string name;
+  uint32_t fourcc = 0;
+  std::vector<RunFrame> config;  // decoder-configuration packets (property 30)
+  std::vector<RunFrame> frames;
+  int end_result = 0;             // NextBuffer's last answer
+  uint64_t buffers = 0;           // output media buffers consumed
+  uint64_t skip_marks = 0;        // properties 37
+  uint64_t time_markers = 0;      // properties 3
+  uint64_t foreign_elements = 0;  // frame elements that point outside every input buffer
+  bool incomplete_frame = false;  // the stream ended inside a split frame
+};
+
+struct RunResult {
+  bool ok = false;  // rated, set up, and every sink ended with end of stream
+  std::string error;
+  int rating = 0;
+  std::vector<ChannelRun> channels;
+  uint64_t bytes_read = 0;  // by the streamer
+};
+
+// Loads nothing: `plugin` is the loaded kelvane.so.
+RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOptions& options);
+
+}  // namespace host
