@@ -2,6 +2,7 @@
 
 #include <chrono>
 
+#include "host/read_lists.h"
 #include "platform/mmf_status.h"
 #include "platform/mra_pool.h"
 
@@ -190,3 +191,12 @@ int FileStreamer::Deliver(uint64_t offset, uint32_t wanted, MmfMra** buffer) {
 }
 
 }  // namespace host
+
+// The streamer that a read list steers is the one its list maker's input
+// channel is connected to.
+extern "C" int MmfStreamerSetListMode(MmfReadList* list, uint32_t mode) {
+  if (!list) return kMmfInvalidArgument;
+  host::FileStreamer* streamer = host::FileStreamer::OfOutput(list->Channel ? list->Channel->Peer : nullptr);
+  if (!streamer) return kMmfNotAvailable;
+  return streamer->SetListMode(mode);
+}

@@ -8,6 +8,7 @@
 #include "host/graph_clock.h"
 #include "host/input_streams.h"
 #include "platform/mmf_status.h"
+#include "platform/read_list.h"
 
 namespace {
 
@@ -292,6 +293,26 @@ TEST_F(FileStreamerListModeTest, ModeZeroStreamsOnFromTheCurrentRequest) {
 TEST_F(FileStreamerListModeTest, ListModeWithoutAListMakerAnswers4044) {
   Make(100, 10);
   EXPECT_EQ(streamer_->SetListMode(1), 4044);
+}
+
+TEST_F(FileStreamerListModeTest, ReadListSwitchesTheStreamerItsChannelIsConnectedTo) {
+  Make(20000, 1000);
+  Start({{6000, 3000000, 1000}});
+  MmfChannel input{};
+  input.Kind = kMmfChannelKind;
+  input.Direction = kMmfDirectionInput;
+  MmfReadList* list = nullptr;
+  ASSERT_EQ(MmfAllocateReadlist(&list, &input, 2, 2), 0);
+  EXPECT_EQ(MmfStreamerSetListMode(list, 1), 4044);  // not connected to any streamer yet
+  input.Peer = streamer_->output();
+  ASSERT_EQ(MmfStreamerSetListMode(list, 1), 0);
+  Delivered delivered;
+  ASSERT_EQ(Next(&delivered), kMmfBufferDelivered);
+  EXPECT_EQ(delivered.offset, 6000u);
+  EXPECT_EQ(delivered.marker, 3000000u);
+  EXPECT_EQ(Next(&delivered), kMmfEndOfStream);
+  EXPECT_EQ(MmfStreamerSetListMode(nullptr, 1), 22);
+  MmfFreeReadlist(list);
 }
 
 TEST(GraphClockTest, ReportsTheMediaTimeConsumedOnTheAttachedGraph) {
