@@ -1,0 +1,67 @@
+#!/usr/bin/env bash
+# Runs `kelvane probe` (the plug-in connected through the host's set-up) on
+# every fixture and compares the channels it offers with the tracks mkvinfo
+# recorded in NAME.expected; then probes a fixture through a pipe, which must
+# rate the same through an input that cannot seek.
+#   check_probe.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
+set -uo pipefail
+source_dir=$1
+shift
+kelvane=("$@")
+fixtures=$source_dir/tests/fixtures
+
+failures=0
+expect() {  # what, expected, actual
+  if [[ "$2" != "$3" ]]; then
+    echo "FAIL $1: expected '$2', kelvane probe printed '$3'"
+    failures=$((failures + 1))
+  fi
+}
+
+# The codecs the plug-in offers, as four-character codes; others are left out.
+fourcc_of() {
+  case $1 in
+    V_MPEG4/ISO/AVC) echo AVC1 ;; V_MPEG4/ISO/ASP) echo MP4V ;; V_MPEG4/MS/V3) echo MP43 ;;
+    V_MPEG1) echo MP1V ;; V_MPEG2) echo MP2V ;; V_THEORA) echo THEO ;;
+    A_MPEG/L3) echo M2A3 ;; A_MPEG/L2) echo M2A2 ;; A_PCM/INT/LIT|A_PCM/INT/BIG) echo RAWA ;;
+    A_DTS) echo DTSA ;; A_VORBIS) echo VRBS ;; A_FLAC) echo FLAC ;; A_AAC) echo M4AC ;; A_AC3) echo AC3A ;;
+  esac
+}
+key() { sed -n "s/.* $1=\([^ ]*\).*/\1/p" <<<"$2"; }
+
+for expected in "$fixtures"/*.expected; do
+  name=$(basename "$expected" .expected)
+  out=$("${kelvane[@]}" probe "$fixtures/$name.mkv" 2>/dev/null)
+  status=$?
+  if ! grep -q '^doc_type matroska$' "$expected"; then
+    expect "$name exit code (not matroska)" 1 "$status"
+    expect "$name rating" 0 "$(sed -n 's/^rating: //p' <<<"$out")"
+    continue
+  fi
+  expect "$name exit code" 0 "$status"
+  want=""
+  while read -r track; do
+    code=$(fourcc_of "$(key codec "$track")")
+    [[ -z $code ]] && continue
+    if [[ $(key type "$track") == video ]]; then
+      want+="$code $(key width "$track")x$(key height "$track");"
+    else
+      rate=$(key sampling_frequency "$track"); want+="$code ${rate%%.*};"
+    fi
+  done < <(grep '^track ' "$expected")
+  got=$(awk '/^    fourcc: /{c=$2} /^    width: /{w=$2} /^    height: /{printf "%s %sx%s;", c, w, $2}
+             /^    sample_rate: /{printf "%s %s;", c, $2}' <<<"$out")
+  expect "$name channels" "$want" "$got"
+done
+
+# Through a pipe: unbuffered, not seekable, the same channels.
+file=$("${kelvane[@]}" probe "$fixtures/long_cues.mkv" 2>/dev/null)
+piped=$(cat "$fixtures/long_cues.mkv" | "${kelvane[@]}" probe - 2>/dev/null)
+expect "pipe exit code" 0 $?
+expect "pipe rating" 80 "$(sed -n 's/^rating: //p' <<<"$piped")"
+expect "pipe seekable" no "$(sed -n 's/^seekable: //p' <<<"$piped")"
+expect "file seekable" yes "$(sed -n 's/^seekable: //p' <<<"$file")"
+expect "pipe channels" "$(sed -n '/^channels:/,$p' <<<"$file")" "$(sed -n '/^channels:/,$p' <<<"$piped")"
+
+echo "$failures mismatches"
+((failures == 0))
