@@ -4,4 +4,5 @@
 
 int RunInfo(int argc, char** argv);
 int RunMetadata(int argc, char** argv);
+int RunPackets(int argc, char** argv);
 int RunProbe(int argc, char** argv);

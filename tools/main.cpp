@@ -14,6 +14,7 @@ struct Command {
 const Command kCommands[] = {
     {"info", RunInfo, "parse the headers of a Matroska file and print what they say"},
     {"metadata", RunMetadata, "print the metadata entries the plug-in offers for a file"},
+    {"packets", RunPackets, "play a file through the plug-in and print every channel's frames"},
     {"probe", RunProbe, "connect the plug-in to a file (or - for standard input) and print its channels"},
 };
 

@@ -1,0 +1,56 @@
+#!/usr/bin/env bash
+# Runs `kelvane packets` (streamer → kelvane.so → sinks) on fixtures and
+# compares the frames it prints with NAME.blocks: per track, in file order,
+# time = ticks × (timecode_scale / 1000) microseconds, size and Adler-32.
+#   check_packets.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
+set -uo pipefail
+source_dir=$1
+shift
+kelvane=("$@")
+fixtures=$source_dir/tests/fixtures
+
+failures=0
+fail() { echo "FAIL $*"; failures=$((failures + 1)); }
+
+# track time size adler, grouped by track in file order, for the tracks in $2.
+expected() {  # name tracks
+  local scale
+  scale=$(sed -n 's/^timecode_scale //p' "$fixtures/$1.expected")
+  awk -v scale="$scale" -v tracks=" $2 " '
+    /^#/ { next }
+    index(tracks, " " $1 " ") {
+      n = split($5, frames, ",")
+      for (i = 1; i <= n; i++) { split(frames[i], f, ":"); print $1, $2 * int(scale / 1000), f[1], f[2] }
+    }' "$fixtures/$1.blocks" | sort -s -k1,1n
+}
+
+for name in avc_aac lace_xiph lace_fixed blockgroups multi_audio timescale_100us vorbis_odd_scale subtitles_srt; do
+  for size in 1000 32768; do
+    out=$("${kelvane[@]}" packets --buffer-size "$size" "$fixtures/$name.mkv" 2>/dev/null) ||
+      { fail "$name/$size: exit code $?"; continue; }
+    frames=$(awk '$3 != "config" { print $2, $3, $4, $5 }' <<<"$out" | sort -s -k1,1n)
+    tracks=$(awk '{ print $1 }' <<<"$frames" | sort -un | tr '\n' ' ')
+    [[ -n "$tracks" ]] || { fail "$name/$size: no frames"; continue; }
+    diff <(expected "$name" "$tracks") <(echo "$frames") >/dev/null || fail "$name/$size: frames differ from $name.blocks"
+  done
+done
+
+# One channel acquired, no hashes, JSON: the same frames of that track only.
+out=$("${kelvane[@]}" packets --channels 1 --no-hash --json "$fixtures/avc_aac.mkv" 2>/dev/null)
+count=$(grep -c '"time_us"' <<<"$out")
+want=$(expected avc_aac 2 | wc -l)
+[[ "$count" == "$want" ]] || fail "avc_aac --channels 1 --json: $count frames, expected $want"
+grep -q '"adler32"' <<<"$out" && fail "avc_aac --no-hash: a checksum was printed"
+if command -v python3 >/dev/null; then
+  python3 -m json.tool <<<"$out" >/dev/null || fail "avc_aac --json: not valid JSON"
+fi
+
+# Usage errors answer 2.
+"${kelvane[@]}" packets --buffer-size 0 "$fixtures/avc_aac.mkv" >/dev/null 2>&1
+[[ $? == 2 ]] || fail "--buffer-size 0 is not a usage error"
+
+if ((failures)); then
+  echo "$failures failures"
+  exit 1
+fi
+echo "kelvane packets matches the fixtures' blocks"
