@@ -10,12 +10,12 @@
 #include "filter/mkv_context.h"
 #include "filter/output_assembly.h"
 #include "filter/output_channels.h"
-#include "filter/pending_operations.h"
 #include "filter/rating.h"
 #include "filter/read_list.h"
 #include "filter/resource_table.h"
 #include "filter/ring_buffer.h"
 #include "filter/time_converter.h"
+#include "filter/trick_play.h"
 #include "platform/interfaces.h"
 #include "platform/mmf_status.h"
 
@@ -114,10 +114,14 @@ int OpEventRegister(MmfFilterHandle*, uint32_t, void*) { return EventRegister();
 int OpSetInputPosition(MmfFilterHandle*, uint64_t) { return SetInputPosition(); }
 
 // MediaTrickPlay
-int OpTrickQuery(MmfFilterHandle*) { return PendingTrickQuery(); }
-int OpScanForward(MmfFilterHandle* handle, uint32_t) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
-int OpScanBackward(MmfFilterHandle* handle, uint32_t) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
-int OpScanEnd(MmfFilterHandle* handle) { return handle ? PendingNotAvailable() : kMmfInvalidArgument; }
+int OpTrickQuery(MmfFilterHandle*) { return TrickQuery(); }
+int OpScanForward(MmfFilterHandle* handle, uint32_t speed) {
+  return IsFilter(handle) ? ScanForward(AsMkvFilter(handle), speed) : kMmfInvalidArgument;
+}
+int OpScanBackward(MmfFilterHandle* handle, uint32_t speed) {
+  return IsFilter(handle) ? ScanBackward(AsMkvFilter(handle), speed) : kMmfInvalidArgument;
+}
+int OpScanEnd(MmfFilterHandle* handle) { return IsFilter(handle) ? ScanEnd(AsMkvFilter(handle)) : kMmfInvalidArgument; }
 
 // MediaListMaker
 int OpGetNextReadList(MmfChannel* channel, MmfReadListEntry** entry, MmfReadListEntry* previous) {

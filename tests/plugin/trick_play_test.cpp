@@ -1,0 +1,326 @@
+// Control states and trick play through the plug-in's tables. Scans drive a
+// real file streamer in list mode: every request it reads (time marker, file
+// offset, bytes) must be the cue point that long_cues.cues leads to.
+
+#include <algorithm>
+
+#include <gtest/gtest.h>
+
+#include "host/file_streamer.h"
+#include "host/graph_clock.h"
+#include "platform/mmf_status.h"
+#include "tests/plugin/graph_harness.h"
+#include "tests/support/cluster_driver.h"
+#include "tests/support/fixtures.h"
+#include "tests/support/log_recorder.h"
+
+namespace {
+
+using plugin_test::HostPlugin;
+
+constexpr uint32_t kBufferSize = 1024;
+
+const MmfMediaControlOps& Control() { return *HostPlugin().Get<MmfMediaControlOps>("MediaControl"); }
+const MmfTrickPlayOps& Trick() { return *HostPlugin().Get<MmfTrickPlayOps>("MediaTrickPlay"); }
+
+struct ControlCase {
+  const char* operation;
+  uint32_t before;
+  int answer;
+  uint32_t after;
+};
+
+TEST(ControlStateTest, EachOperationMovesTheStateAndAnswers) {
+  const ControlCase cases[] = {
+      {"Start", 16, 0, 64},   {"Start", 0, 0, 64},    {"Resume", 64, 0, 256}, {"Pause", 256, 0, 64},
+      {"Pause", 4, 0, 64},    {"Pause", 1, 0, 64},    {"Pause", 1024, 0, 64}, {"Pause", 16, 0, 16},
+      {"Pause", 64, 0, 64},   {"Pause", 0, 0, 0},     {"Stop", 64, 0, 16},    {"Stop", 1, 4041, 16},
+      {"Stop", 16, 0, 16},    {"Stop", 4, 0, 16},     {"Status", 256, 256, 256}, {"Status", 1, 1, 1},
+  };
+  plugin_test::Connected c = plugin_test::ConnectFile("long_cues");
+  ASSERT_TRUE(c.graph->rated());
+  EXPECT_EQ(c.context()->ControlState, 16u) << "rating leaves the filter stopped";
+  MmfFilterHandle* handle = c.graph->handle();
+  for (const ControlCase& k : cases) {
+    SCOPED_TRACE(std::string(k.operation) + " from " + std::to_string(k.before));
+    c.context()->ControlState = k.before;
+    const std::string op = k.operation;
+    int answer = op == "Start"    ? Control().Start(handle)
+                 : op == "Resume" ? Control().Resume(handle)
+                 : op == "Pause"  ? Control().Pause(handle)
+                 : op == "Stop"   ? Control().Stop(handle)
+                                  : Control().Status(handle);
+    EXPECT_EQ(answer, k.answer);
+    EXPECT_EQ(c.context()->ControlState, k.after);
+  }
+  EXPECT_EQ(Trick().TrickQuery(handle), 8);
+}
+
+// One request as the streamer read it: the time marker heading its first
+// buffer, that buffer's file offset, and the bytes read until the next marker.
+struct Read {
+  uint64_t time, offset, bytes;
+  bool operator==(const Read&) const = default;
+};
+
+std::ostream& operator<<(std::ostream& out, const Read& r) {
+  return out << "{" << r.time << " us at " << r.offset << ", " << r.bytes << " bytes}";
+}
+
+// The cue table from mkvinfo, with the searches the cue points are chosen by.
+class CueTable {
+ public:
+  explicit CueTable(const std::string& name) {
+    auto fixture = testing_support::LoadFixture(name);
+    auto bytes = testing_support::ReadFixtureBytes(name);
+    const uint64_t segment = testing_support::FirstClusterOffset(bytes.data(), bytes.size()) -
+                             fixture.cues.at(0).cluster_position;
+    for (const auto& cue : fixture.cues) {
+      const uint64_t time = cue.time_ticks * (fixture.timecode_scale / 1000);
+      const uint64_t position = cue.cluster_position + segment;
+      if (!times_.empty() && times_.back() == time) {
+        positions_.back() = std::min(positions_.back(), position);
+      } else {
+        times_.push_back(time);
+        positions_.push_back(position);
+      }
+    }
+  }
+  size_t size() const { return times_.size(); }
+  uint64_t time(size_t i) const { return times_[i]; }
+  uint64_t position(size_t i) const { return positions_[i]; }
+
+  // The first cue point after t, or the last.
+  size_t Forward(uint64_t t) const {
+    for (size_t i = 0; i < size(); ++i) {
+      if (times_[i] > t) return i;
+    }
+    return size() - 1;
+  }
+  // The last at or before t, the first when none is; at the last one's time, the one before.
+  size_t Backward(uint64_t t) const {
+    size_t i = Forward(t);
+    if (times_[i] > t) return i == 0 ? 0 : i - 1;
+    return t > times_[i] || i == 0 ? i : i - 1;
+  }
+
+ private:
+  std::vector<uint64_t> times_;
+  std::vector<uint64_t> positions_;
+};
+
+// long_cues with the streamer, its list maker and the graph clock connected
+// as the framework connects them; `channels` are the outputs acquired.
+class TrickPlayTest : public testing::Test {
+ protected:
+  void Connect(const std::string& name, std::vector<int32_t> channels) {
+    host::SetupOptions options;
+    options.buffer_size = kBufferSize;
+    options.configure_outputs = false;
+    connected_ = plugin_test::ConnectFile(name, true, options);
+    ASSERT_TRUE(connected_.graph->rated());
+    handle_ = connected_.graph->handle();
+    for (int32_t k : channels) {
+      ASSERT_EQ(HostPlugin().output()->AcquireOutputChannel(AsFrameworkChannel(&connected_.channel(k))), 0);
+    }
+    source_ = host::OpenFileStream(plugin_test::FixtureFile(name), true);
+    streamer_ = std::make_unique<host::FileStreamer>(source_.get(), host::StreamerConfig{kBufferSize, 16});
+    handle_->InputChannel->Peer = streamer_->output();
+    streamer_->ConnectListMaker(HostPlugin().Get<MmfListMakerOps>("MediaListMaker"), handle_->InputChannel);
+    ASSERT_EQ(streamer_->Seek(static_cast<uint64_t>(connected_.stream->Tell()), 0), 0);
+    host::AttachGraphClock(handle_->Graph, &clock_);
+  }
+
+  void TearDown() override {
+    if (handle_) host::AttachGraphClock(handle_->Graph, nullptr);
+    if (!handle_) return;
+    for (int32_t k = 0; k < connected_.channel_count(); ++k) {
+      (void)HostPlugin().output()->ReleaseOutputChannel(AsFrameworkChannel(&connected_.channel(k)));
+    }
+  }
+
+  // What the streamer reads until it ends or `limit` buffers were read.
+  std::vector<Read> Reads(int limit, int* end = nullptr) {
+    std::vector<Read> reads;
+    int result = kMmfBufferDelivered;
+    for (int n = 0; n < limit && result == kMmfBufferDelivered; ++n) {
+      MmfMra* mra = nullptr;
+      result = host::FileStreamer::Ops()->NextBuffer(streamer_->output(), &mra);
+      if (result != kMmfBufferDelivered) break;
+      uint32_t type = 0, low = 0, element = 0;
+      uint16_t high = 0;
+      uint64_t offset = 0;
+      for (uint32_t i = 0; MmfGetMraPropertyElement(mra, i, &type, &low, &high) == 0; ++i, ++element) {
+        if (type == kMmfPropTimeMarker) reads.push_back({MmfPropertyValue(low, high), 0, 0});
+        if (type == kMmfPropFileOffset) offset = MmfPropertyValue(low, high);
+      }
+      MmfPoolBuffer* pool_buffer = nullptr;
+      uint8_t* address = nullptr;
+      uint32_t size = 0;
+      EXPECT_EQ(MmfGetMraBufferElement(mra, element, &pool_buffer, &address, &size), 0);
+      if (!reads.empty()) {
+        if (reads.back().bytes == 0) reads.back().offset = offset;
+        EXPECT_EQ(offset, reads.back().offset + reads.back().bytes) << "a request is read in one stretch";
+        reads.back().bytes += size;
+      }
+      MmfReleaseMra(mra);
+    }
+    if (end) *end = result;
+    return reads;
+  }
+
+  MkvContext* context() { return connected_.context(); }
+
+  CueTable cues_{"long_cues"};
+  plugin_test::Connected connected_;
+  MmfFilterHandle* handle_ = nullptr;
+  std::unique_ptr<host::InputStream> source_;
+  std::unique_ptr<host::FileStreamer> streamer_;
+  host::GraphClock clock_;
+};
+
+struct ScanCase {
+  const char* name;
+  bool forward;
+  uint32_t speed;
+  uint64_t now_us;
+};
+
+class ScanTest : public TrickPlayTest, public testing::WithParamInterface<ScanCase> {};
+
+// Every step of a scan reads TrickTime's bytes (byte rate 2000 B/s × 500 ms =
+// 1000, raised to a whole input buffer) at the next cue point of the scan, and
+// the scan ends with a request of length -1 at the end of the cue table.
+TEST_P(ScanTest, EveryStepReadsTheClusterOfTheExpectedCuePoint) {
+  const ScanCase& k = GetParam();
+  Connect("long_cues", {0, 1});
+  context()->ByteRate = 2000;
+  clock_.Consumed(k.now_us);
+  const uint64_t skip = 500 * (1000 * uint64_t(k.speed)) / 100;
+  std::vector<Read> expected;
+  size_t cue = k.forward ? cues_.Forward(k.now_us) : cues_.Backward(k.now_us);
+  for (;;) {
+    expected.push_back({cues_.time(cue), cues_.position(cue), kBufferSize});
+    const uint64_t t = cues_.time(cue);
+    const size_t next = k.forward ? cues_.Forward(t + 500000 + skip) : cues_.Backward(t > skip ? t - skip : t);
+    if (cues_.time(next) == t) break;
+    cue = next;
+  }
+  ASSERT_EQ(k.forward ? Trick().ScanForward(handle_, k.speed) : Trick().ScanBackward(handle_, k.speed), 0);
+  EXPECT_EQ(context()->TrickMode, k.forward ? 512u : 1024u);
+  EXPECT_EQ(context()->TrickSpeed, k.speed);
+  int end = 0;
+  EXPECT_EQ(Reads(500, &end), expected);
+  EXPECT_EQ(end, kMmfEndOfStream);
+  EXPECT_EQ(context()->CurrentReadList->Request->Length, -1);
+}
+
+INSTANTIATE_TEST_SUITE_P(LongCues, ScanTest,
+                         testing::Values(ScanCase{"ForwardSpeed100From3s", true, 100, 3000000},
+                                         ScanCase{"ForwardSpeed400From0", true, 400, 0},
+                                         ScanCase{"ForwardSpeed0BetweenCues", true, 0, 20250000},
+                                         ScanCase{"BackwardSpeed200From20s", false, 200, 20000000},
+                                         ScanCase{"BackwardSpeed100FromTheEnd", false, 100, 30000000}),
+                         [](const testing::TestParamInfo<ScanCase>& info) { return info.param.name; });
+
+TEST_F(TrickPlayTest, TheFirstRequestIsTrickTimesBytesRaisedToWholeInputBuffers) {
+  Connect("long_cues", {0, 1});
+  context()->ByteRate = 100000;  // 50000 bytes in 500 ms: 49 buffers of 1024
+  clock_.Consumed(7200000);
+  ASSERT_EQ(Trick().ScanForward(handle_, 100), 0);
+  const MmfReadRequest& request = *context()->CurrentReadList->Request;
+  EXPECT_EQ(request.Length, 50176);
+  EXPECT_EQ(request.Time, cues_.time(cues_.Forward(7200000)));
+  EXPECT_EQ(context()->CurrentReadList->Ready, 1u);
+}
+
+TEST_F(TrickPlayTest, ScanEndPutsANormalRequestInTheScansDirectionAndStreamsOnFromIt) {
+  for (bool forward : {true, false}) {
+    SCOPED_TRACE(forward ? "after ScanForward" : "after ScanBackward");
+    Connect("long_cues", {0, 1});
+    context()->ByteRate = 2000;
+    clock_.Consumed(4000000);
+    ASSERT_EQ(forward ? Trick().ScanForward(handle_, 100) : Trick().ScanBackward(handle_, 100), 0);
+    (void)Reads(3);
+    clock_.Consumed(12250000);
+    ASSERT_EQ(Trick().ScanEnd(handle_), 0);
+    EXPECT_EQ(context()->TrickMode, 0u);
+    EXPECT_EQ(context()->TrickSpeed, 0u);
+    const size_t cue = forward ? cues_.Forward(12250000) : cues_.Backward(12250000);
+    std::vector<Read> reads = Reads(8);
+    ASSERT_EQ(reads.size(), 1u) << "one marker, then the file in order";
+    EXPECT_EQ(reads[0], (Read{cues_.time(cue), cues_.position(cue), 8 * kBufferSize}));
+    TearDown();
+  }
+}
+
+struct AudioScanCase {
+  const char* name;
+  std::vector<int32_t> channels;
+  uint32_t speed;
+  bool skips;
+};
+
+class AudioScanTest : public TrickPlayTest, public testing::WithParamInterface<AudioScanCase> {};
+
+// TrickPlaySkipStartSpeed 1000: an audio-only scan slower than that streams
+// every frame on from the next cue point; any other scan skips.
+TEST_P(AudioScanTest, OnlyASlowAudioOnlyScanStreamsOnWithoutSkipping) {
+  const AudioScanCase& k = GetParam();
+  Connect("long_cues", k.channels);
+  int32_t skip_start = 1000;
+  ASSERT_EQ(HostPlugin().resources()->SetResource(handle_, "TrickPlaySkipStartSpeed", &skip_start), 0);
+  context()->ByteRate = 2000;
+  clock_.Consumed(9100000);
+  ASSERT_EQ(Trick().ScanForward(handle_, k.speed), 0);
+  EXPECT_EQ(context()->TrickMode, k.skips ? 512u : 0u);
+  EXPECT_EQ(context()->CurrentReadList->Request->Length, int32_t(kBufferSize));
+  const size_t cue = cues_.Forward(9100000);
+  std::vector<Read> reads = Reads(6);
+  ASSERT_FALSE(reads.empty());
+  EXPECT_EQ(reads[0].time, cues_.time(cue));
+  EXPECT_EQ(reads[0].offset, cues_.position(cue));
+  if (k.skips) {
+    EXPECT_GT(reads.size(), 1u) << "one request per cue point";
+    for (const Read& read : reads) EXPECT_EQ(read.bytes, kBufferSize);
+  } else {
+    EXPECT_EQ(reads, (std::vector<Read>{{reads[0].time, reads[0].offset, 6 * kBufferSize}})) << "the file in order";
+  }
+}
+
+INSTANTIATE_TEST_SUITE_P(LongCues, AudioScanTest,
+                         testing::Values(AudioScanCase{"AudioOnlySlow", {1}, 800, false},
+                                         AudioScanCase{"AudioOnlyAtTheSkipSpeed", {1}, 1000, true},
+                                         AudioScanCase{"VideoOnlySlow", {0}, 800, true},
+                                         AudioScanCase{"AudioAndVideoSlow", {0, 1}, 800, true}),
+                         [](const testing::TestParamInfo<AudioScanCase>& info) { return info.param.name; });
+
+TEST_F(TrickPlayTest, WithoutCuesASkippingScanEndsTheStreamAndTheNoSkipScanFails) {
+  Connect("no_cues", {1});
+  testing_support::LogRecorder log;
+  ASSERT_EQ(Trick().ScanForward(handle_, 100), 0);
+  EXPECT_TRUE(log.Contains(3, "kelvane: ScanForward cueing points weren't enough to trick play."));
+  EXPECT_EQ(context()->CurrentReadList->Request->Length, -1);
+  int end = 0;
+  EXPECT_TRUE(Reads(4, &end).empty());
+  EXPECT_EQ(end, kMmfEndOfStream);
+
+  int32_t skip_start = 1000;
+  ASSERT_EQ(HostPlugin().resources()->SetResource(handle_, "TrickPlaySkipStartSpeed", &skip_start), 0);
+  EXPECT_EQ(Trick().ScanForward(handle_, 800), 48);
+}
+
+TEST_F(TrickPlayTest, WithoutAGraphClockEveryScanFailsAndSaysSo) {
+  Connect("long_cues", {0, 1});
+  host::AttachGraphClock(handle_->Graph, nullptr);
+  testing_support::LogRecorder log;
+  EXPECT_EQ(Trick().ScanForward(handle_, 100), kMmfNotAvailable);
+  EXPECT_EQ(Trick().ScanBackward(handle_, 100), kMmfNotAvailable);
+  EXPECT_EQ(Trick().ScanEnd(handle_), kMmfNotAvailable);
+  for (const char* op : {"ScanForward", "ScanBackward", "ScanEnd"}) {
+    EXPECT_TRUE(log.Contains(2, std::string("kelvane: ") + op + " failed to get current time.")) << op;
+  }
+  EXPECT_EQ(context()->TrickMode, 0u);
+}
+
+}  // namespace
