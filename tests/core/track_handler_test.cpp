@@ -44,21 +44,6 @@ Bytes file_with_entries(const std::vector<Bytes>& entries) {
   return cat({ebml_header(), master(kSegment, {master(kInfo, {}), element(kTracks, tracks)})});
 }
 
-TEST(TrackHandlerTest, EntryWithoutChildrenIsCountedWithDefaults) {
-  EntryRun run({});
-  ASSERT_EQ(run.Run(), kStatusOk);
-  const mkv_track_info& t = run.track();
-  EXPECT_EQ(run.info().track_count, 1u);
-  EXPECT_TRUE(run.info().parse_flags & kMetTrackEntry);
-  EXPECT_EQ(t.track_number + t.track_type + t.flag_forced + t.codec_decode_all + t.flag_interlaced, 0u);
-  EXPECT_EQ(t.flag_enabled + t.flag_default + t.flag_lacing, 3);
-  EXPECT_EQ(t.track_timecode_scale, 1.0);
-  EXPECT_EQ(t.sampling_frequency, 8000.0);
-  EXPECT_EQ(t.channels, 1u);
-  EXPECT_EQ(t.name, nullptr);
-  EXPECT_EQ(t.codec_private, nullptr);
-}
-
 // The fields the real fixtures do not exercise.
 TEST(TrackHandlerTest, RareChildrenLandInTheirFields) {
   EntryRun run(cat({uinteger(kFlagLacing, 2), element(kFlagEnabled, {}), uinteger(kFlagForced, 3),
@@ -200,7 +185,6 @@ TEST(TrackHandlerTest, EntryEndingEarlyIsCountedWithWhatWasRead) {
     Bytes tail;
     int64_t size_adjustment;
   } cases[] = {
-      {"ID byte 0x00", cat({Bytes{0x00}, uinteger(kChannels, 6)}), 0},
       {"ID byte 0x0F", cat({Bytes{0x0F, 0x81, 0x00}, uinteger(kChannels, 6)}), 0},
       {"size byte 0x00", cat({Bytes{0x9F, 0x00}, uinteger(kChannels, 6)}), 0},
       {"stream ends inside a size", Bytes{0x9F, 0x40}, 10},
