@@ -22,27 +22,6 @@ Bytes ClusterOf(std::initializer_list<Bytes> children) {
   return master(kCluster, {uinteger(kTimecode, 10), cat(children)});
 }
 
-TEST(ParseMkvBlockGroupTest, ChildrenAfterTheBlockAreReadByTheNextCall) {
-  Bytes bytes = ClusterOf({master(kBlockGroup, {Block1(), uinteger(kBlockDuration, 40)}),
-                           simple_block(2, 5, kKeyFrame, {filler(2)})});
-  Record record;
-  mkvinbuff in1 = View(bytes, 0, bytes.size());
-  ASSERT_EQ(cluster_testing::Call(record, &in1, nullptr).result, kClusterBlockReady);
-  EXPECT_EQ(record.c.in_blockgroup, 1);
-  EXPECT_EQ(record.c.block_duration, 0u);
-  in1.buff_pos += 3;
-  in1.buff_left -= 3;
-  mkvinbuff rest = in1;
-  EXPECT_EQ(parse_mkvblockgroup(&rest, nullptr, &record.c), kClusterGroupEnded);
-  EXPECT_EQ(record.c.block_duration, 40u);
-
-  record.c.block_duration = 0;
-  auto next = cluster_testing::Call(record, &in1, nullptr);  // passes the group's end on its own
-  EXPECT_EQ(next.result, kClusterBlockReady);
-  EXPECT_EQ(next.track, 2u);
-  EXPECT_EQ(record.c.block_duration, 40u);
-}
-
 struct GroupCase {
   const char* name;
   Bytes children;  // before the Block

@@ -114,15 +114,6 @@ TEST_P(ParseMkvClusterTest, GivesTheResultOfItsCase) {
 INSTANTIATE_TEST_SUITE_P(Cases, ParseMkvClusterTest, testing::ValuesIn(kCases),
                          [](const auto& info) { return std::string(info.param.name); });
 
-TEST(ParseMkvClusterStoredTest, PositionAndPrevSizeAreStored) {
-  Record record;
-  Bytes bytes = master(kCluster, {uinteger(kPosition, 300), uinteger(kPrevSize, 70000), uinteger(kTimecode, 2),
-                                  Block(1)});
-  ASSERT_EQ(cluster_testing::ParseWhole(record, bytes).result, kClusterBlockReady);
-  EXPECT_EQ(record.c.cluster_position, 300u);
-  EXPECT_EQ(record.c.cluster_prevsize, 70000u);
-}
-
 // Without inbuff2 the call ends where inbuff1 does; what it read stays read.
 TEST(ParseMkvClusterRanOutTest, EndOfInbuff1GivesTheResultOfTheLevelItEndsIn) {
   Bytes bytes = master(kCluster, {uinteger(kTimecode, 2), Block(1), Block(2)});
