@@ -182,20 +182,4 @@ TEST(RateInputFormatFixturesTest, OffersEverySupportedTrackInFileOrderWithItsFor
   }
 }
 
-TEST(RateInputFormatFixturesTest, InputThatCannotSeekIsRatedThroughAnUnbufferedStream) {
-  for (const char* name : {"avc_aac", "theora_vorbis", "long_cues"}) {
-    SCOPED_TRACE(name);
-    Connected piped = ConnectFile(name, false);
-    Connected seekable = ConnectFile(name, true);
-    ASSERT_EQ(piped.graph->rating(), 80);
-    EXPECT_EQ(piped.context()->Seekable, 0u);
-    EXPECT_EQ(seekable.context()->Seekable, 1u);
-    EXPECT_EQ(piped.channel_count(), seekable.channel_count());
-    EXPECT_EQ(piped.context()->ByteRate, seekable.context()->ByteRate);
-    const auto* seeker = plugin_test::HostPlugin().seeker();
-    EXPECT_EQ(seeker->SeekQuery(piped.graph->handle()), 1);
-    EXPECT_EQ(seeker->SeekQuery(seekable.graph->handle()), 2);
-  }
-}
-
 }  // namespace
