@@ -91,7 +91,6 @@ TEST(AvcSpsTest, RareButValidFieldsAreStepped) {
       {"picture order type 2", {.poc_type = 2}, 320, 4, 3},
       {"4:2:0 crop counts chroma samples", {.crop_right = 3}, 314, 4, 3},
       {"idc 13", {.aspect_idc = 13}, 320, 160, 99},
-      {"idc 16", {.aspect_idc = 16}, 320, 2, 1},
       {"idc 0 is unspecified", {.aspect_idc = 0}, 320, 0, 0},
       {"reserved idc 17", {.aspect_idc = 17}, 320, 0, 0},
       {"Extended_SAR of 16-bit values", {.aspect_idc = 255, .sar_width = 65535, .sar_height = 65534}, 320, 65535, 65534},
