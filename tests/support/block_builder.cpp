@@ -17,8 +17,7 @@ Bytes signed_lace_number(int64_t difference) {
   std::abort();
 }
 
-}  // namespace
-
+// The lace table of `frames` as `lacing` codes it (no frame-count byte).
 Bytes lace_table(uint8_t lacing, const Frames& frames) {
   Bytes out;
   if (frames.empty()) return out;
@@ -40,6 +39,8 @@ Bytes lace_table(uint8_t lacing, const Frames& frames) {
   return out;
 }
 
+// Track number, relative timecode, flags, then (when flags lace) the
+// frame-count byte and the lace table, then the frames.
 Bytes block_body(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames) {
   auto tc = static_cast<uint16_t>(timecode);
   Bytes out = cat({size_bytes(track), Bytes{static_cast<uint8_t>(tc >> 8), static_cast<uint8_t>(tc), flags}});
@@ -53,6 +54,8 @@ Bytes block_body(uint64_t track, int16_t timecode, uint8_t flags, const Frames& 
   return out;
 }
 
+}  // namespace
+
 Bytes simple_block(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames) {
   return element(kSimpleBlock, block_body(track, timecode, flags, frames));
 }
@@ -63,10 +66,6 @@ Bytes xiph_laced_block(uint64_t track, int16_t timecode, uint8_t flags, const Fr
 
 Bytes ebml_laced_block(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames) {
   return simple_block(track, timecode, static_cast<uint8_t>(flags | kEbmlLacing), frames);
-}
-
-Bytes fixed_laced_block(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames) {
-  return simple_block(track, timecode, static_cast<uint8_t>((flags & ~0x06) | kFixedLacing), frames);
 }
 
 Bytes block(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames) {

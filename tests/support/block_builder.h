@@ -14,19 +14,14 @@ namespace ebml {
 
 // Cluster and BlockGroup children that the base builder does not name.
 enum : uint32_t {
-  kPosition = 0xA7,
-  kPrevSize = 0xAB,
   kSilentTracks = 0x5854,
   kSilentTrackNumber = 0x58D7,
-  kEncryptedBlock = 0xAF,
   kBlockVirtual = 0xA2,
   kReferencePriority = 0xFA,
   kReferenceVirtual = 0xFD,
   kCodecState = 0xA4,
   kDiscardPadding = 0x75A2,
   kBlockAdditions = 0x75A1,
-  kBlockMore = 0xA6,
-  kBlockAddId = 0xEE,
   kBlockAdditional = 0xA5,
   kSlices = 0x8E,
 };
@@ -40,16 +35,9 @@ enum : uint8_t {
 
 using Frames = std::vector<Bytes>;
 
-// Track number, relative timecode, flags, then (when flags lace) the
-// frame-count byte and the lace table, then the frames.
-Bytes block_body(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames);
-// Only the lace table of `frames` as `lacing` codes it (no frame-count byte).
-Bytes lace_table(uint8_t lacing, const Frames& frames);
-
 Bytes simple_block(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames);
 Bytes xiph_laced_block(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames);
 Bytes ebml_laced_block(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames);
-Bytes fixed_laced_block(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames);
 // The Block (0xA1) of a BlockGroup.
 Bytes block(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames);
 

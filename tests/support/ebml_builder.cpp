@@ -73,12 +73,6 @@ Bytes sinteger(uint32_t id, int64_t value, int width) {
 
 Bytes str(uint32_t id, std::string_view text) { return element(id, Bytes(text.begin(), text.end())); }
 
-Bytes f32(uint32_t id, float value) {
-  auto bits = std::bit_cast<uint32_t>(value);
-  return element(id, Bytes{static_cast<uint8_t>(bits >> 24), static_cast<uint8_t>(bits >> 16),
-                           static_cast<uint8_t>(bits >> 8), static_cast<uint8_t>(bits)});
-}
-
 Bytes f64(uint32_t id, double value) {
   auto bits = std::bit_cast<uint64_t>(value);
   Bytes payload(8);

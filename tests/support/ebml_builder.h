@@ -37,7 +37,6 @@ enum : uint32_t {
   kDateUtc = 0x4461,
   kTitle = 0x7BA9,
   kMuxingApp = 0x4D80,
-  kWritingApp = 0x5741,
   kCluster = 0x1F43B675,
   kTimecode = 0xE7,
   kSimpleBlock = 0xA3,
@@ -59,7 +58,6 @@ enum : uint32_t {
   kAudio = 0xE1,
   kSamplingFrequency = 0xB5,
   kChannels = 0x9F,
-  kBitDepth = 0x6264,
   kContentEncodings = 0x6D80,
   kContentEncoding = 0x6240,
   kContentCompression = 0x5034,
@@ -85,9 +83,6 @@ enum : uint32_t {
   kPixelCropTop = 0x54BB,
   kPixelCropLeft = 0x54CC,
   kPixelCropRight = 0x54DD,
-  kDisplayWidth = 0x54B0,
-  kDisplayHeight = 0x54BA,
-  kDisplayUnit = 0x54B2,
   kAspectRatioType = 0x54B3,
   kColourSpace = 0x2EB524,
   kOutputSamplingFrequency = 0x78B5,
@@ -99,8 +94,6 @@ enum : uint32_t {
   kContentEncKeyId = 0x47E2,
   kContentSignature = 0x47E3,
   kContentSigKeyId = 0x47E4,
-  kContentSigAlgo = 0x47E5,
-  kContentSigHashAlgo = 0x47E6,
   kCues = 0x1C53BB6B,
   kCuePoint = 0xBB,
   kCueTime = 0xB3,
@@ -118,7 +111,6 @@ enum : uint32_t {
   kTagName = 0x45A3,
   kTagString = 0x4487,
   kTagBinary = 0x4485,
-  kTargets = 0x63C0,
   kTagLanguage = 0x447A,
   kAttachments = 0x1941A469,
   kChapters = 0x1043A770,
@@ -139,7 +131,6 @@ Bytes unknown_size(uint32_t id, std::initializer_list<Bytes> children);
 Bytes uinteger(uint32_t id, uint64_t value, int width = 0);  // width 0: shortest, at least one byte
 Bytes sinteger(uint32_t id, int64_t value, int width);
 Bytes str(uint32_t id, std::string_view text);
-Bytes f32(uint32_t id, float value);
 Bytes f64(uint32_t id, double value);
 Bytes bin(uint32_t id, const Bytes& payload);
 Bytes cat(std::initializer_list<Bytes> parts);

@@ -186,30 +186,23 @@ std::vector<std::string> FixtureNames() {
   return names;
 }
 
-FixtureExpectation ParseFixtureTexts(const std::string& name, const std::string& expected, const std::string& cues,
-                                     const std::string& blocks) {
+FixtureExpectation LoadFixture(const std::string& name) {
   FixtureExpectation fx;
   fx.name = name;
   fx.path = FixturePath(name + ".mkv");
-  ForEachLine(name + ".expected", expected, [&](std::string_view line) { return ParseExpectedLine(line, &fx); });
-  ForEachLine(name + ".cues", cues, [&](std::string_view line) { return ParseCueLine(line, &fx); });
-  ForEachLine(name + ".blocks", blocks, [&](std::string_view line) { return ParseBlockLine(line, &fx); });
+  ForEachLine(name + ".expected", ReadTextOrFail(name + ".expected"),
+              [&](std::string_view line) { return ParseExpectedLine(line, &fx); });
+  ForEachLine(name + ".cues", ReadTextOrFail(name + ".cues"), [&](std::string_view line) { return ParseCueLine(line, &fx); });
+  ForEachLine(name + ".blocks", ReadTextOrFail(name + ".blocks"),
+              [&](std::string_view line) { return ParseBlockLine(line, &fx); });
   return fx;
 }
 
-FixtureExpectation LoadFixture(const std::string& name) {
-  return ParseFixtureTexts(name, ReadTextOrFail(name + ".expected"), ReadTextOrFail(name + ".cues"),
-                           ReadTextOrFail(name + ".blocks"));
-}
-
-std::vector<ExpectedFullFrame> ParseFullFramesText(const std::string& name, const std::string& text) {
-  std::vector<ExpectedFullFrame> frames;
-  ForEachLine(name + ".frames", text, [&](std::string_view line) { return ParseFullFrameLine(line, &frames); });
-  return frames;
-}
-
 std::vector<ExpectedFullFrame> LoadFullFrames(const std::string& name) {
-  return ParseFullFramesText(name, ReadTextOrFail(name + ".frames"));
+  std::vector<ExpectedFullFrame> frames;
+  ForEachLine(name + ".frames", ReadTextOrFail(name + ".frames"),
+              [&](std::string_view line) { return ParseFullFrameLine(line, &frames); });
+  return frames;
 }
 
 std::vector<uint8_t> ReadFixtureBytes(const std::string& name) {

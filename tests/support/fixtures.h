@@ -80,14 +80,8 @@ std::vector<std::string> FixtureNames();
 // line is skipped.
 FixtureExpectation LoadFixture(const std::string& name);
 
-// The same parse over texts in memory; `name` only labels the failures.
-FixtureExpectation ParseFixtureTexts(const std::string& name, const std::string& expected,
-                                     const std::string& cues, const std::string& blocks);
-
-// Reads NAME.frames, and the same parse over a text in memory; failures are
-// reported as LoadFixture reports them.
+// Reads NAME.frames; failures are reported as LoadFixture reports them.
 std::vector<ExpectedFullFrame> LoadFullFrames(const std::string& name);
-std::vector<ExpectedFullFrame> ParseFullFramesText(const std::string& name, const std::string& text);
 
 // The whole NAME.mkv; empty (with ADD_FAILURE) when it cannot be read.
 std::vector<uint8_t> ReadFixtureBytes(const std::string& name);

@@ -19,18 +19,14 @@ Bytes seek_head(const std::vector<SegmentPart>& parts, const std::vector<uint64_
 
 }  // namespace
 
-std::vector<uint64_t> IndexedPartPositions(const std::vector<SegmentPart>& parts, const Bytes& seek_head_tail) {
+Bytes IndexedFile(const std::vector<SegmentPart>& parts, const Bytes& seek_head_tail) {
+  // Offsets from the Segment's data start; the SeekHead's size does not depend on them.
   std::vector<uint64_t> positions(parts.size(), 0);
   uint64_t position = seek_head(parts, positions, seek_head_tail).size();
   for (size_t i = 0; i < parts.size(); ++i) {
     positions[i] = position;
     position += parts[i].bytes.size();
   }
-  return positions;
-}
-
-Bytes IndexedFile(const std::vector<SegmentPart>& parts, const Bytes& seek_head_tail) {
-  std::vector<uint64_t> positions = IndexedPartPositions(parts, seek_head_tail);
   Bytes segment = seek_head(parts, positions, seek_head_tail);
   for (const SegmentPart& part : parts) segment.insert(segment.end(), part.bytes.begin(), part.bytes.end());
   return cat({ebml_header(), element(kSegment, segment, 8)});

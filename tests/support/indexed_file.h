@@ -19,8 +19,4 @@ struct SegmentPart {
 // them. `seek_head_tail` is appended inside the SeekHead after its entries.
 ebml::Bytes IndexedFile(const std::vector<SegmentPart>& parts, const ebml::Bytes& seek_head_tail = {});
 
-// Offset of each part from the Segment's data start, as IndexedFile lays them out.
-std::vector<uint64_t> IndexedPartPositions(const std::vector<SegmentPart>& parts,
-                                           const ebml::Bytes& seek_head_tail = {});
-
 }  // namespace testing_support

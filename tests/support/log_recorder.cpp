@@ -26,9 +26,4 @@ bool LogRecorder::Contains(int level, const std::string& text) const {
   return false;
 }
 
-void LogRecorder::Clear() {
-  std::lock_guard lock(mutex_);
-  messages_.clear();
-}
-
 }  // namespace testing_support

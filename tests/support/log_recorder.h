@@ -17,7 +17,6 @@ class LogRecorder {
 
   std::vector<std::pair<int, std::string>> messages() const;
   bool Contains(int level, const std::string& text) const;
-  void Clear();
 
  private:
   mutable std::mutex mutex_;
