@@ -1,5 +1,6 @@
-// Output assembly on crafted input: what lies between Clusters, and an input
-// buffer with more properties than an output buffer has room for.
+// Output assembly on crafted input: what lies between Clusters, laces with
+// empty frames or bytes after their last frame, and an input buffer with more
+// properties than an output buffer has room for.
 
 #include <cstdio>
 #include <fstream>
@@ -21,20 +22,36 @@ namespace {
 
 using ebml::Bytes;
 
-// One MP3 track; each Cluster holds one block of one frame per entry of `frames`.
-Bytes AudioFile(const std::vector<Bytes>& between) {
+// Info and Tracks of a file with one MP3 track.
+Bytes AudioHeader() {
   Bytes tracks = ebml::master(ebml::kTracks, {ebml::master(ebml::kTrackEntry, {
       ebml::uinteger(ebml::kTrackNumber, 1), ebml::uinteger(ebml::kTrackUid, 1), ebml::uinteger(ebml::kTrackType, 2),
       ebml::str(ebml::kCodecId, "A_MPEG/L3"),
       ebml::master(ebml::kAudio, {ebml::f64(ebml::kSamplingFrequency, 44100), ebml::uinteger(ebml::kChannels, 1)})})});
-  Bytes segment = ebml::cat({ebml::master(ebml::kInfo, {ebml::uinteger(ebml::kTimecodeScale, 1000000)}), tracks});
+  return ebml::cat({ebml::master(ebml::kInfo, {ebml::uinteger(ebml::kTimecodeScale, 1000000)}), tracks});
+}
+
+Bytes MatroskaFile(const Bytes& segment) {
+  return ebml::cat({ebml::ebml_header(), ebml::element(ebml::kSegment, segment)});
+}
+
+// Clusters 100 ms apart with one one-frame block each; `between[i]` follows Cluster i.
+Bytes AudioFile(const std::vector<Bytes>& between) {
+  Bytes segment = AudioHeader();
   for (size_t i = 0; i <= between.size(); ++i) {
     Bytes frame(100 + i, static_cast<uint8_t>(i + 1));
     segment = ebml::cat({segment, ebml::master(ebml::kCluster, {ebml::uinteger(ebml::kTimecode, 100 * i),
                                                                 ebml::simple_block(1, 0, ebml::kKeyFrame, {frame})})});
     if (i < between.size()) segment = ebml::cat({segment, between[i]});
   }
-  return ebml::cat({ebml::ebml_header(), ebml::element(ebml::kSegment, segment)});
+  return MatroskaFile(segment);
+}
+
+// One Cluster that holds `blocks`.
+Bytes OneCluster(std::initializer_list<Bytes> blocks) {
+  Bytes cluster = ebml::uinteger(ebml::kTimecode, 0);
+  for (const Bytes& block : blocks) cluster = ebml::cat({cluster, block});
+  return MatroskaFile(ebml::cat({AudioHeader(), ebml::element(ebml::kCluster, cluster)}));
 }
 
 std::string WriteTemp(const Bytes& bytes, const std::string& name) {
@@ -97,6 +114,63 @@ TEST(PlaybackCasesTest, ElementsBetweenClustersMarkTheNextBlockAsSkippedAfter) {
         << "each block after a skipped element comes after one skip mark";
   }
 }
+
+struct LaceCase {
+  const char* name;
+  Bytes file;
+  std::vector<Bytes> frames;  // what the track must deliver, in order
+};
+
+class PlaybackLaceTest : public testing::TestWithParam<LaceCase> {};
+
+TEST_P(PlaybackLaceTest, DeliversEveryFrameOnceAndPassesOverTheRest) {
+  const LaceCase& c = GetParam();
+  const std::string path = WriteTemp(c.file, std::string(c.name) + ".mkv");
+  std::vector<std::pair<uint32_t, uint32_t>> want;
+  for (const Bytes& f : c.frames) want.emplace_back(f.size(), testing_support::Adler32(f.data(), f.size()));
+  for (uint32_t size : {7u, 64u, 4096u}) {
+    SCOPED_TRACE(size);
+    host::RunnerOptions options;
+    options.input_buffer_size = size;
+    host::RunResult result = host::RunGraph(plugin_test::HostPlugin(), path, options);
+    ASSERT_TRUE(result.ok) << result.error;
+    std::vector<std::pair<uint32_t, uint32_t>> got;
+    for (const host::RunFrame& f : result.channels[0].frames) got.emplace_back(f.size, f.adler32);
+    EXPECT_EQ(got, want);
+  }
+}
+
+Bytes Filled(size_t n, uint8_t value) { return Bytes(n, value); }
+
+// A fixed-size lace of 3 frames over 32 bytes: 10 bytes each, 2 left over.
+Bytes FixedLaceWithRemainder() {
+  Bytes body = {
+      0x81,        // track 1
+      0x00, 0x00,  // timecode 0
+      0x84,        // key frame, fixed-size lacing
+      0x02,        // 3 frames
+  };
+  for (uint8_t value : {0x11, 0x22, 0x33}) body = ebml::cat({body, Filled(10, value)});
+  body.push_back(0xEE);
+  body.push_back(0xEF);
+  return ebml::element(ebml::kSimpleBlock, body);
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    Laces, PlaybackLaceTest,
+    testing::Values(
+        LaceCase{"FixedLaceRemainder",
+                 OneCluster({FixedLaceWithRemainder(), ebml::simple_block(1, 10, ebml::kKeyFrame, {Filled(12, 0x55)})}),
+                 {Filled(10, 0x11), Filled(10, 0x22), Filled(10, 0x33), Filled(12, 0x55)}},
+        LaceCase{"EmptyFrameInLace",
+                 OneCluster({ebml::ebml_laced_block(1, 0, ebml::kKeyFrame, {Bytes{}, Filled(9, 0x44), Filled(5, 0x45)}),
+                             ebml::simple_block(1, 10, ebml::kKeyFrame, {Filled(12, 0x55)})}),
+                 {Filled(9, 0x44), Filled(5, 0x45), Filled(12, 0x55)}},
+        LaceCase{"EveryFrameEmpty",
+                 OneCluster({ebml::xiph_laced_block(1, 0, ebml::kKeyFrame, {Bytes{}, Bytes{}, Bytes{}}),
+                             ebml::simple_block(1, 10, ebml::kKeyFrame, {Filled(12, 0x55)})}),
+                 {Filled(12, 0x55)}}),
+    [](const testing::TestParamInfo<LaceCase>& info) { return info.param.name; });
 
 // An upstream that delivers a whole file, from its first Cluster, in one input
 // buffer headed by `properties` file-offset properties.
