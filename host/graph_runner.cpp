@@ -7,6 +7,7 @@
 #include <thread>
 
 #include "host/file_streamer.h"
+#include "host/graph_clock.h"
 #include "host/graph_setup.h"
 #include "host/input_streams.h"
 #include "host/memory_pools.h"
@@ -74,6 +75,13 @@ class Sink {
 
   void Finish() { run_->incomplete_frame = in_parts_; }
 
+  // After a seek or a scan took effect: a frame being put together is lost to the flush.
+  void Restart() {
+    in_parts_ = false;
+    last_part_ = false;
+    marked_ = false;
+  }
+
  private:
   void Property(uint32_t type, uint64_t value) {
     switch (type) {
@@ -84,6 +92,7 @@ class Sink {
         break;
       case kMmfPropTimeMarker:
         ++run_->time_markers;
+        marked_ = true;
         break;
       case kMmfPropSkipMark:
         ++run_->skip_marks;
@@ -106,7 +115,8 @@ class Sink {
   }
 
   void StartFrame() {
-    frame_ = RunFrame{time_, 0, 0};
+    frame_ = RunFrame{time_, 0, 0, marked_};
+    marked_ = false;
     adler_ = Adler32{};
   }
 
@@ -122,7 +132,7 @@ class Sink {
       --config_left_;
       Adler32 adler;
       if (options_.checksum) adler.Update(address, size);
-      run_->config.push_back(RunFrame{0, size, options_.checksum ? adler.Value() : 0});
+      run_->config.push_back(RunFrame{0, size, options_.checksum ? adler.Value() : 0, false});
       return;
     }
     if (!PointsIntoInput(handle, address, size)) ++run_->foreign_elements;
@@ -144,23 +154,36 @@ class Sink {
   uint32_t config_left_ = 0;
   bool in_parts_ = false;   // a frame announced by property 7 is being put together
   bool last_part_ = false;  // property 8 came: the next buffer element ends the frame
+  bool marked_ = false;     // a time marker came since the last frame started
   RunFrame frame_;
   Adler32 adler_;
 };
 
 void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun* run, const RunnerOptions& options,
-                uint32_t delay_us, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool) {
+                uint32_t delay_us, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool, PlaybackControl* playback) {
   Sink sink(run, options, config_pool, prefix_pool);
+  auto restart = [&] {
+    sink.Restart();
+    run->seeks.push_back(run->frames.size());
+  };
   int short_inputs = 0;
   for (;;) {
+    if (playback && playback->Checkpoint()) restart();
     MmfMra* mra = nullptr;
     int result = output->NextBuffer(channel, &mra);
     run->end_result = result;
     if (result == 4 && ++short_inputs < kMaxShortInputRetries) continue;  // delivery goes on
-    if (result != kMmfBufferDelivered || !mra) break;
+    if (result != kMmfBufferDelivered || !mra) {
+      if (playback && playback->AfterEnd()) {
+        restart();
+        continue;
+      }
+      break;
+    }
     short_inputs = 0;
     ++run->buffers;
     sink.Consume(mra);
+    if (playback && !run->frames.empty()) playback->Consumed(run->frames.back().time_us);
     if (options.on_buffer) options.on_buffer(options.user, run->index, mra);
     (void)MmfReleaseMra(mra);
     if (delay_us) std::this_thread::sleep_for(std::chrono::microseconds(delay_us));
@@ -198,6 +221,19 @@ const MmfMediaOutputOps* StreamerFromStartOps() {
     return copy;
   }();
   return &ops;
+}
+
+ControlTables ControlTablesOf(const Plugin& plugin) {
+  return ControlTables{plugin.Get<MmfMediaControlOps>("MediaControl"), plugin.Get<MmfMediaFlushOps>("MediaFlush"),
+                       plugin.converter(), plugin.seeker(), plugin.Get<MmfTrickPlayOps>("MediaTrickPlay")};
+}
+
+void SetControlResources(const Plugin& plugin, MmfFilterHandle* handle, const RunnerOptions& options) {
+  const AoResourceAccessOps* resources = plugin.resources();
+  if (!resources) return;
+  int32_t on = 1;
+  if (options.preroll) (void)resources->SetResource(handle, "EnablePreroll", &on);
+  if (options.trick_time_ms) (void)resources->SetResource(handle, "TrickTime", &options.trick_time_ms);
 }
 
 uint32_t InputBufferCount(uint32_t size) {
@@ -277,16 +313,35 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
     out.channels.push_back(std::move(run));
   }
 
+  GraphClock clock;
+  AttachGraphClock(handle->Graph, &clock);
   if (out.error.empty() && first_cluster >= 0) {
+    SetControlResources(plugin, handle, options);
     (void)control->Start(handle);
     if (!own_upstream) (void)streamer.Seek(static_cast<uint64_t>(first_cluster), 0);
+    std::unique_ptr<PlaybackControl> playback;
+    if (!own_upstream && (!options.actions.empty() || options.script)) {
+      playback = std::make_unique<PlaybackControl>(ControlTablesOf(plugin), handle, &streamer, &clock, acquired.size());
+    }
     std::vector<std::thread> sinks;
     for (size_t i = 0; i < acquired.size(); ++i) {
       uint32_t delay = i < options.sink_delay_us.size() ? options.sink_delay_us[i] : 0;
       sinks.emplace_back(SinkThread, output, acquired[i], &out.channels[i], std::cref(options), delay,
-                         config_pool.handle(), prefix_pool.handle());
+                         config_pool.handle(), prefix_pool.handle(), playback.get());
+    }
+    std::thread controller;
+    if (playback) {
+      controller = std::thread([&] {
+        if (options.script) {
+          options.script(*playback);
+        } else {
+          out.control_results = playback->Run(options.actions);
+        }
+        playback->Finish();
+      });
     }
     for (std::thread& sink : sinks) sink.join();
+    if (controller.joinable()) controller.join();
     (void)control->Stop(handle);
     out.ok = std::all_of(out.channels.begin(), out.channels.end(),
                          [](const ChannelRun& run) { return run.end_result == kMmfEndOfStream; });
@@ -296,6 +351,7 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
   }
   (void)flush->Flush(handle);
   for (MmfChannel* channel : acquired) (void)output->ReleaseOutputChannel(channel);
+  AttachGraphClock(handle->Graph, nullptr);
   out.bytes_read = streamer.bytes_read();
   return out;
 }

@@ -8,9 +8,11 @@
 // also check that each frame element points into an input buffer.
 
 #include <cstdint>
+#include <functional>
 #include <string>
 #include <vector>
 
+#include "host/playback_control.h"
 #include "host/plugin_loader.h"
 
 namespace host {
@@ -31,12 +33,19 @@ struct RunnerOptions {
   // and operations. It delivers from the first Cluster on.
   const MmfMediaOutputOps* upstream = nullptr;
   MmfChannel* upstream_output = nullptr;
+  // Playback control on a controller thread (file streamer only): the actions
+  // in order, or, when set, the script in their place.
+  std::vector<ControlAction> actions;
+  std::function<void(PlaybackControl&)> script;
+  bool preroll = false;       // sets "EnablePreroll"
+  int32_t trick_time_ms = 0;  // sets "TrickTime" when not 0
 };
 
 struct RunFrame {
   uint64_t time_us = 0;  // the last timestamp property before the frame
   uint32_t size = 0;
   uint32_t adler32 = 0;  // 0 when checksums are off
+  bool marked = false;   // a time marker (property 3) came since the frame before
 };
 
 struct ChannelRun {
@@ -45,6 +54,7 @@ struct ChannelRun {
   uint32_t fourcc = 0;
   std::vector<RunFrame> config;  // decoder-configuration packets (property 30)
   std::vector<RunFrame> frames;
+  std::vector<size_t> seeks;  // frames.size() when each control sequence took effect
   int end_result = 0;             // NextBuffer's last answer
   uint64_t buffers = 0;           // output media buffers consumed
   uint64_t skip_marks = 0;        // properties 37
@@ -59,6 +69,7 @@ struct RunResult {
   int rating = 0;
   std::vector<ChannelRun> channels;
   uint64_t bytes_read = 0;  // by the streamer
+  std::vector<int> control_results;  // the answer of each action
 };
 
 // Loads nothing: `plugin` is the loaded kelvane.so.

@@ -1,0 +1,94 @@
+#pragma once
+// The framework's control of a running parser graph: seeks and trick play
+// done to the plug-in, the streamer and the sinks in the framework's order.
+// Every sequence first stops the filter (which wakes every sink waiting for
+// room in the ring) and waits until each sink has parked, then works on a
+// quiet graph and starts it again:
+//  - seek to T: ConvertToPosition(T), Seek(T, position), the streamer moved to
+//    the position with a time marker of T, Flush; the clock reads T;
+//  - fast forward / rewind: ScanForward / ScanBackward (the streamer goes to
+//    list mode), Flush; ScanEnd: ScanEnd (back to normal streaming), Flush.
+// The graph clock follows the media time of the frames the sinks consume, so
+// a scan starts from "now".
+
+#include <condition_variable>
+#include <cstdint>
+#include <mutex>
+#include <vector>
+
+#include "platform/interfaces.h"
+
+namespace host {
+
+class FileStreamer;
+class GraphClock;
+
+struct ControlAction {
+  enum Kind { kSeek, kScanForward, kScanBackward, kScanEnd };
+  Kind kind = kSeek;
+  uint64_t at_us = 0;    // when the clock has reached this media time (or every sink is idle)
+  uint64_t time_us = 0;  // kSeek: where to
+  uint32_t speed = 0;    // scans
+};
+
+struct ControlTables {
+  const MmfMediaControlOps* control = nullptr;
+  const MmfMediaFlushOps* flush = nullptr;
+  const MmfTimeConverterOps* converter = nullptr;
+  const MmfSeekerOps* seeker = nullptr;
+  const MmfTrickPlayOps* trick = nullptr;
+};
+
+class PlaybackControl {
+ public:
+  PlaybackControl(const ControlTables& tables, MmfFilterHandle* handle, FileStreamer* streamer, GraphClock* clock,
+                  size_t sinks);
+
+  // The controller's side. Each answers the plug-in's first failing answer
+  // (a refused seek leaves the stream where it was), or 0.
+  int Seek(uint64_t time_us);
+  int ScanForward(uint32_t speed);
+  int ScanBackward(uint32_t speed);
+  int ScanEnd();
+  int Pause();
+  int Resume();
+  int Stop();
+  // Runs the actions in order, each when its time has come; their answers in order.
+  std::vector<int> Run(const std::vector<ControlAction>& actions);
+  // No sequence follows: sinks that have ended may finish.
+  void Finish();
+
+  // The sinks' side. Before each NextBuffer: parks while a sequence runs;
+  // true when one ran meanwhile (the sink drops a frame it was putting together).
+  bool Checkpoint();
+  // After NextBuffer answered anything but a delivery: waits for the next
+  // sequence (true: go on pulling) or for Finish (false: the sink ends).
+  bool AfterEnd();
+  // A sink consumed frames up to this media time.
+  void Consumed(uint64_t time_us);
+
+ private:
+  template <typename Work>
+  int Sequence(Work work);
+  bool Due(const ControlAction& action);
+
+  ControlTables tables_;
+  MmfFilterHandle* handle_;
+  FileStreamer* streamer_;
+  GraphClock* clock_;
+
+  std::mutex mutex_;
+  std::condition_variable changed_;
+  const size_t sinks_;
+  bool closed_ = false;     // a sequence runs: sinks park at their next checkpoint
+  bool finished_ = false;
+  uint64_t generation_ = 0;  // sequences completed
+  // Sinks that parked (in Checkpoint or AfterEnd) since the last sequence
+  // ended, and of those the ones waiting in AfterEnd; a sequence's end zeroes
+  // both, so a sink woken but not yet running is never taken for parked.
+  size_t parked_ = 0;
+  size_t idle_ = 0;
+  bool backward_ = false;    // a backward scan is on: actions are due as the clock falls
+};
+
+}  // namespace host
