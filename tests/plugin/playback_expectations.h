@@ -96,6 +96,21 @@ inline void CheckRun(const std::string& name, const FixtureExpectation& fixture,
     const uint64_t track = offered[static_cast<size_t>(run.index)];
     EXPECT_EQ(FirstDifference(Delivered(run), ExpectedFrames(name, fixture, track)), "") << "track " << track;
     EXPECT_EQ(run.foreign_elements, 0u) << "a frame element points outside the input buffers";
+    // The first buffer: the whole CodecPrivate, or the three Vorbis headers without their lacing.
+    for (const auto& t : fixture.tracks) {
+      if (t.number != track) continue;
+      uint64_t total = 0;
+      for (const host::RunFrame& packet : run.config) total += packet.size;
+      if (t.codec_private_size == 0) {
+        EXPECT_TRUE(run.config.empty());
+      } else if (t.codec == "A_VORBIS") {
+        EXPECT_EQ(run.config.size(), 3u);
+        EXPECT_LT(total, t.codec_private_size);
+      } else {
+        EXPECT_EQ(run.config.size(), 1u);
+        EXPECT_EQ(total, t.codec_private_size);
+      }
+    }
     EXPECT_FALSE(run.incomplete_frame);
   }
 }
