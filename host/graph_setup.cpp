@@ -37,9 +37,10 @@ void FilterGraph::ConfigureInput(const SetupOptions& options) {
   MmfChannel* channel = handle_->InputChannel;
   channel->Flags |= kChannelAcquiredFlag;  // the framework acquires the input channel
   input_format_result_ = media_input->SetInputFormat(channel, &input_format_);
-  if (options.upstream) (void)media_input->SetMediaOutput(channel, options.upstream);
+  channel->Peer = options.upstream_output;
+  if (options.upstream) media_output_result_ = media_input->SetMediaOutput(channel, options.upstream);
   if (options.upstream && options.input_pool && options.input_pool_param) {
-    (void)media_input->SetInputChannelMemoryPool(channel, options.input_pool, options.input_pool_param);
+    input_pool_result_ = media_input->SetInputChannelMemoryPool(channel, options.input_pool, options.input_pool_param);
   }
 }
 

@@ -20,6 +20,7 @@ struct SetupOptions {
   bool configure_outputs = true;  // acquire and configure the output channels
   // Each step below is skipped while its argument is null.
   const MmfMediaOutputOps* upstream = nullptr;  // SetMediaOutput
+  MmfChannel* upstream_output = nullptr;        // the input channel's Peer
   const MmfMemoryPoolOps* input_pool = nullptr;
   MmfMemoryPool* input_pool_param = nullptr;
   const MmfMemoryPoolOps* output_pool = nullptr;
@@ -48,7 +49,10 @@ class FilterGraph {
   bool rated() const { return rating_ == 80; }
   MmfFilterHandle* handle() const { return handle_; }
   const MmfMediaFormat& input_format() const { return input_format_; }
+  // The input channel's set-up answers; -1 for a step not taken.
   int input_format_result() const { return input_format_result_; }
+  int media_output_result() const { return media_output_result_; }
+  int input_pool_result() const { return input_pool_result_; }
   const std::vector<OutputChannelSetup>& outputs() const { return outputs_; }
 
  private:
@@ -62,6 +66,8 @@ class FilterGraph {
   int sniff_ = 0;
   int rating_ = 0;
   int input_format_result_ = -1;
+  int media_output_result_ = -1;
+  int input_pool_result_ = -1;
   std::vector<OutputChannelSetup> outputs_;
 };
 

@@ -14,13 +14,14 @@
 
 #include "filter/mkv_context.h"
 #include "filter/mkv_filter.h"
+#include "host/file_streamer.h"
 #include "host/graph_setup.h"
 #include "host/memory_pools.h"
 #include "tools/commands.h"
 
 namespace {
 
-constexpr uint32_t kOutputPoolBuffers = 4;
+constexpr uint32_t kPoolBuffers = 4;
 
 std::string FourCc(uint32_t code) {
   std::string text;
@@ -182,8 +183,16 @@ int RunProbe(int argc, char** argv) {
     return 1;
   }
 
+  // The input channel is connected to a file streamer over the same input,
+  // as in playback; probing only sets the connection up.
   host::SetupOptions options;
-  host::MemoryPool output_pool(options.buffer_size, kOutputPoolBuffers);
+  host::FileStreamer streamer(stream.get(), {options.buffer_size, kPoolBuffers});
+  host::MemoryPool input_pool(options.buffer_size, kPoolBuffers);
+  host::MemoryPool output_pool(options.buffer_size, kPoolBuffers);
+  options.upstream = host::FileStreamer::Ops();
+  options.upstream_output = streamer.output();
+  options.input_pool = host::MemoryPool::Ops();
+  options.input_pool_param = input_pool.handle();
   options.output_pool = host::MemoryPool::Ops();
   options.output_pool_param = output_pool.handle();
   host::FilterGraph graph(*plugin, *stream, options);
@@ -199,6 +208,11 @@ int RunProbe(int argc, char** argv) {
     out.Number("duration_resource", static_cast<int64_t>(DurationResource(*plugin, handle)));
     out.Number("byte_rate", AsMkvFilter(handle)->Context->ByteRate);
     out.Text("seekable", seeker && seeker->SeekQuery(handle) == 2 ? "yes" : "no");
+    out.Open("input");
+    out.Number("set_format", graph.input_format_result());
+    out.Number("set_media_output", graph.media_output_result());
+    out.Number("set_pool", graph.input_pool_result());
+    out.Close();
     out.Open("channels", true);
     for (size_t k = 0; k < graph.outputs().size(); ++k) PrintChannel(out, graph.outputs()[k], k);
     out.Close(true);

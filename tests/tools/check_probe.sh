@@ -61,6 +61,7 @@ expect "pipe exit code" 0 $?
 expect "pipe rating" 80 "$(sed -n 's/^rating: //p' <<<"$piped")"
 expect "pipe seekable" no "$(sed -n 's/^seekable: //p' <<<"$piped")"
 expect "file seekable" yes "$(sed -n 's/^seekable: //p' <<<"$file")"
+expect "input channel set-up" "0 0 0" "$(sed -n 's/^  set_[a-z_]*: //p' <<<"$piped" | tr '\n' ' ' | sed 's/ $//')"
 expect "pipe channels" "$(sed -n '/^channels:/,$p' <<<"$file")" "$(sed -n '/^channels:/,$p' <<<"$piped")"
 
 echo "$failures mismatches"
