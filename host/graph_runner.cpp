@@ -19,7 +19,6 @@ namespace {
 
 constexpr uint32_t kPrefixBufferSize = 4096;
 constexpr uint32_t kPrefixBuffers = 16;
-constexpr uint32_t kConfigBufferSize = 65536;
 constexpr uint32_t kConfigBuffers = 8;
 // Input buffers referenced at once: the ring's 39 plus what output media
 // buffers still point into; small buffers need many.
@@ -183,7 +182,7 @@ void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun
     short_inputs = 0;
     ++run->buffers;
     sink.Consume(mra);
-    if (playback && !run->frames.empty()) playback->Consumed(run->frames.back().time_us);
+    if (playback && !run->frames.empty() && playback->Consumed(run->frames.back().time_us)) restart();
     if (options.on_buffer) options.on_buffer(options.user, run->index, mra);
     (void)MmfReleaseMra(mra);
     if (delay_us) std::this_thread::sleep_for(std::chrono::microseconds(delay_us));
@@ -260,7 +259,7 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
   }
 
   MemoryPool prefix_pool(kPrefixBufferSize, kPrefixBuffers);
-  MemoryPool config_pool(kConfigBufferSize, kConfigBuffers);
+  MemoryPool config_pool(options.config_buffer_size, kConfigBuffers);
   FileStreamer streamer(source.get(), StreamerConfig{options.input_buffer_size,
                                                      InputBufferCount(options.input_buffer_size)});
   SetupOptions setup;

@@ -25,6 +25,7 @@ struct RunnerOptions {
   // sleeps after each output buffer; missing entries are 0.
   std::vector<uint32_t> sink_delay_us;
   bool checksum = true;  // Adler-32 of every frame
+  uint32_t config_buffer_size = 65536;  // bytes of an output pool buffer (decoder configurations)
   // Called on a sink's thread once per output buffer it consumed, before the
   // buffer goes back; the buffer's elements are readable.
   void (*on_buffer)(void* user, int32_t channel, MmfMra* buffer) = nullptr;

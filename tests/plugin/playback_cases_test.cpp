@@ -17,6 +17,7 @@
 #include "tests/support/block_builder.h"
 #include "tests/support/cluster_driver.h"
 #include "tests/support/fixtures.h"
+#include "tests/support/log_recorder.h"
 
 namespace {
 
@@ -171,6 +172,17 @@ INSTANTIATE_TEST_SUITE_P(
                              ebml::simple_block(1, 10, ebml::kKeyFrame, {Filled(12, 0x55)})}),
                  {Filled(12, 0x55)}}),
     [](const testing::TestParamInfo<LaceCase>& info) { return info.param.name; });
+
+TEST(PlaybackCasesTest, DecoderConfigurationLargerThanTheOutputBufferEndsTheChannelWithAnError) {
+  testing_support::LogRecorder log;
+  host::RunnerOptions options;
+  options.config_buffer_size = 4096;  // flac's CodecPrivate is 8256 bytes
+  host::RunResult result = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile("flac"), options);
+  ASSERT_EQ(result.channels.size(), 1u);
+  EXPECT_EQ(result.channels[0].end_result, 1);
+  EXPECT_EQ(result.channels[0].buffers, 0u);
+  EXPECT_TRUE(log.Contains(2, "kelvane:  decoder config of size 8256 too large to fit in IOV."));
+}
 
 // An upstream that delivers a whole file, from its first Cluster, in one input
 // buffer headed by `properties` file-offset properties.
