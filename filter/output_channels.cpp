@@ -60,7 +60,13 @@ int ReleaseOutputChannel(MkvChannel* channel) {
 
   MkvContext* context = channel->Filter->Context;
   MkvChannelState* state = channel->State;
-  if (state->ConfigBuffer && context->InputPool) (void)context->InputPool->ReleaseBuffer(state->ConfigBuffer);
+  // The frame prefix was written through the CPU, so it goes back as a mapped
+  // buffer. The pointer is cleared too: a later acquisition must not reuse or
+  // release again a buffer the pool may already have handed to someone else.
+  if (state->ConfigBuffer && context->InputPool) {
+    (void)context->InputPool->ReleaseMappedBuffer(state->ConfigBuffer);
+    state->ConfigBuffer = nullptr;
+  }
   if (state->MraPool) {
     (void)MmfFreeMraPool(state->MraPool);
     state->MraPool = nullptr;

@@ -94,6 +94,31 @@ TEST(OutputChannelOrderTest, NullArgumentsAnswer22) {
   EXPECT_EQ(ops.IterateOutputChannels(nullptr, &iterator), nullptr);
 }
 
+TEST(OutputChannelOrderTest, ReleaseGivesTheFramePrefixBufferBackOnce) {
+  const MmfMediaOutputOps& ops = *HostPlugin().output();
+  host::MemoryPool input_pool(64, 2);
+  static const MmfMediaOutputOps upstream{};
+  Connected c = Unconfigured();
+  MmfChannel* input = c.graph->handle()->InputChannel;
+  input->Flags |= 1u;
+  ASSERT_EQ(HostPlugin().input()->SetMediaOutput(input, &upstream), 0);
+  ASSERT_EQ(HostPlugin().input()->SetInputChannelMemoryPool(input, host::MemoryPool::Ops(), input_pool.handle()), 0);
+  MmfChannel* channel = AsFrameworkChannel(&c.channel(0));
+  for (int round = 0; round < 2; ++round) {
+    SCOPED_TRACE(round);
+    ASSERT_EQ(ops.AcquireOutputChannel(channel), 0);
+    if (round == 0) {
+      MmfPoolBuffer* prefix = nullptr;
+      ASSERT_EQ(host::MemoryPool::Ops()->AcquireBuffer(input_pool.handle(), &prefix, 0), 0);
+      host::MemoryPool::Ops()->MapBuffer(prefix);
+      c.channel(0).State->ConfigBuffer = prefix;
+    }
+    ASSERT_EQ(ops.ReleaseOutputChannel(channel), 0);
+    EXPECT_EQ(input_pool.FreeCount(), 2u);
+    EXPECT_EQ(c.channel(0).State->ConfigBuffer, nullptr);
+  }
+}
+
 TEST(OutputChannelListTest, ChannelsAndFormatsAreListedOncePerChannelIndex) {
   const MmfMediaOutputOps& ops = *HostPlugin().output();
   Connected c = Unconfigured();
