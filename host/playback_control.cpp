@@ -39,6 +39,7 @@ int PlaybackControl::Sequence(Work work) {
     ++generation_;
     parked_ = 0;  // the parked sinks belong to the sequence just done; they count no more
     idle_ = 0;
+    holding_ = 0;
   }
   changed_.notify_all();
   return result;
@@ -96,7 +97,8 @@ int PlaybackControl::Stop() {
 }
 
 bool PlaybackControl::Due(const ControlAction& action) {
-  if (idle_ == sinks_) return true;
+  // A held sink may keep another waiting for room in the ring: its time has come.
+  if (idle_ == sinks_ || holding_ > 0) return true;
   const uint64_t now = clock_->Now();
   return backward_ ? now <= action.at_us : now >= action.at_us;
 }
@@ -106,7 +108,9 @@ std::vector<int> PlaybackControl::Run(const std::vector<ControlAction>& actions)
   for (const ControlAction& action : actions) {
     {
       std::unique_lock lock(mutex_);
+      pending_at_ = action.at_us;
       while (!Due(action)) changed_.wait_for(lock, kPoll);
+      pending_at_ = UINT64_MAX;
     }
     switch (action.kind) {
       case ControlAction::kSeek:
@@ -157,6 +161,16 @@ bool PlaybackControl::AfterEnd() {
   return false;
 }
 
-void PlaybackControl::Consumed(uint64_t time_us) { clock_->Consumed(time_us); }
+bool PlaybackControl::Consumed(uint64_t time_us) {
+  clock_->Consumed(time_us);
+  std::unique_lock lock(mutex_);
+  if (backward_ || time_us < pending_at_) return false;
+  const uint64_t generation = generation_;
+  ++parked_;
+  ++holding_;
+  changed_.notify_all();
+  changed_.wait(lock, [&] { return generation_ != generation; });
+  return true;
+}
 
 }  // namespace host

@@ -64,8 +64,11 @@ class PlaybackControl {
   // After NextBuffer answered anything but a delivery: waits for the next
   // sequence (true: go on pulling) or for Finish (false: the sink ends).
   bool AfterEnd();
-  // A sink consumed frames up to this media time.
-  void Consumed(uint64_t time_us);
+  // A sink consumed frames up to this media time. While Run waits for an
+  // action whose time this reaches, the sink parks until the action is done
+  // (true: the sink drops a frame it was putting together), so playback
+  // never runs past the point an action was asked for.
+  bool Consumed(uint64_t time_us);
 
  private:
   template <typename Work>
@@ -88,7 +91,9 @@ class PlaybackControl {
   // both, so a sink woken but not yet running is never taken for parked.
   size_t parked_ = 0;
   size_t idle_ = 0;
+  size_t holding_ = 0;  // of those, the ones held in Consumed at a pending action's time
   bool backward_ = false;    // a backward scan is on: actions are due as the clock falls
+  uint64_t pending_at_ = UINT64_MAX;  // Run's next action waits for this time; UINT64_MAX: none
 };
 
 }  // namespace host

@@ -22,6 +22,7 @@
 #include "host/plugin_loader.h"
 #include "stream/mkvvstream.h"
 #include "tools/commands.h"
+#include "tools/control_options.h"
 
 namespace {
 
@@ -40,6 +41,8 @@ int Usage(FILE* out, int code) {
                "  --channels     output channels to acquire, by index (default: all)\n"
                "  --json         one JSON document instead of lines\n"
                "  --no-hash      no Adler-32 of the frames\n");
+  std::fprintf(out, "playback control (lines mode prints \"CHANNEL TRACK seek\" where each took effect):\n%s",
+               kControlUsage);
   return code;
 }
 
@@ -59,6 +62,10 @@ int ParseOptions(int argc, char** argv, Options* options) {
   for (int i = 0; i < argc; ++i) {
     const char* arg = argv[i];
     if (!std::strcmp(arg, "--help")) return Usage(stdout, 0);
+    if (int taken = ParseControlOption(argc, argv, &i, &options->run); taken != 0) {
+      if (taken < 0) return Usage(stderr, 2);
+      continue;
+    }
     if (!std::strcmp(arg, "--json")) {
       options->json = true;
     } else if (!std::strcmp(arg, "--no-hash")) {
@@ -123,11 +130,17 @@ void PrintLines(const host::RunResult& result, const std::vector<uint64_t>& trac
     }
   }
   for (const host::ChannelRun& run : result.channels) {
-    for (const host::RunFrame& frame : run.frames) {
+    size_t next_seek = 0;
+    for (size_t i = 0; i < run.frames.size(); ++i) {
+      const host::RunFrame& frame = run.frames[i];
+      for (; next_seek < run.seeks.size() && run.seeks[next_seek] == i; ++next_seek) {
+        std::printf("%d %" PRIu64 " seek\n", run.index, track_of(run));
+      }
       std::printf("%d %" PRIu64 " %" PRIu64 " %u", run.index, track_of(run), frame.time_us, frame.size);
       if (hash) std::printf(" %08x", frame.adler32);
       std::printf("\n");
     }
+    for (; next_seek < run.seeks.size(); ++next_seek) std::printf("%d %" PRIu64 " seek\n", run.index, track_of(run));
   }
 }
 
@@ -174,6 +187,11 @@ int RunPackets(int argc, char** argv) {
   if (!result.ok) {
     std::fprintf(stderr, "kelvane: '%s': %s\n", options.file, result.error.c_str());
     return 1;
+  }
+  for (size_t k = 0; k < result.control_results.size(); ++k) {
+    if (result.control_results[k] != 0) {
+      std::fprintf(stderr, "kelvane: control action %zu answered %d\n", k + 1, result.control_results[k]);
+    }
   }
   std::vector<uint64_t> tracks = OfferedTracks(options.file);
   if (options.json) {

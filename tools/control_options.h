@@ -1,0 +1,17 @@
+#pragma once
+// The playback-control options that `kelvane packets` takes, turned into the
+// graph runner's control actions. Times are seconds (fractions allowed); AT
+// is the media time of playback at which the action is taken (0: at once).
+//   --seek TIME[@AT]   seek to TIME (repeatable)
+//   --ff SPEED[@AT]    fast forward; --rew SPEED[@AT] rewind
+//   --scan-end AT      back to normal playback
+//   --preroll          the "EnablePreroll" resource
+//   --trick-time MS    the "TrickTime" resource
+
+#include "host/graph_runner.h"
+
+extern const char kControlUsage[];
+
+// 1 when argv[*i] (and the value it takes) was a control option, with *i on
+// its last word; 0 when it is none; -1 when its value is malformed.
+int ParseControlOption(int argc, char** argv, int* i, host::RunnerOptions* run);
