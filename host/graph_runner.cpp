@@ -162,7 +162,7 @@ void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun
                 uint32_t delay_us, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool, PlaybackControl* playback) {
   Sink sink(run, options, config_pool, prefix_pool);
   auto restart = [&] {
-    sink.Restart();
+    if (playback->Flushed()) sink.Restart();
     run->seeks.push_back(run->frames.size());
   };
   int short_inputs = 0;

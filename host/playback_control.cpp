@@ -31,6 +31,7 @@ int PlaybackControl::Sequence(Work work) {
     std::unique_lock lock(mutex_);
     changed_.wait(lock, [this] { return parked_ == sinks_; });
   }
+  flushed_ = false;
   const int result = work();
   (void)tables_.control->Start(handle_);
   {
@@ -53,6 +54,7 @@ int PlaybackControl::Seek(uint64_t time_us) {
     result = tables_.seeker->Seek(handle_, 0, time_us, position);
     (void)streamer_->Seek(position, time_us);
     (void)tables_.flush->Flush(handle_);
+    flushed_ = true;
     clock_->Consumed(time_us);
     backward_ = false;
     return result;
@@ -63,6 +65,7 @@ int PlaybackControl::ScanForward(uint32_t speed) {
   return Sequence([&] {
     int result = tables_.trick->ScanForward(handle_, speed);
     (void)tables_.flush->Flush(handle_);
+    flushed_ = true;
     backward_ = false;
     return result;
   });
@@ -72,6 +75,7 @@ int PlaybackControl::ScanBackward(uint32_t speed) {
   return Sequence([&] {
     int result = tables_.trick->ScanBackward(handle_, speed);
     (void)tables_.flush->Flush(handle_);
+    flushed_ = true;
     backward_ = true;
     return result;
   });
@@ -81,6 +85,7 @@ int PlaybackControl::ScanEnd() {
   return Sequence([&] {
     int result = tables_.trick->ScanEnd(handle_);
     (void)tables_.flush->Flush(handle_);
+    flushed_ = true;
     backward_ = false;
     return result;
   });
@@ -159,6 +164,11 @@ bool PlaybackControl::AfterEnd() {
   --parked_;
   --idle_;
   return false;
+}
+
+bool PlaybackControl::Flushed() {
+  std::lock_guard lock(mutex_);
+  return flushed_;
 }
 
 bool PlaybackControl::Consumed(uint64_t time_us) {

@@ -59,14 +59,18 @@ class PlaybackControl {
   void Finish();
 
   // The sinks' side. Before each NextBuffer: parks while a sequence runs;
-  // true when one ran meanwhile (the sink drops a frame it was putting together).
+  // true when one ran meanwhile.
   bool Checkpoint();
   // After NextBuffer answered anything but a delivery: waits for the next
   // sequence (true: go on pulling) or for Finish (false: the sink ends).
+  // After each true answer of these three the sink asks Flushed.
   bool AfterEnd();
+  // Whether the last sequence flushed the filter (a refused seek does not):
+  // only then is a frame being put together lost.
+  bool Flushed();
   // A sink consumed frames up to this media time. While Run waits for an
   // action whose time this reaches, the sink parks until the action is done
-  // (true: the sink drops a frame it was putting together), so playback
+  // (true), so playback
   // never runs past the point an action was asked for.
   bool Consumed(uint64_t time_us);
 
@@ -94,6 +98,7 @@ class PlaybackControl {
   size_t holding_ = 0;  // of those, the ones held in Consumed at a pending action's time
   bool backward_ = false;    // a backward scan is on: actions are due as the clock falls
   uint64_t pending_at_ = UINT64_MAX;  // Run's next action waits for this time; UINT64_MAX: none
+  bool flushed_ = false;  // written by a sequence's work while every sink is parked
 };
 
 }  // namespace host
