@@ -1,4 +1,4 @@
-// Control states and trick play through the plug-in's tables. Scans drive a
+// Trick play through the plug-in's tables. Scans drive a
 // real file streamer in list mode: every request it reads (time marker, file
 // offset, bytes) must be the cue point that long_cues.cues leads to.
 
@@ -20,41 +20,7 @@ using plugin_test::HostPlugin;
 
 constexpr uint32_t kBufferSize = 1024;
 
-const MmfMediaControlOps& Control() { return *HostPlugin().Get<MmfMediaControlOps>("MediaControl"); }
 const MmfTrickPlayOps& Trick() { return *HostPlugin().Get<MmfTrickPlayOps>("MediaTrickPlay"); }
-
-struct ControlCase {
-  const char* operation;
-  uint32_t before;
-  int answer;
-  uint32_t after;
-};
-
-TEST(ControlStateTest, EachOperationMovesTheStateAndAnswers) {
-  const ControlCase cases[] = {
-      {"Start", 16, 0, 64},   {"Start", 0, 0, 64},    {"Resume", 64, 0, 256}, {"Pause", 256, 0, 64},
-      {"Pause", 4, 0, 64},    {"Pause", 1, 0, 64},    {"Pause", 1024, 0, 64}, {"Pause", 16, 0, 16},
-      {"Pause", 64, 0, 64},   {"Pause", 0, 0, 0},     {"Stop", 64, 0, 16},    {"Stop", 1, 4041, 16},
-      {"Stop", 16, 0, 16},    {"Stop", 4, 0, 16},     {"Status", 256, 256, 256}, {"Status", 1, 1, 1},
-  };
-  plugin_test::Connected c = plugin_test::ConnectFile("long_cues");
-  ASSERT_TRUE(c.graph->rated());
-  EXPECT_EQ(c.context()->ControlState, 16u) << "rating leaves the filter stopped";
-  MmfFilterHandle* handle = c.graph->handle();
-  for (const ControlCase& k : cases) {
-    SCOPED_TRACE(std::string(k.operation) + " from " + std::to_string(k.before));
-    c.context()->ControlState = k.before;
-    const std::string op = k.operation;
-    int answer = op == "Start"    ? Control().Start(handle)
-                 : op == "Resume" ? Control().Resume(handle)
-                 : op == "Pause"  ? Control().Pause(handle)
-                 : op == "Stop"   ? Control().Stop(handle)
-                                  : Control().Status(handle);
-    EXPECT_EQ(answer, k.answer);
-    EXPECT_EQ(c.context()->ControlState, k.after);
-  }
-  EXPECT_EQ(Trick().TrickQuery(handle), 8);
-}
 
 // One request as the streamer read it: the time marker heading its first
 // buffer, that buffer's file offset, and the bytes read until the next marker.
@@ -321,6 +287,7 @@ TEST_F(TrickPlayTest, WithoutAGraphClockEveryScanFailsAndSaysSo) {
     EXPECT_TRUE(log.Contains(2, std::string("kelvane: ") + op + " failed to get current time.")) << op;
   }
   EXPECT_EQ(context()->TrickMode, 0u);
+  EXPECT_EQ(Trick().TrickQuery(handle_), 8);
 }
 
 }  // namespace
