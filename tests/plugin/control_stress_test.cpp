@@ -1,4 +1,4 @@
-// Two channel threads at different paces and a controller thread that seeks,
+// Channel threads at different paces and a controller thread that seeks,
 // pauses and resumes at random moments (fixed seeds, bounded rounds), then
 // stops: nothing hangs, and between two seeks each channel delivers its
 // track's frames without loss, repetition or reordering, from the first frame
@@ -24,11 +24,11 @@ struct Listed {
   size_t block;
 };
 
-constexpr uint64_t kCueTrack = 1;  // long_cues: every cue point names the video track
+constexpr uint64_t kCueTrack = 1;  // every cue point of these fixtures names the video track
 
 class StressFixture {
  public:
-  StressFixture() : expect_(testing_support::LoadFixture("long_cues")) {
+  explicit StressFixture(const std::string& name) : expect_(testing_support::LoadFixture(name)) {
     const uint64_t scale = expect_.timecode_scale / 1000;
     for (size_t b = 0; b < expect_.blocks.size(); ++b) {
       for (const auto& frame : expect_.blocks[b].frames) {
@@ -77,22 +77,28 @@ bool SameFrame(const host::RunFrame& got, const Listed& want) {
   return got.time_us == want.time_us && got.size == want.size && got.adler32 == want.adler32;
 }
 
-class ControlStressTest : public testing::TestWithParam<uint32_t> {};
+struct StressCase {
+  const char* file;
+  uint32_t seed;
+  uint64_t seek_range_us;  // seek targets fall in [0, this)
+};
+
+class ControlStressTest : public testing::TestWithParam<StressCase> {};
 
 TEST_P(ControlStressTest, RandomSeeksPausesAndAStopNeitherHangNorLoseFrames) {
-  StressFixture fx;
+  const StressCase& c = GetParam();
+  StressFixture fx(c.file);
   std::vector<uint64_t> targets;
   host::RunnerOptions options;
   options.input_buffer_size = 2048;  // many buffers: the ring fills and the faster channel waits
-  options.sink_delay_us = {0, 200};
-  const uint32_t seed = GetParam();
-  options.script = [&targets, seed](host::PlaybackControl& control) {
-    std::mt19937 random(seed);
+  options.sink_delay_us = {0, 200, 50, 0};
+  options.script = [&targets, &c](host::PlaybackControl& control) {
+    std::mt19937 random(c.seed);
     for (int round = 0; round < 30; ++round) {
       switch (random() % 4) {
         case 0:
         case 1:
-          targets.push_back(random() % 26000000);
+          targets.push_back(random() % c.seek_range_us);
           EXPECT_EQ(control.Seek(targets.back()), 0);
           break;
         case 2:
@@ -106,14 +112,15 @@ TEST_P(ControlStressTest, RandomSeeksPausesAndAStopNeitherHangNorLoseFrames) {
     }
     (void)control.Stop();
   };
-  host::RunResult result = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile("long_cues"), options);
-  ASSERT_EQ(result.channels.size(), 2u) << result.error;
+  host::RunResult result = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(c.file), options);
+  ASSERT_EQ(result.channels.size(), c.file == std::string("long_cues") ? 2u : 4u) << result.error;
   for (const host::ChannelRun& run : result.channels) {
     SCOPED_TRACE(run.name);
     const uint64_t track = uint64_t(run.index) + 1;
     const std::vector<Listed>& listed = fx.track(track);
     EXPECT_TRUE(run.end_result == kMmfEndOfStream || run.end_result == 16) << run.end_result;
     EXPECT_EQ(run.foreign_elements, 0u);
+    EXPECT_FALSE(run.frames.empty());
     ASSERT_EQ(run.seeks.size(), targets.size());
     for (size_t k = 0; k <= targets.size(); ++k) {
       const size_t from = k == 0 ? 0 : run.seeks[k - 1];
@@ -129,6 +136,10 @@ TEST_P(ControlStressTest, RandomSeeksPausesAndAStopNeitherHangNorLoseFrames) {
   }
 }
 
-INSTANTIATE_TEST_SUITE_P(Seeds, ControlStressTest, testing::Values(1u, 7u, 2026u));
+// long_cues: two channels, 50 cue points; multi_audio: four channels, two cue points.
+INSTANTIATE_TEST_SUITE_P(Seeds, ControlStressTest,
+                         testing::Values(StressCase{"long_cues", 1, 26000000}, StressCase{"long_cues", 7, 26000000},
+                                         StressCase{"long_cues", 2026, 26000000},
+                                         StressCase{"multi_audio", 3, 2500000}));
 
 }  // namespace
