@@ -9,7 +9,7 @@ constexpr uint32_t kControlError = 1;
 int SetState(MkvFilter* filter, uint32_t state) {
   MkvContext* context = filter->Context;
   if (int error = pthread_mutex_lock(&context->StateLock); error != 0) return error;
-  context->ControlState = state;
+  StoreControlState(context, state);
   pthread_mutex_unlock(&context->StateLock);
   return 0;
 }
@@ -23,7 +23,7 @@ int Resume(MkvFilter* filter) { return SetState(filter, kControlResumed); }
 int Pause(MkvFilter* filter) {
   MkvContext* context = filter->Context;
   if (int error = pthread_mutex_lock(&context->StateLock); error != 0) return error;
-  if (context->ControlState & kControlPausableMask) context->ControlState = kControlRunning;
+  if (context->ControlState & kControlPausableMask) StoreControlState(context, kControlRunning);
   pthread_mutex_unlock(&context->StateLock);
   return 0;
 }
@@ -45,7 +45,7 @@ int Stop(MkvFilter* filter) {
   }
   int result = context->ControlState == kControlError ? kStopAfterError : 0;
   pthread_mutex_lock(&context->RingLock);
-  context->ControlState = kControlStopped;
+  StoreControlState(context, kControlStopped);
   pthread_cond_broadcast(&context->RingCond);
   pthread_mutex_unlock(&context->RingLock);
   pthread_mutex_unlock(&context->StateLock);

@@ -82,3 +82,14 @@ struct MkvContext {
   AoResource* Resources;  // owned: this instance's table
   MmfEventPost EventPost;
 };
+
+// ControlState is written under StateLock, but WaitForPool reads it holding
+// only RingLock (a waiting channel must see Stop without taking StateLock,
+// which would break the lock order). Every write and that read are atomic
+// word accesses, so the reader always sees a whole, recent value.
+inline uint32_t LoadControlState(const MkvContext* context) {
+  return __atomic_load_n(&context->ControlState, __ATOMIC_RELAXED);
+}
+inline void StoreControlState(MkvContext* context, uint32_t state) {
+  __atomic_store_n(&context->ControlState, state, __ATOMIC_RELAXED);
+}

@@ -42,7 +42,7 @@ int EndWith(Call& call, int result) {
   MkvContext* context = call.context;
   if (result != kMmfEndOfStream) {
     pthread_mutex_lock(&context->StateLock);
-    if (context->ControlState != kControlStopped) context->ControlState = static_cast<uint32_t>(result);
+    if (context->ControlState != kControlStopped) StoreControlState(context, static_cast<uint32_t>(result));
     pthread_mutex_unlock(&context->StateLock);
   }
   if (call.state->OutMra) (void)MmfReleaseMra(call.state->OutMra);

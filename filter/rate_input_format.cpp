@@ -131,7 +131,7 @@ int RateInputFormat(MkvChannel* input, const MmfMediaFormat* format, uint32_t re
     if (!SeekInput(stream, 0)) return kRatingRefused;
     context->Seekable = 1;
   }
-  context->ControlState = kControlStopped;
+  StoreControlState(context, kControlStopped);
   if (!ParseHeaders(context, stream, *format)) return kRatingRefused;
 
   uint32_t graph_flags = 0;

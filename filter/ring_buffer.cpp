@@ -68,7 +68,7 @@ int WaitForPool(MkvContext* context) {
   for (;;) {
     const int32_t head = context->RingHead;
     if (!RingFull(context)) return kWaitRoom;
-    if (context->ControlState == kControlStopped) return kWaitGaveUp;
+    if (LoadControlState(context) == kControlStopped) return kWaitGaveUp;
     if (pthread_cond_wait(&context->RingCond, &context->RingLock) != 0) return kWaitGaveUp;
     if (context->RingHead != head) return kWaitAdded;
   }

@@ -140,6 +140,9 @@ TEST_P(ControlStressTest, RandomSeeksPausesAndAStopNeitherHangNorLoseFrames) {
 INSTANTIATE_TEST_SUITE_P(Seeds, ControlStressTest,
                          testing::Values(StressCase{"long_cues", 1, 26000000}, StressCase{"long_cues", 7, 26000000},
                                          StressCase{"long_cues", 2026, 26000000},
-                                         StressCase{"multi_audio", 3, 2500000}));
+                                         StressCase{"multi_audio", 3, 2500000}),
+                         [](const testing::TestParamInfo<StressCase>& info) {
+                           return std::string(info.param.file) + "_seed" + std::to_string(info.param.seed);
+                         });
 
 }  // namespace
