@@ -6,7 +6,8 @@
 
 const char kControlUsage[] =
     "  --seek TIME[@AT]  seek to TIME seconds once playback reaches AT seconds (repeatable)\n"
-    "  --ff SPEED[@AT]   fast forward at SPEED from AT; --rew SPEED[@AT] rewind\n"
+    "  --ff SPEED[@AT]   fast forward from AT; SPEED in percent (400: skip 4 x TrickTime per jump)\n"
+    "  --rew SPEED[@AT]  rewind likewise\n"
     "  --scan-end AT     end the scan once playback reaches AT seconds\n"
     "  --preroll         deliver the blocks before a seek's time, marked (EnablePreroll)\n"
     "  --trick-time MS   milliseconds of media delivered at each trick-play jump (TrickTime)\n";
