@@ -4,36 +4,17 @@
 // loads it: from --plugin, else kelvane.so in the directory of this executable
 // (the build puts it there).
 
-#include <dlfcn.h>
-#include <unistd.h>
-
 #include <cinttypes>
 #include <cstdio>
 #include <cstring>
 #include <string>
 
 #include "host/input_streams.h"
+#include "host/plugin_loader.h"
 #include "platform/interfaces.h"
 #include "tools/commands.h"
 
 namespace {
-
-std::string DefaultPluginPath() {
-  char self[4096];
-  ssize_t length = readlink("/proc/self/exe", self, sizeof self - 1);
-  if (length <= 0) return "kelvane.so";
-  std::string path(self, static_cast<size_t>(length));
-  size_t slash = path.rfind('/');
-  return (slash == std::string::npos ? std::string(".") : path.substr(0, slash)) + "/kelvane.so";
-}
-
-const MmfMetadataParserOps* FindMetadataParser(void* library) {
-  const auto* rows = static_cast<const AoInterface*>(dlsym(library, AO_INTERFACES_SYMBOL));
-  for (const AoInterface* row = rows; row && row->Name; ++row) {
-    if (std::strcmp(row->Name, "MediaMetadataParser") == 0) return static_cast<const MmfMetadataParserOps*>(row->Interface);
-  }
-  return nullptr;
-}
 
 void PrintType(uint32_t type) {
   std::printf("%c%c%c%c", static_cast<char>(type >> 24), static_cast<char>(type >> 16), static_cast<char>(type >> 8),
@@ -65,7 +46,7 @@ int Usage() {
 }  // namespace
 
 int RunMetadata(int argc, char** argv) {
-  std::string plugin_path = DefaultPluginPath();
+  std::string plugin_path = host::PluginBesideExecutable();
   const char* file = nullptr;
   for (int i = 0; i < argc; ++i) {
     if (!std::strcmp(argv[i], "--plugin") && i + 1 < argc) {
@@ -78,12 +59,13 @@ int RunMetadata(int argc, char** argv) {
   }
   if (!file) return Usage();
 
-  void* library = dlopen(plugin_path.c_str(), RTLD_NOW | RTLD_LOCAL);
-  if (!library) {
-    std::fprintf(stderr, "kelvane: cannot load the plug-in %s: %s\n", plugin_path.c_str(), dlerror());
+  std::string error;
+  auto plugin = host::Plugin::Load(plugin_path, &error);
+  if (!plugin) {
+    std::fprintf(stderr, "kelvane: cannot load the plug-in %s: %s\n", plugin_path.c_str(), error.c_str());
     return 1;
   }
-  const MmfMetadataParserOps* parser = FindMetadataParser(library);
+  const auto* parser = plugin->Get<MmfMetadataParserOps>("MediaMetadataParser");
   if (!parser) {
     std::fprintf(stderr, "kelvane: %s has no MediaMetadataParser interface\n", plugin_path.c_str());
     return 1;
