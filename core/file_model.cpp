@@ -29,7 +29,16 @@ void free_cue_point(mkv_cue_point* point) {
   mem_free(point);
 }
 
-void free_track(mkv_track_info& track) {
+
+}  // namespace
+
+void free_cue_points(mkv_queue* cue_points) {
+  free_queue<mkv_cue_point>(*cue_points, free_cue_point);
+  *cue_points = mkv_queue{};
+}
+
+void free_mkv_track_info(mkv_track_info* record) {
+  mkv_track_info& track = *record;
   free_field(track.codec_id);
   free_field(track.codec_name);
   free_field(track.language);
@@ -44,13 +53,6 @@ void free_track(mkv_track_info& track) {
     free_field(encoding.sig_key_id);
     free_field(encoding.signature);
   }
-}
-
-}  // namespace
-
-void free_cue_points(mkv_queue* cue_points) {
-  free_queue<mkv_cue_point>(*cue_points, free_cue_point);
-  *cue_points = mkv_queue{};
 }
 
 void destroy_mkv_file_info(mkv_file_info* info) {
@@ -81,5 +83,5 @@ void destroy_mkv_file_info(mkv_file_info* info) {
   free_field(info->writing_app);
 
   uint32_t tracks = info->track_count < kMaxTracks ? info->track_count : kMaxTracks;
-  for (uint32_t i = 0; i < tracks; ++i) free_track(info->tracks[i]);
+  for (uint32_t i = 0; i < tracks; ++i) free_mkv_track_info(&info->tracks[i]);
 }

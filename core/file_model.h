@@ -108,6 +108,9 @@ void destroy_mkv_file_info(mkv_file_info* info);
 // and leaves the list empty.
 void free_cue_points(mkv_queue* cue_points);
 
+// Frees the strings and payloads one track record owns (not the record).
+void free_mkv_track_info(mkv_track_info* track);
+
 // Offsets of the Info block, for handlers that zero it as a unit.
 constexpr auto kInfoBlockBegin = __builtin_offsetof(mkv_file_info, segment_uid);
 constexpr auto kInfoBlockEnd = __builtin_offsetof(mkv_file_info, cue_points);

@@ -115,7 +115,7 @@ MkvFilter* Create() {
   return filter;
 }
 
-int Destroy(MkvFilter* filter) {
+void FreeOutputChannels(MkvFilter* filter) {
   MkvContext* context = filter->Context;
   if (filter->OutputChannels) {
     for (int32_t i = 0; i < context->OutputChannelCount; ++i) {
@@ -123,7 +123,14 @@ int Destroy(MkvFilter* filter) {
       mem_free(filter->OutputChannels[i].Name);
     }
     mem_free(filter->OutputChannels);
+    filter->OutputChannels = nullptr;
   }
+  context->OutputChannelCount = 0;
+}
+
+int Destroy(MkvFilter* filter) {
+  MkvContext* context = filter->Context;
+  FreeOutputChannels(filter);
   if (context->Metadata) FreeMetadata(context->Metadata);
   mem_free(context->TrackVideoLang);
   mem_free(context->TrackAudioLang);

@@ -11,3 +11,7 @@
 // Frees the channels, the metadata, the ring, the file model, the locks and
 // the instance. Always 0; the caller has checked the handle.
 int Destroy(MkvFilter* filter);
+
+// Frees the output channel records with their states and names; the instance
+// is left with none.
+void FreeOutputChannels(MkvFilter* filter);

@@ -4,6 +4,7 @@
 #include "core/header/element_walker.h"
 #include "core/memory.h"
 #include "core/status.h"
+#include "filter/instance.h"
 #include "filter/mkv_context.h"
 #include "filter/rating.h"
 #include "filter/track_setup.h"
@@ -29,15 +30,7 @@ bool SeekInput(const MmfInputStream* stream, uint64_t offset) {
 // one starts from a clean slate rather than parsing over it.
 void DiscardEarlierAttempt(MkvFilter* filter) {
   MkvContext* context = filter->Context;
-  if (filter->OutputChannels) {
-    for (int32_t i = 0; i < context->OutputChannelCount; ++i) {
-      mem_free(filter->OutputChannels[i].State);
-      mem_free(filter->OutputChannels[i].Name);
-    }
-    mem_free(filter->OutputChannels);
-    filter->OutputChannels = nullptr;
-  }
-  context->OutputChannelCount = 0;
+  FreeOutputChannels(filter);
   if (context->Metadata) FreeMetadata(context->Metadata);
   context->Metadata = nullptr;
   mem_free(context->Ring);

@@ -41,16 +41,7 @@ void start_track_record(mkv_track_info* track) {
 // A record that is not counted is invisible to destroy_mkv_file_info, so its
 // buffers are released here.
 void abandon_track_record(mkv_track_info* track) {
-  for (char* text : {track->name, track->language, track->codec_id, track->codec_name}) mem_free(text);
-  mem_free(track->codec_private);
-  uint32_t opened = track->content_encoding_count < kMaxContentEncodings ? track->content_encoding_count
-                                                                         : kMaxContentEncodings;
-  for (uint32_t i = 0; i < opened; ++i) {
-    mkv_content_encoding& encoding = track->content_encodings[i];
-    for (uint8_t* payload : {encoding.comp_settings, encoding.enc_key_id, encoding.signature, encoding.sig_key_id}) {
-      mem_free(payload);
-    }
-  }
+  free_mkv_track_info(track);
   std::memset(track, 0, sizeof *track);
 }
 
