@@ -1,6 +1,7 @@
 #include <cstdio>
 #include <cstring>
 
+#include "tools/command_line.h"
 #include "tools/commands.h"
 
 namespace {
@@ -12,33 +13,73 @@ struct Command {
 };
 
 const Command kCommands[] = {
-    {"info", RunInfo, "parse the headers of a Matroska file and print what they say"},
+    {"extract", RunExtract, "write each channel of a file as a file players open (Annex B, ADTS, FLAC, Ogg, WAV...)"},
+    {"info", RunInfo, "list the EBML header, Segment Info, tracks, cues and tags of a Matroska file"},
     {"metadata", RunMetadata, "print the metadata entries the plug-in offers for a file"},
     {"packets", RunPackets, "play a file through the plug-in and print every channel's frames"},
     {"probe", RunProbe, "connect the plug-in to a file (or - for standard input) and print its channels"},
 };
 
 void PrintUsage(FILE* out) {
-  std::fprintf(out, "usage: kelvane COMMAND [options] FILE\n\ncommands:\n");
+  std::fprintf(out,
+               "usage: kelvane COMMAND [OPTIONS] FILE\n"
+               "       kelvane COMMAND --help     (or: kelvane help COMMAND)\n"
+               "\n"
+               "kelvane drives the Matroska demultiplexer plug-in (kelvane.so) through a host that\n"
+               "calls it exactly as the media framework does.\n"
+               "\ncommands:\n");
   for (const Command& command : kCommands) std::fprintf(out, "  %-10s %s\n", command.name, command.summary);
-  std::fprintf(out, "\nexit codes: 0 ok, 1 the file was refused or failed, 2 usage\n");
+  std::fprintf(out,
+               "\n"
+               "info, metadata, packets and probe take --json: one JSON document on standard output\n"
+               "(its fields are described in docs/json.md).\n"
+               "\n"
+               "exit codes:\n"
+               "  0  ok\n"
+               "  1  the file was refused by the plug-in, could not be read, or failed to play\n"
+               "  2  usage: an unknown command or option, a malformed value, a missing FILE, or a\n"
+               "     track or channel the file does not offer\n"
+               "\n"
+               "examples:\n"
+               "  kelvane info movie.mkv\n"
+               "  kelvane probe --json movie.mkv\n"
+               "  kelvane help packets\n");
+}
+
+const Command* Find(const char* name) {
+  for (const Command& command : kCommands) {
+    if (!std::strcmp(name, command.name)) return &command;
+  }
+  return nullptr;
+}
+
+int UnknownCommand(const char* name) {
+  std::fprintf(stderr, "kelvane: unknown command '%s'\ntry 'kelvane --help'\n", name);
+  return kExitUsage;
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
   if (argc < 2) {
+    std::fprintf(stderr, "kelvane: no command given\n");
     PrintUsage(stderr);
-    return 2;
+    return kExitUsage;
   }
-  if (!std::strcmp(argv[1], "--help") || !std::strcmp(argv[1], "-h")) {
+  const char* name = argv[1];
+  if (IsHelpOption(name) || (!std::strcmp(name, "help") && argc == 2)) {
     PrintUsage(stdout);
-    return 0;
+    return kExitOk;
   }
-  for (const Command& command : kCommands) {
-    if (!std::strcmp(argv[1], command.name)) return command.run(argc - 2, argv + 2);
+  if (!std::strcmp(name, "help")) {
+    // `kelvane help COMMAND` is `kelvane COMMAND --help`.
+    const Command* command = Find(argv[2]);
+    if (!command) return UnknownCommand(argv[2]);
+    char help[] = "--help";
+    char* help_argv[] = {help, nullptr};
+    return command->run(1, help_argv);
   }
-  std::fprintf(stderr, "kelvane: unknown command '%s'\n", argv[1]);
-  PrintUsage(stderr);
-  return 2;
+  const Command* command = Find(name);
+  if (!command) return UnknownCommand(name);
+  return command->run(argc - 2, argv + 2);
 }

@@ -1,0 +1,79 @@
+#include "tools/command_line.h"
+
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+const char kPluginOptionHelp[] =
+    "  --plugin PATH    the plug-in to load (default: kelvane.so beside this program)\n";
+
+namespace {
+
+void Report(const char* command, const char* format, va_list args) {
+  std::fprintf(stderr, "kelvane %s: ", command);
+  std::vfprintf(stderr, format, args);
+  std::fputc('\n', stderr);
+}
+
+}  // namespace
+
+bool IsHelpOption(const char* arg) { return !std::strcmp(arg, "--help") || !std::strcmp(arg, "-h"); }
+
+int PrintHelp(const char* text) {
+  std::fputs(text, stdout);
+  return kExitOk;
+}
+
+int UsageError(const char* command, const char* format, ...) {
+  va_list args;
+  va_start(args, format);
+  Report(command, format, args);
+  va_end(args);
+  std::fprintf(stderr, "try 'kelvane %s --help'\n", command);
+  return kExitUsage;
+}
+
+int Failure(const char* command, const char* format, ...) {
+  va_list args;
+  va_start(args, format);
+  Report(command, format, args);
+  va_end(args);
+  return kExitFailed;
+}
+
+int CheckInputFile(const char* command, const char* path) {
+  if (!std::strcmp(path, "-")) return kExitOk;
+  struct stat status;
+  if (stat(path, &status) != 0) return Failure(command, "cannot open %s: %s", path, std::strerror(errno));
+  if (S_ISDIR(status.st_mode)) return Failure(command, "cannot read %s: %s", path, std::strerror(EISDIR));
+  FILE* file = std::fopen(path, "rb");
+  if (!file) return Failure(command, "cannot open %s: %s", path, std::strerror(errno));
+  std::fclose(file);
+  return kExitOk;
+}
+
+int RefusedFile(const char* command, const char* path, int rating) {
+  return Failure(command, "%s: the plug-in refused it: rating %d (a Matroska file it can play rates %d)", path,
+                 rating, kAcceptedRating);
+}
+
+bool ParseNumber(const char* text, unsigned long maximum, unsigned long* value) {
+  if (*text < '0' || *text > '9') return false;
+  char* end = nullptr;
+  errno = 0;
+  unsigned long parsed = std::strtoul(text, &end, 10);
+  if (*end || errno == ERANGE || parsed > maximum) return false;
+  *value = parsed;
+  return true;
+}
+
+std::unique_ptr<host::Plugin> LoadPlugin(const char* command, const std::string& path) {
+  std::string error;
+  std::unique_ptr<host::Plugin> plugin = host::Plugin::Load(path, &error);
+  if (!plugin) Failure(command, "cannot load the plug-in %s: %s", path.c_str(), error.c_str());
+  return plugin;
+}
