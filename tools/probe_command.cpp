@@ -2,9 +2,8 @@
 // file (or, for "-", to standard input, which cannot seek) the way the
 // framework does, and prints the sniff and rating answers, the output
 // channels with their formats, the "Duration" resource and whether the input
-// seeks. The byte-rate estimate and the decoder-configuration packets have no
-// operation of their own before playback; they are read from the instance's
-// records, whose layout the plug-in's headers give.
+// seeks. Everything shown comes through the plug-in's interfaces and the
+// framework's records (channel name and format): what a framework sees.
 
 #include <cinttypes>
 #include <cstdio>
@@ -12,16 +11,44 @@
 #include <string>
 #include <vector>
 
-#include "filter/mkv_context.h"
-#include "filter/mkv_filter.h"
 #include "host/file_streamer.h"
 #include "host/graph_setup.h"
 #include "host/memory_pools.h"
+#include "tools/command_line.h"
 #include "tools/commands.h"
+#include "tools/json_writer.h"
+
+const char kProbeHelp[] =
+    "usage: kelvane probe [--json] [--plugin PATH] FILE\n"
+    "\n"
+    "Connects the plug-in to FILE as the framework does before playback, and prints what it\n"
+    "answers: the sniff and the rating (80: a Matroska file it plays), the \"Duration\"\n"
+    "resource, whether the input can seek, the answers of the input channel's set-up, then\n"
+    "each output channel (one per track with a codec it supports) with its format: the\n"
+    "four-character code, the picture size and frame rate or the channels and sample rate,\n"
+    "the size of the codec's extra data, and the answers of acquiring and configuring it.\n"
+    "The decoder-configuration packets are delivered at playback: see 'kelvane packets'.\n"
+    "\n"
+    "FILE may be - for standard input, an input that cannot seek.\n"
+    "\n"
+    "options:\n"
+    "  --json           one JSON document instead of text (docs/json.md, section probe)\n"
+    "%s"
+    "  -h, --help       this text\n"
+    "\n"
+    "exit codes: 0 the plug-in accepted the file; 1 it refused it (the answers are still\n"
+    "printed) or the file cannot be read; 2 usage\n"
+    "\n"
+    "examples:\n"
+    "  kelvane probe movie.mkv\n"
+    "  cat movie.mkv | kelvane probe -\n"
+    "  kelvane probe --json movie.mkv | jq '.channels[] | {fourcc, width, height}'\n";
 
 namespace {
 
 constexpr uint32_t kPoolBuffers = 4;
+constexpr int kSchemaVersion = 1;
+constexpr int kSeekable = 2;  // SeekQuery's answer for an input the plug-in can seek in
 
 std::string FourCc(uint32_t code) {
   std::string text;
@@ -32,123 +59,136 @@ std::string FourCc(uint32_t code) {
   return text;
 }
 
-uint64_t DurationResource(const host::Plugin& plugin, MmfFilterHandle* handle) {
+const AoResource* FindResource(const host::Plugin& plugin, MmfFilterHandle* handle, const char* name) {
   const AoResourceAccessOps* access = plugin.resources();
   const AoResource* rows = access ? access->GetResources(handle) : nullptr;
   for (const AoResource* row = rows; row && row->Name; ++row) {
-    if (std::strcmp(row->Name, "Duration") == 0) return *static_cast<const uint64_t*>(row->Value);
+    if (!std::strcmp(row->Name, name)) return row;
   }
-  return 0;
+  return nullptr;
 }
 
-// One line of output in either form: a key and its value, at a depth.
-class Printer {
- public:
-  explicit Printer(bool json) : json_(json) {}
-  void Open(const char* key, bool array = false) {
-    Key(key);
-    std::printf(json_ ? (array ? "[" : "{") : "\n");
-    first_ = true;
-    ++depth_;
-  }
-  void Close(bool array = false) {
-    --depth_;
-    if (json_) std::printf(array ? "]" : "}");
-    first_ = false;
-  }
-  void Item(const std::string& label) {  // an object inside an array; the label shows in text only
-    Separate();
-    if (json_) {
-      std::printf("{");
-    } else {
-      std::printf("%*s%s\n", 2 * depth_, "", label.c_str());
-    }
-    first_ = true;
-    ++depth_;
-  }
-  void Numbers(const char* key, const std::vector<int64_t>& values) {
-    Key(key);
-    if (json_) std::printf("[");
-    for (size_t i = 0; i < values.size(); ++i) std::printf(json_ && i ? ",%" PRId64 : i ? " %" PRId64 : "%" PRId64, values[i]);
-    std::printf(json_ ? "]" : values.empty() ? "none" : "");
-    End();
-  }
-  void Number(const char* key, int64_t value) {
-    Key(key);
-    std::printf("%" PRId64, value);
-    End();
-  }
-  void Text(const char* key, const std::string& value) {
-    Key(key);
-    std::printf(json_ ? "\"%s\"" : "%s", value.c_str());
-    End();
-  }
-  void Finish() {
-    if (json_) std::printf("}\n");
-  }
+int64_t DurationResource(const host::Plugin& plugin, MmfFilterHandle* handle) {
+  const AoResource* row = FindResource(plugin, handle, "Duration");
+  if (!row || !row->Value || (row->Type & kAoResourceKindMask) != kAoResourceInt64) return 0;
+  return *static_cast<const int64_t*>(row->Value);
+}
 
- private:
-  void Separate() {
-    if (json_ && !first_) std::printf(",");
-    first_ = false;
-  }
-  void Key(const char* key) {
-    Separate();
-    if (json_) {
-      std::printf("\"%s\":", key);
-    } else {
-      std::printf("%*s%s: ", 2 * depth_, "", key);
-    }
-  }
-  void End() {
-    if (!json_) std::printf("\n");
-  }
-  bool json_;
-  bool first_ = true;
-  int depth_ = 0;
+bool IsVideo(const MmfMediaFormat& format) {
+  return format.stream_type == static_cast<uint32_t>(kMmfStreamEncodedVideo);
+}
+
+struct ProbeReport {
+  std::string file;
+  int sniff = 0;
+  int rating = 0;
+  bool rated = false;
+  int64_t duration = 0;
+  bool seekable = false;
+  int input_set_format = -1;
+  int input_set_media_output = -1;
+  int input_set_pool = -1;
+  std::vector<host::OutputChannelSetup> channels;
 };
 
-void PrintChannel(Printer& out, const host::OutputChannelSetup& setup, size_t index) {
-  const MkvChannel& channel = *AsMkvChannel(setup.channel);
+// ---- text ----
+
+void PrintChannelText(const host::OutputChannelSetup& setup, size_t index) {
+  const MmfChannel& channel = *setup.channel;
   const MmfMediaFormat& format = channel.Format;
-  out.Item("channel " + std::to_string(index) + ":");
-  out.Text("name", channel.Name ? channel.Name : "");
-  out.Text("fourcc", FourCc(format.fourcc));
-  char type[16];
-  std::snprintf(type, sizeof type, "0x%08" PRIX32, format.stream_type);
-  out.Text("stream_type", type);
-  if (format.stream_type == static_cast<uint32_t>(kMmfStreamEncodedVideo)) {
+  std::printf("  channel %zu:\n", index);
+  std::printf("    name: %s\n", channel.Name ? channel.Name : "");
+  std::printf("    fourcc: %s\n", FourCc(format.fourcc).c_str());
+  std::printf("    stream_type: 0x%08" PRIX32 "\n", format.stream_type);
+  if (IsVideo(format)) {
     const MmfVideoFormat& video = format.media.video;
-    out.Number("width", video.width);
-    out.Number("height", video.height);
-    out.Number("frame_rate", video.frame_rate);
-    out.Text("pixel_aspect", std::to_string(video.pixel_aspect_width) + ":" + std::to_string(video.pixel_aspect_height));
-    out.Number("duration_us", video.duration);
+    std::printf("    width: %u\n    height: %u\n    frame_rate: %u\n", video.width, video.height, video.frame_rate);
+    std::printf("    pixel_aspect: %u:%u\n", video.pixel_aspect_width, video.pixel_aspect_height);
+    std::printf("    duration_us: %d\n", video.duration);
   } else {
     const MmfAudioFormat& audio = format.media.audio;
-    out.Number("channels", audio.channels);
-    out.Number("sample_rate", audio.sample_rate);
-    out.Number("bits_per_sample", audio.bits_per_sample);
-    out.Number("duration", audio.duration);
+    std::printf("    channels: %u\n    sample_rate: %u\n    bits_per_sample: %u\n", audio.channels,
+                audio.sample_rate, audio.bits_per_sample);
+    std::printf("    duration: %d\n", audio.duration);
   }
-  out.Number("stream_duration", static_cast<int64_t>(format.duration));
-  out.Number("extra_size", format.extra_size);
-  out.Number("buffer_count", setup.offered.buffer_count);
-  const MkvChannelState* state = channel.State;
-  std::vector<int64_t> packets;
-  for (uint32_t j = 0; state && j < state->DecoderConfigCount && j < kMaxDecoderConfigPackets; ++j) {
-    packets.push_back(state->DecoderConfigSize[j]);
-  }
-  out.Numbers("decoder_config", packets);
-  out.Number("acquire", setup.acquire_result);
-  out.Number("set_format", setup.set_format_result);
-  out.Number("set_pool", setup.pool_result);
-  out.Close();
+  std::printf("    stream_duration: %" PRIu64 "\n", format.duration);
+  std::printf("    extra_size: %u\n", format.extra_size);
+  std::printf("    buffer_count: %u\n", setup.offered.buffer_count);
+  std::printf("    acquire: %d\n    set_format: %d\n    set_pool: %d\n", setup.acquire_result,
+              setup.set_format_result, setup.pool_result);
 }
 
-int Usage() {
-  std::fprintf(stderr, "usage: kelvane probe [--json] [--plugin PATH] FILE|-\n");
-  return 2;
+void PrintText(const ProbeReport& report) {
+  std::printf("file: %s\nsniff: %d\nrating: %d\n", report.file.c_str(), report.sniff, report.rating);
+  if (!report.rated) return;
+  std::printf("duration_resource: %" PRId64 "\n", report.duration);
+  std::printf("seekable: %s\n", report.seekable ? "yes" : "no");
+  std::printf("input:\n  set_format: %d\n  set_media_output: %d\n  set_pool: %d\n", report.input_set_format,
+              report.input_set_media_output, report.input_set_pool);
+  std::printf("channels:\n");
+  for (size_t k = 0; k < report.channels.size(); ++k) PrintChannelText(report.channels[k], k);
+}
+
+// ---- JSON ----
+
+void WriteChannelJson(JsonWriter& out, const host::OutputChannelSetup& setup, size_t index) {
+  const MmfChannel& channel = *setup.channel;
+  const MmfMediaFormat& format = channel.Format;
+  out.BeginObject();
+  out.Field("index", index);
+  out.Field("name", channel.Name ? channel.Name : "");
+  out.Field("fourcc", FourCc(format.fourcc));
+  out.Field("stream_type", format.stream_type);
+  out.Field("media", IsVideo(format) ? "video" : "audio");
+  if (IsVideo(format)) {
+    const MmfVideoFormat& video = format.media.video;
+    out.Field("width", video.width);
+    out.Field("height", video.height);
+    out.Field("frame_rate", video.frame_rate);
+    out.Field("pixel_aspect_width", video.pixel_aspect_width);
+    out.Field("pixel_aspect_height", video.pixel_aspect_height);
+    out.Field("duration_us", video.duration);
+  } else {
+    const MmfAudioFormat& audio = format.media.audio;
+    out.Field("channels", audio.channels);
+    out.Field("sample_rate", audio.sample_rate);
+    out.Field("bits_per_sample", audio.bits_per_sample);
+    out.Field("duration", audio.duration);
+  }
+  out.Field("stream_duration", format.duration);
+  out.Field("extra_size", format.extra_size);
+  out.Field("buffer_count", setup.offered.buffer_count);
+  out.Field("acquire", setup.acquire_result);
+  out.Field("set_format", setup.set_format_result);
+  out.Field("set_pool", setup.pool_result);
+  out.EndObject();
+}
+
+void WriteJson(const ProbeReport& report) {
+  JsonWriter out(stdout);
+  out.BeginObject();
+  out.Field("schema_version", kSchemaVersion);
+  out.Field("command", "probe");
+  out.Field("file", report.file);
+  out.Field("sniff", report.sniff);
+  out.Field("rating", report.rating);
+  out.Field("accepted", report.rated);
+  if (report.rated) {
+    out.Field("duration_resource", report.duration);
+    out.Field("seekable", report.seekable);
+    out.Key("input");
+    out.BeginObject();
+    out.Field("set_format", report.input_set_format);
+    out.Field("set_media_output", report.input_set_media_output);
+    out.Field("set_pool", report.input_set_pool);
+    out.EndObject();
+  }
+  out.Key("channels");
+  out.BeginArray();
+  for (size_t k = 0; k < report.channels.size(); ++k) WriteChannelJson(out, report.channels[k], k);
+  out.EndArray();
+  out.EndObject();
+  out.Finish();
 }
 
 }  // namespace
@@ -158,30 +198,31 @@ int RunProbe(int argc, char** argv) {
   const char* file = nullptr;
   bool json = false;
   for (int i = 0; i < argc; ++i) {
-    if (!std::strcmp(argv[i], "--plugin") && i + 1 < argc) {
+    const char* arg = argv[i];
+    if (IsHelpOption(arg)) {
+      std::printf(kProbeHelp, kPluginOptionHelp);
+      return kExitOk;
+    }
+    if (!std::strcmp(arg, "--plugin")) {
+      if (i + 1 >= argc) return UsageError("probe", "--plugin needs a PATH");
       plugin_path = argv[++i];
-    } else if (!std::strcmp(argv[i], "--json")) {
+    } else if (!std::strcmp(arg, "--json")) {
       json = true;
-    } else if (!file && (argv[i][0] != '-' || !std::strcmp(argv[i], "-"))) {
-      file = argv[i];
+    } else if (arg[0] == '-' && arg[1]) {
+      return UsageError("probe", "unknown option '%s'", arg);
+    } else if (file) {
+      return UsageError("probe", "one FILE only ('%s' and '%s' given)", file, arg);
     } else {
-      return Usage();
+      file = arg;
     }
   }
-  if (!file) return Usage();
-
-  std::string error;
-  std::unique_ptr<host::Plugin> plugin = host::Plugin::Load(plugin_path, &error);
-  if (!plugin) {
-    std::fprintf(stderr, "kelvane: cannot load the plug-in %s: %s\n", plugin_path.c_str(), error.c_str());
-    return 1;
-  }
-  const bool from_stdin = std::strcmp(file, "-") == 0;
+  if (!file) return UsageError("probe", "no FILE given");
+  if (int code = CheckInputFile("probe", file); code != kExitOk) return code;
+  std::unique_ptr<host::Plugin> plugin = LoadPlugin("probe", plugin_path);
+  if (!plugin) return kExitFailed;
+  const bool from_stdin = !std::strcmp(file, "-");
   auto stream = host::OpenFileStream(file, !from_stdin);
-  if (!stream) {
-    std::fprintf(stderr, "kelvane: cannot open %s\n", file);
-    return 1;
-  }
+  if (!stream) return Failure("probe", "cannot open %s", file);
 
   // The input channel is connected to a file streamer over the same input,
   // as in playback; probing only sets the connection up.
@@ -197,26 +238,21 @@ int RunProbe(int argc, char** argv) {
   options.output_pool_param = output_pool.handle();
   host::FilterGraph graph(*plugin, *stream, options);
 
-  Printer out(json);
-  if (json) std::printf("{");
-  out.Text("file", from_stdin ? "-" : file);
-  out.Number("sniff", graph.sniff());
-  out.Number("rating", graph.rating());
-  if (graph.rated()) {
+  ProbeReport report;
+  report.file = file;
+  report.sniff = graph.sniff();
+  report.rating = graph.rating();
+  report.rated = graph.rated();
+  if (report.rated) {
     MmfFilterHandle* handle = graph.handle();
     const MmfSeekerOps* seeker = plugin->seeker();
-    out.Number("duration_resource", static_cast<int64_t>(DurationResource(*plugin, handle)));
-    out.Number("byte_rate", AsMkvFilter(handle)->Context->ByteRate);
-    out.Text("seekable", seeker && seeker->SeekQuery(handle) == 2 ? "yes" : "no");
-    out.Open("input");
-    out.Number("set_format", graph.input_format_result());
-    out.Number("set_media_output", graph.media_output_result());
-    out.Number("set_pool", graph.input_pool_result());
-    out.Close();
-    out.Open("channels", true);
-    for (size_t k = 0; k < graph.outputs().size(); ++k) PrintChannel(out, graph.outputs()[k], k);
-    out.Close(true);
+    report.duration = DurationResource(*plugin, handle);
+    report.seekable = seeker && seeker->SeekQuery(handle) == kSeekable;
+    report.input_set_format = graph.input_format_result();
+    report.input_set_media_output = graph.media_output_result();
+    report.input_set_pool = graph.input_pool_result();
+    report.channels = graph.outputs();
   }
-  out.Finish();
-  return graph.rated() ? 0 : 1;
+  json ? WriteJson(report) : PrintText(report);
+  return report.rated ? kExitOk : RefusedFile("probe", file, report.rating);
 }
