@@ -8,10 +8,14 @@
 //   --preroll          the "EnablePreroll" resource
 //   --trick-time MS    the "TrickTime" resource
 
+#include <string>
+
 #include "host/graph_runner.h"
 
+// The options' lines for a command's help text.
 extern const char kControlUsage[];
 
 // 1 when argv[*i] (and the value it takes) was a control option, with *i on
-// its last word; 0 when it is none; -1 when its value is malformed.
-int ParseControlOption(int argc, char** argv, int* i, host::RunnerOptions* run);
+// its last word; 0 when it is none; -1 when its value is missing or
+// malformed, with *error naming the option and what it takes.
+int ParseControlOption(int argc, char** argv, int* i, host::RunnerOptions* run, std::string* error);

@@ -4,6 +4,7 @@
 // frame with the channel, track number, presentation time (microseconds),
 // size and Adler-32 of the frame bytes.
 
+#include <algorithm>
 #include <cinttypes>
 #include <cstdio>
 #include <cstdlib>
@@ -21,69 +22,123 @@
 #include "host/input_streams.h"
 #include "host/plugin_loader.h"
 #include "stream/mkvvstream.h"
+#include "tools/command_line.h"
 #include "tools/commands.h"
 #include "tools/control_options.h"
+#include "tools/json_writer.h"
+
+const char kPacketsHelp[] =
+    "usage: kelvane packets [OPTIONS] FILE\n"
+    "\n"
+    "Plays FILE through the plug-in as a framework does (a file streamer feeding it, one sink\n"
+    "thread per output channel) and prints what each channel delivered. First the decoder-\n"
+    "configuration packets, one line each:\n"
+    "  CHANNEL TRACK config SIZE ADLER32\n"
+    "then every frame, channel after channel, in delivery order:\n"
+    "  CHANNEL TRACK TIME_US SIZE ADLER32\n"
+    "CHANNEL is the output channel's index (as 'kelvane probe' lists them), TRACK the Matroska\n"
+    "track number it plays (read with the demuxer's own header parser, since a channel does\n"
+    "not carry it), TIME_US the presentation time in microseconds, SIZE the frame's bytes and\n"
+    "ADLER32 their Adler-32 checksum in hex. With playback control, a line\n"
+    "  CHANNEL TRACK seek\n"
+    "marks where each seek or scan jump took effect.\n"
+    "\n"
+    "options:\n"
+    "  --channels K,K,...  output channels to acquire, by index (default: all)\n"
+    "  --buffer-size BYTES bytes per input buffer, 1 to 67108864 (default 32768)\n"
+    "  --no-hash           no Adler-32 of the frames\n"
+    "  --json              one JSON document instead of lines (docs/json.md, section packets)\n"
+    "%s"
+    "  -h, --help          this text\n"
+    "playback control:\n"
+    "%s"
+    "\n"
+    "exit codes: 0 every channel played to its end; 1 the plug-in refused the file, it cannot\n"
+    "be read, or a channel ended with an error; 2 usage, including a channel the file does not\n"
+    "offer. A control action the plug-in refused is reported on standard error (exit code 0).\n"
+    "\n"
+    "examples:\n"
+    "  kelvane packets movie.mkv\n"
+    "  kelvane packets --channels 1 --no-hash movie.mkv\n"
+    "  kelvane packets --seek 10@2 --preroll movie.mkv       # seek to 10 s once playback reaches 2 s\n"
+    "  kelvane packets --ff 400@1 --trick-time 500 movie.mkv # fast forward from 1 s\n";
 
 namespace {
 
 constexpr int64_t kHeaderBufferSize = 480;
+constexpr int kSchemaVersion = 1;
+constexpr unsigned long kMaxBufferSize = 64ul << 20;
 
 struct Options {
   host::RunnerOptions run;
   bool json = false;
   const char* file = nullptr;
+  std::string plugin_path = host::PluginBesideExecutable();
 };
 
-int Usage(FILE* out, int code) {
-  std::fprintf(out,
-               "usage: kelvane packets [--buffer-size BYTES] [--channels K,K,...] [--json] [--no-hash] FILE\n"
-               "  --buffer-size  bytes per input buffer (default 32768)\n"
-               "  --channels     output channels to acquire, by index (default: all)\n"
-               "  --json         one JSON document instead of lines\n"
-               "  --no-hash      no Adler-32 of the frames\n");
-  std::fprintf(out, "playback control (lines mode prints \"CHANNEL TRACK seek\" where each took effect):\n%s",
-               kControlUsage);
-  return code;
-}
-
+// A comma-separated list of distinct channel indexes.
 bool ParseChannels(const char* text, std::vector<int32_t>* channels) {
-  while (*text) {
-    char* end = nullptr;
-    long k = std::strtol(text, &end, 10);
-    if (end == text || k < 0) return false;
+  std::string list = text;
+  size_t start = 0;
+  while (true) {
+    size_t comma = list.find(',', start);
+    std::string item = list.substr(start, comma == std::string::npos ? std::string::npos : comma - start);
+    unsigned long k = 0;
+    if (!ParseNumber(item.c_str(), 0x7FFFFFFF, &k)) return false;
+    if (std::find(channels->begin(), channels->end(), static_cast<int32_t>(k)) != channels->end()) return false;
     channels->push_back(static_cast<int32_t>(k));
-    text = *end == ',' ? end + 1 : end;
-    if (*end && *end != ',') return false;
+    if (comma == std::string::npos) return true;
+    start = comma + 1;
   }
-  return !channels->empty();
 }
 
+// -1 when the options are good, else the exit code.
 int ParseOptions(int argc, char** argv, Options* options) {
   for (int i = 0; i < argc; ++i) {
     const char* arg = argv[i];
-    if (!std::strcmp(arg, "--help")) return Usage(stdout, 0);
-    if (int taken = ParseControlOption(argc, argv, &i, &options->run); taken != 0) {
-      if (taken < 0) return Usage(stderr, 2);
+    if (IsHelpOption(arg)) {
+      std::printf(kPacketsHelp, kPluginOptionHelp, kControlUsage);
+      return kExitOk;
+    }
+    std::string error;
+    if (int taken = ParseControlOption(argc, argv, &i, &options->run, &error); taken != 0) {
+      if (taken < 0) return UsageError("packets", "%s", error.c_str());
       continue;
     }
+    const bool takes_value =
+        !std::strcmp(arg, "--buffer-size") || !std::strcmp(arg, "--channels") || !std::strcmp(arg, "--plugin");
+    if (takes_value && i + 1 >= argc) return UsageError("packets", "%s needs a value", arg);
     if (!std::strcmp(arg, "--json")) {
       options->json = true;
     } else if (!std::strcmp(arg, "--no-hash")) {
       options->run.checksum = false;
-    } else if (!std::strcmp(arg, "--buffer-size") && i + 1 < argc) {
-      char* end = nullptr;
-      unsigned long size = std::strtoul(argv[++i], &end, 10);
-      if (*end || size == 0 || size > (64ul << 20)) return Usage(stderr, 2);
+    } else if (!std::strcmp(arg, "--buffer-size")) {
+      unsigned long size = 0;
+      const char* value = argv[++i];
+      if (!ParseNumber(value, kMaxBufferSize, &size) || size == 0) {
+        return UsageError("packets", "--buffer-size: '%s' is not a number of bytes from 1 to %lu", value,
+                          kMaxBufferSize);
+      }
       options->run.input_buffer_size = static_cast<uint32_t>(size);
-    } else if (!std::strcmp(arg, "--channels") && i + 1 < argc) {
-      if (!ParseChannels(argv[++i], &options->run.channels)) return Usage(stderr, 2);
-    } else if ((arg[0] == '-' && arg[1]) || options->file) {
-      return Usage(stderr, 2);
+    } else if (!std::strcmp(arg, "--channels")) {
+      const char* value = argv[++i];
+      if (!ParseChannels(value, &options->run.channels)) {
+        return UsageError("packets", "--channels: '%s' is not a list of distinct channel indexes like 0,2", value);
+      }
+    } else if (!std::strcmp(arg, "--plugin")) {
+      options->plugin_path = argv[++i];
+    } else if (!std::strcmp(arg, "-")) {
+      return UsageError("packets", "FILE cannot be standard input: playback reads the file twice");
+    } else if (arg[0] == '-') {
+      return UsageError("packets", "unknown option '%s'", arg);
+    } else if (options->file) {
+      return UsageError("packets", "one FILE only ('%s' and '%s' given)", options->file, arg);
     } else {
       options->file = arg;
     }
   }
-  return options->file ? -1 : Usage(stderr, 2);
+  if (!options->file) return UsageError("packets", "no FILE given");
+  return -1;
 }
 
 // Track numbers of the offered tracks: the plug-in offers one channel per
@@ -109,67 +164,100 @@ std::vector<uint64_t> OfferedTracks(const char* path) {
   return tracks;
 }
 
+uint64_t TrackOf(const host::ChannelRun& run, const std::vector<uint64_t>& tracks) {
+  return static_cast<size_t>(run.index) < tracks.size() ? tracks[static_cast<size_t>(run.index)] : 0;
+}
+
 std::string FourCC(uint32_t code) {
   std::string text;
   for (int shift = 24; shift >= 0; shift -= 8) {
     char c = static_cast<char>(code >> shift & 0xFF);
-    text += c >= 32 && c < 127 && c != '"' && c != '\\' ? c : '?';
+    text += c >= 32 && c < 127 ? c : '?';
   }
   return text;
 }
 
 void PrintLines(const host::RunResult& result, const std::vector<uint64_t>& tracks, bool hash) {
-  auto track_of = [&](const host::ChannelRun& run) {
-    return static_cast<size_t>(run.index) < tracks.size() ? tracks[static_cast<size_t>(run.index)] : 0;
-  };
   for (const host::ChannelRun& run : result.channels) {
     for (const host::RunFrame& packet : run.config) {
-      std::printf("%d %" PRIu64 " config %u", run.index, track_of(run), packet.size);
+      std::printf("%d %" PRIu64 " config %u", run.index, TrackOf(run, tracks), packet.size);
       if (hash) std::printf(" %08x", packet.adler32);
       std::printf("\n");
     }
   }
   for (const host::ChannelRun& run : result.channels) {
+    const uint64_t track = TrackOf(run, tracks);
     size_t next_seek = 0;
     for (size_t i = 0; i < run.frames.size(); ++i) {
       const host::RunFrame& frame = run.frames[i];
       for (; next_seek < run.seeks.size() && run.seeks[next_seek] == i; ++next_seek) {
-        std::printf("%d %" PRIu64 " seek\n", run.index, track_of(run));
+        std::printf("%d %" PRIu64 " seek\n", run.index, track);
       }
-      std::printf("%d %" PRIu64 " %" PRIu64 " %u", run.index, track_of(run), frame.time_us, frame.size);
+      std::printf("%d %" PRIu64 " %" PRIu64 " %u", run.index, track, frame.time_us, frame.size);
       if (hash) std::printf(" %08x", frame.adler32);
       std::printf("\n");
     }
-    for (; next_seek < run.seeks.size(); ++next_seek) std::printf("%d %" PRIu64 " seek\n", run.index, track_of(run));
+    for (; next_seek < run.seeks.size(); ++next_seek) std::printf("%d %" PRIu64 " seek\n", run.index, track);
   }
 }
 
-void PrintJson(const host::RunResult& result, const std::vector<uint64_t>& tracks, bool hash) {
-  std::printf("{\"channels\": [");
-  const char* channel_sep = "";
-  for (const host::ChannelRun& run : result.channels) {
-    uint64_t track = static_cast<size_t>(run.index) < tracks.size() ? tracks[static_cast<size_t>(run.index)] : 0;
-    std::printf("%s\n {\"channel\": %d, \"track\": %" PRIu64 ", \"name\": \"%s\", \"fourcc\": \"%s\", \"config\": [",
-                channel_sep, run.index, track, run.name.c_str(), FourCC(run.fourcc).c_str());
-    channel_sep = ",";
-    const char* sep = "";
-    for (const host::RunFrame& packet : run.config) {
-      std::printf("%s{\"size\": %u", sep, packet.size);
-      if (hash) std::printf(", \"adler32\": \"%08x\"", packet.adler32);
-      std::printf("}");
-      sep = ", ";
-    }
-    std::printf("],\n  \"frames\": [");
-    sep = "";
-    for (const host::RunFrame& frame : run.frames) {
-      std::printf("%s\n   {\"time_us\": %" PRIu64 ", \"size\": %u", sep, frame.time_us, frame.size);
-      if (hash) std::printf(", \"adler32\": \"%08x\"", frame.adler32);
-      std::printf("}");
-      sep = ",";
-    }
-    std::printf("]}");
+void WriteFrame(JsonWriter& out, const host::RunFrame& frame, bool hash, bool config) {
+  out.BeginObject(true);
+  if (!config) out.Field("time_us", frame.time_us);
+  out.Field("size", frame.size);
+  if (hash) {
+    char adler[9];
+    std::snprintf(adler, sizeof adler, "%08x", frame.adler32);
+    out.Field("adler32", adler);
   }
-  std::printf("\n]}\n");
+  if (!config) out.Field("marked", frame.marked);
+  out.EndObject();
+}
+
+void WriteJson(const char* file, const host::RunResult& result, const std::vector<uint64_t>& tracks, bool hash) {
+  JsonWriter out(stdout);
+  out.BeginObject();
+  out.Field("schema_version", kSchemaVersion);
+  out.Field("command", "packets");
+  out.Field("file", file);
+  out.Key("control_results");
+  out.BeginArray(true);
+  for (int answer : result.control_results) out.Int(answer);
+  out.EndArray();
+  out.Key("channels");
+  out.BeginArray();
+  for (const host::ChannelRun& run : result.channels) {
+    out.BeginObject();
+    out.Field("channel", run.index);
+    out.Field("track", TrackOf(run, tracks));
+    out.Field("name", run.name);
+    out.Field("fourcc", FourCC(run.fourcc));
+    out.Key("config");
+    out.BeginArray();
+    for (const host::RunFrame& packet : run.config) WriteFrame(out, packet, hash, true);
+    out.EndArray();
+    out.Key("seeks");
+    out.BeginArray(true);
+    for (size_t at : run.seeks) out.Uint(at);
+    out.EndArray();
+    out.Key("frames");
+    out.BeginArray();
+    for (const host::RunFrame& frame : run.frames) WriteFrame(out, frame, hash, false);
+    out.EndArray();
+    out.EndObject();
+  }
+  out.EndArray();
+  out.EndObject();
+  out.Finish();
+}
+
+// "0 (track 1), 1 (track 3)": the offered channels and the tracks they play.
+std::string ChannelList(const std::vector<uint64_t>& tracks) {
+  std::string text;
+  for (size_t k = 0; k < tracks.size(); ++k) {
+    text += (k ? ", " : "") + std::to_string(k) + " (track " + std::to_string(tracks[k]) + ")";
+  }
+  return text;
 }
 
 }  // namespace
@@ -177,27 +265,32 @@ void PrintJson(const host::RunResult& result, const std::vector<uint64_t>& track
 int RunPackets(int argc, char** argv) {
   Options options;
   if (int code = ParseOptions(argc, argv, &options); code >= 0) return code;
-  std::string error;
-  auto plugin = host::Plugin::Load(host::PluginBesideExecutable(), &error);
-  if (!plugin) {
-    std::fprintf(stderr, "kelvane: %s\n", error.c_str());
-    return 1;
+  const char* file = options.file;
+  if (int code = CheckInputFile("packets", file); code != kExitOk) return code;
+  auto plugin = LoadPlugin("packets", options.plugin_path);
+  if (!plugin) return kExitFailed;
+
+  std::vector<uint64_t> tracks = OfferedTracks(file);
+  for (int32_t k : options.run.channels) {
+    if (!tracks.empty() && static_cast<size_t>(k) >= tracks.size()) {
+      return UsageError("packets", "--channels: %s offers no channel %d; its channels: %s", file, k,
+                        ChannelList(tracks).c_str());
+    }
   }
-  host::RunResult result = host::RunGraph(*plugin, options.file, options.run);
+  host::RunResult result = host::RunGraph(*plugin, file, options.run);
   if (!result.ok) {
-    std::fprintf(stderr, "kelvane: '%s': %s\n", options.file, result.error.c_str());
-    return 1;
+    if (result.rating != kAcceptedRating) return RefusedFile("packets", file, result.rating);
+    if (result.error.rfind("no output channel ", 0) == 0) {
+      return UsageError("packets", "--channels: %s has %s", file, result.error.c_str());
+    }
+    return Failure("packets", "%s: %s", file, result.error.c_str());
   }
   for (size_t k = 0; k < result.control_results.size(); ++k) {
     if (result.control_results[k] != 0) {
-      std::fprintf(stderr, "kelvane: control action %zu answered %d\n", k + 1, result.control_results[k]);
+      std::fprintf(stderr, "kelvane packets: control action %zu answered %d\n", k + 1, result.control_results[k]);
     }
   }
-  std::vector<uint64_t> tracks = OfferedTracks(options.file);
-  if (options.json) {
-    PrintJson(result, tracks, options.run.checksum);
-  } else {
-    PrintLines(result, tracks, options.run.checksum);
-  }
-  return 0;
+  options.json ? WriteJson(file, result, tracks, options.run.checksum)
+               : PrintLines(result, tracks, options.run.checksum);
+  return kExitOk;
 }
