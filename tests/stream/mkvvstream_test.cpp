@@ -17,85 +17,66 @@ std::vector<uint8_t> Pattern(size_t size) {
   return bytes;
 }
 
-// A stream over Pattern(size) from a memory input whose reads and seeks are counted.
-class VstreamTest : public ::testing::Test {
- protected:
-  void Open(size_t size, int64_t buffer_size, int read_through, int fill, int buffered) {
-    bytes_ = Pattern(size);
-    input_ = host::MakeMemoryStream(bytes_.data(), bytes_.size(), true);
-    ASSERT_EQ(mkvvstream_init(&stream_, input_->record(), buffer_size, read_through, fill, buffered), 0);
-  }
-  void TearDown() override { mkvvstream_destroy(&stream_); }
-  std::vector<uint8_t> bytes_;
-  std::unique_ptr<host::InputStream> input_;
-  mkvvstream stream_{};
+// One step on the stream: seek (answer), read n bytes (how many came, -1 for
+// kVstreamFailed; they must be the file's), tell or bytes_available.
+struct Step {
+  char op;  // 'S', 'R', 'T', 'A'
+  uint64_t arg;
+  int64_t want;
 };
 
-TEST_F(VstreamTest, ShortFileGetsBufferOfItsLengthAndReadPastEndDeliversNothing) {
-  Open(100, 240, 1, kFillWithRead, 1);
-  EXPECT_EQ(stream_.buffer_size, 100);
-  uint8_t byte = 0;
-  ASSERT_EQ(mkvvstream_seek(&stream_, 99), 0);
-  EXPECT_EQ(mkvvstream_read(&stream_, &byte, 1), 1u);
-  EXPECT_EQ(byte, bytes_[99]);
-  EXPECT_EQ(mkvvstream_read(&stream_, &byte, 1), 0u);
-  EXPECT_EQ(mkvvstream_tell(&stream_), 100u);
-}
-
-TEST_F(VstreamTest, SeekToBufferEndStaysInBufferAndNextReadRefillsBehindIt) {
-  Open(2000, 240, 1, kFillWithRead, 1);
-  ASSERT_EQ(mkvvstream_seek(&stream_, 240), 0);
-  EXPECT_EQ(mkvvstream_bytes_available(&stream_), 0u);
-  uint8_t byte = 0;
-  ASSERT_EQ(mkvvstream_read(&stream_, &byte, 1), 1u);
-  EXPECT_EQ(byte, bytes_[240]);
-  // The first buffer, one byte read straight through, then a whole buffer
-  // refilled at 241 without seeking the input: it already stands there.
-  EXPECT_EQ(input_->counters().reads, 3u);
-  EXPECT_EQ(input_->counters().bytes_read, 481u);
-  EXPECT_EQ(input_->counters().seeks, 0u);
-  EXPECT_EQ(stream_.buffer_start, 241u);
-  EXPECT_EQ(mkvvstream_bytes_available(&stream_), 240u);
-}
-
-TEST_F(VstreamTest, ReadWithoutReadThroughDeliversOnlyTheBufferedRest) {
-  Open(1000, 240, 0, kFillWithRead, 1);
-  ASSERT_EQ(mkvvstream_seek(&stream_, 230), 0);
-  uint8_t out[32];
-  EXPECT_EQ(mkvvstream_read(&stream_, out, 32), 10u);
-  EXPECT_EQ(mkvvstream_read(&stream_, out, 32), 0u);
-}
-
-TEST_F(VstreamTest, PeekModeReachesOnlyTheFirstBufferAndConsumesNothing) {
-  Open(1000, 500, 1, kFillWithPeek, 1);
-  EXPECT_EQ(mkvvstream_seek(&stream_, 499), 0);
-  EXPECT_EQ(mkvvstream_seek(&stream_, 500), -1);
-  ASSERT_EQ(mkvvstream_seek(&stream_, 490), 0);
-  uint8_t out[20];
-  EXPECT_EQ(mkvvstream_read(&stream_, out, 20), kVstreamFailed);
-  EXPECT_EQ(mkvvstream_read(&stream_, out, 10), 10u);
-  EXPECT_EQ(input_->Tell(), 0);
-  EXPECT_EQ(input_->counters().bytes_read, 0u);
-}
-
-TEST_F(VstreamTest, UnbufferedSeeksOnlyForwardByReadingInChunks) {
-  Open(20000, 240, 1, kFillWithRead, 0);
-  EXPECT_EQ(stream_.buffer, nullptr);
-  uint8_t out[4];
-  ASSERT_EQ(mkvvstream_read(&stream_, out, 4), 4u);
-  ASSERT_EQ(mkvvstream_seek(&stream_, 10004), 0);
-  EXPECT_EQ(input_->counters().reads, 4u);  // 10000 bytes skipped in chunks of 4096
-  EXPECT_EQ(mkvvstream_tell(&stream_), 10004u);
-  EXPECT_EQ(mkvvstream_seek(&stream_, 10000), -1);
-  EXPECT_EQ(mkvvstream_seek(&stream_, 10004), 0);
-  ASSERT_EQ(mkvvstream_read(&stream_, out, 4), 4u);
-  EXPECT_EQ(0, std::memcmp(out, bytes_.data() + 10004, 4));
-  EXPECT_EQ(input_->counters().seeks, 0u);
-
-  // An element of unknown size asks to skip about 2^56 bytes of a short input.
-  EXPECT_EQ(mkvvstream_seek(&stream_, uint64_t{1} << 56), 0);
-  EXPECT_LE(input_->counters().reads, 10u);
-  EXPECT_EQ(mkvvstream_read(&stream_, out, 1), 0u);
+TEST(VstreamTest, ModesBufferSeekAndReadAsConfigured) {
+  constexpr int64_t kAny = -2;
+  const struct {
+    const char* name;
+    size_t size;
+    int64_t buffer;
+    int read_through, fill, buffered;
+    std::vector<Step> steps;
+    int64_t reads, bytes_read, seeks;  // input counters afterwards; kAny: not checked
+  } cases[] = {
+      {"short file: a buffer of its length, nothing past its end", 100, 240, 1, kFillWithRead, 1,
+       {{'S', 99, 0}, {'R', 1, 1}, {'R', 1, 0}, {'T', 0, 100}}, kAny, kAny, kAny},
+      // The first buffer, one byte read straight through, then a whole buffer
+      // refilled at 241 without seeking the input: it already stands there.
+      {"seek to the buffer's end stays in it; the next read refills behind", 2000, 240, 1, kFillWithRead, 1,
+       {{'S', 240, 0}, {'A', 0, 0}, {'R', 1, 1}, {'A', 0, 240}}, 3, 481, 0},
+      {"without read-through only the buffered rest", 1000, 240, 0, kFillWithRead, 1,
+       {{'S', 230, 0}, {'R', 32, 10}, {'R', 32, 0}}, kAny, kAny, kAny},
+      {"peek mode reaches only the first buffer and consumes nothing", 1000, 500, 1, kFillWithPeek, 1,
+       {{'S', 499, 0}, {'S', 500, -1}, {'S', 490, 0}, {'R', 20, -1}, {'R', 10, 10}}, kAny, 0, kAny},
+      // 10000 bytes skipped in chunks of 4096; an element of unknown size asks
+      // to skip about 2^56 bytes of a short input.
+      {"unbuffered seeks only forward, by reading in chunks", 20000, 240, 1, kFillWithRead, 0,
+       {{'R', 4, 4}, {'S', 10004, 0}, {'T', 0, 10004}, {'S', 10000, -1}, {'S', 10004, 0}, {'R', 4, 4},
+        {'S', uint64_t{1} << 56, 0}, {'R', 1, 0}},
+       kAny, kAny, 0},
+  };
+  for (const auto& c : cases) {
+    std::vector<uint8_t> bytes = Pattern(c.size);
+    auto input = host::MakeMemoryStream(bytes.data(), bytes.size(), true);
+    mkvvstream stream{};
+    ASSERT_EQ(mkvvstream_init(&stream, input->record(), c.buffer, c.read_through, c.fill, c.buffered), 0) << c.name;
+    EXPECT_EQ(stream.buffer == nullptr, c.buffered == 0) << c.name;
+    EXPECT_EQ(c.buffered ? stream.buffer_size : 0, c.buffered ? std::min<int64_t>(c.buffer, int64_t(c.size)) : 0) << c.name;
+    for (const Step& s : c.steps) {
+      uint64_t at = mkvvstream_tell(&stream);
+      std::vector<uint8_t> out(s.op == 'R' ? s.arg + 1 : 0);
+      int64_t got = s.op == 'S'   ? mkvvstream_seek(&stream, s.arg)
+                    : s.op == 'T' ? static_cast<int64_t>(mkvvstream_tell(&stream))
+                    : s.op == 'A' ? static_cast<int64_t>(mkvvstream_bytes_available(&stream))
+                                  : static_cast<int64_t>(mkvvstream_read(&stream, out.data(), static_cast<int32_t>(s.arg)));
+      EXPECT_EQ(got, s.want) << c.name << ": " << s.op << " " << s.arg;
+      EXPECT_TRUE(s.op != 'R' || got <= 0 || std::memcmp(out.data(), bytes.data() + at, size_t(got)) == 0) << c.name;
+    }
+    const host::InputStream::Counters counters = input->counters();
+    auto counted = [](int64_t want, uint64_t got) { return want == kAny ? kAny : static_cast<int64_t>(got); };
+    EXPECT_EQ(counted(c.reads, counters.reads), c.reads) << c.name;
+    EXPECT_EQ(counted(c.bytes_read, counters.bytes_read), c.bytes_read) << c.name;
+    EXPECT_EQ(counted(c.seeks, counters.seeks), c.seeks) << c.name;
+    EXPECT_LE(c.buffered ? 0 : counters.reads, 10u) << c.name;  // also past the 2^56 skip
+    mkvvstream_destroy(&stream);
+  }
 }
 
 TEST(VstreamInitTest, RefusesWhatCannotBeBufferedAndLeavesNothingBehind) {
@@ -139,8 +120,7 @@ TEST(VstreamDifferentialTest, RandomReadsAndSeeksDeliverTheFileBytes) {
       uint64_t position = 0;
       for (int step = 0; step < 3000 && position < bytes.size(); ++step) {
         if (random() % 4 == 0) {
-          uint64_t target = buffered ? random() % bytes.size() : position + random() % 700;
-          target = std::min<uint64_t>(target, bytes.size());
+          uint64_t target = std::min<uint64_t>(buffered ? random() % bytes.size() : position + random() % 700, bytes.size());
           ASSERT_EQ(mkvvstream_seek(&stream, target), 0);
           position = target;
         } else {
