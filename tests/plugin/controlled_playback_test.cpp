@@ -1,83 +1,74 @@
-// Seeks and trick play during playback, done by the host's controller on a
-// running graph (streamer, kelvane, one sink thread per channel). What each
-// channel delivers after a seek or a jump is checked against the fixtures'
-// cue tables and block lists from mkvinfo.
+// Playback control on a running graph (streamer, kelvane, one sink thread
+// per channel): the control state machine, seeks with and without preroll,
+// scans and their end, and random seeks, pauses and resumes on channel
+// threads. What each channel delivers after a seek or a jump is checked
+// against the fixtures' cue tables and block lists from mkvinfo.
 
-#include <algorithm>
-#include <map>
+#include <mutex>
 #include <random>
 #include <thread>
 
 #include <gtest/gtest.h>
 
+#include "filter/mkv_context.h"
 #include "host/graph_runner.h"
 #include "platform/mmf_status.h"
 #include "tests/plugin/graph_harness.h"
-#include "tests/support/fixtures.h"
+#include "tests/plugin/playback_expectations.h"
 
 namespace {
 
-// One frame of a track as the fixture lists it, and the block it is in.
-struct Listed {
-  uint64_t time_us;
-  uint32_t size, adler32;
-  size_t block;      // index in the file's block list
-  bool block_start;  // the block's first frame
+using namespace playback_test;
+
+enum class Op { kStart, kStop, kPause, kResume, kStatus };
+
+struct ControlCase {
+  const char* name;
+  uint32_t before;
+  Op op;
+  int result;  // -1: the state after (Status)
+  uint32_t after;
 };
 
-struct Fixture {
-  explicit Fixture(const std::string& name) : expect(testing_support::LoadFixture(name)) {
-    scale = expect.timecode_scale / 1000;
-    for (size_t b = 0; b < expect.blocks.size(); ++b) {
-      const auto& block = expect.blocks[b];
-      for (size_t f = 0; f < block.frames.size(); ++f) {
-        tracks[block.track].push_back(
-            {uint64_t(block.ticks) * scale, block.frames[f].size, block.frames[f].adler32, b, f == 0});
-      }
-    }
-    for (const auto& cue : expect.cues) {
-      if (!cue_times.empty() && cue_times.back() == cue.time_ticks * scale) continue;
-      cue_times.push_back(cue.time_ticks * scale);
-      cue_tracks.push_back(cue.track);
-    }
-  }
+class MediaControlTest : public testing::TestWithParam<ControlCase> {};
 
-  // The first cue point after t, or the last.
-  size_t Forward(uint64_t t) const {
-    size_t f = 0;
-    while (f + 1 < cue_times.size() && cue_times[f] <= t) ++f;
-    return f;
-  }
-  // The last cue point at or before t (the first when none is), except that
-  // the last one's own time gives the one before.
-  size_t Backward(uint64_t t) const {
-    const size_t f = Forward(t);
-    if (cue_times[f] > t) return f == 0 ? 0 : f - 1;
-    return t > cue_times[f] || f == 0 ? f : f - 1;
-  }
+TEST_P(MediaControlTest, OperationMovesTheState) {
+  const ControlCase& c = GetParam();
+  plugin_test::Connected connected = plugin_test::ConnectFile("tiny_avc");
+  ASSERT_TRUE(connected.graph->rated());
+  connected.context()->ControlState = c.before;
+  const auto* control = plugin_test::HostPlugin().Get<MmfMediaControlOps>("MediaControl");
+  int (*const call[])(MmfFilterHandle*) = {control->Start, control->Stop, control->Pause, control->Resume, control->Status};
+  EXPECT_EQ(call[int(c.op)](connected.graph->handle()), c.result == -1 ? int(c.after) : c.result);
+  EXPECT_EQ(connected.context()->ControlState, c.after);
+}
 
-  // Index in `track`'s frames of its first frame in the Cluster of cue point
-  // i: a Cluster opens with its cue track's block at the cue time.
-  size_t FirstFrameInCluster(uint64_t track, size_t cue) const {
-    size_t start = 0;
-    while (start < expect.blocks.size() && !(expect.blocks[start].track == cue_tracks[cue] &&
-                                             uint64_t(expect.blocks[start].ticks) * scale == cue_times[cue])) {
-      ++start;
-    }
-    const auto& frames = tracks.at(track);
-    size_t i = 0;
-    while (i < frames.size() && frames[i].block < start) ++i;
-    return i;
+INSTANTIATE_TEST_SUITE_P(
+    States, MediaControlTest,
+    testing::Values(ControlCase{"StartFromStopped", 16, Op::kStart, 0, 64},
+                    ControlCase{"ResumeFromRunning", 64, Op::kResume, 0, 256},
+                    ControlCase{"PauseAfterResume", 256, Op::kPause, 0, 64},
+                    ControlCase{"PauseAfterError", 1, Op::kPause, 0, 64},
+                    ControlCase{"PauseWhenStoppedChangesNothing", 16, Op::kPause, 0, 16},
+                    ControlCase{"StopWhenRunning", 64, Op::kStop, 0, 16},
+                    ControlCase{"StopAfterErrorAnswers4041", 1, Op::kStop, 4041, 16},
+                    ControlCase{"StatusAnswersTheState", 256, Op::kStatus, -1, 256}),
+    [](const testing::TestParamInfo<ControlCase>& info) { return info.param.name; });
+
+TEST(MediaControlNextBufferTest, StatesBelowRunningExceptFourAreAnsweredAtOnce) {
+  plugin_test::Connected connected = plugin_test::ConnectFile("tiny_avc");
+  ASSERT_TRUE(connected.graph->rated());
+  const MmfMediaOutputOps* output = plugin_test::HostPlugin().output();
+  for (uint32_t state : {0u, 1u, 2u, 16u, 32u}) {
+    connected.context()->ControlState = state;
+    MmfMra* mra = reinterpret_cast<MmfMra*>(&state);
+    EXPECT_EQ(output->NextBuffer(AsFrameworkChannel(&connected.channel(0)), &mra), static_cast<int>(state));
+    EXPECT_EQ(mra, nullptr);
+    EXPECT_EQ(connected.channel(0).State->DecoderConfigSent, 0u) << "nothing was touched";
   }
+}
 
-  testing_support::FixtureExpectation expect;
-  uint64_t scale = 0;
-  std::map<uint64_t, std::vector<Listed>> tracks;
-  std::vector<uint64_t> cue_times;
-  std::vector<uint64_t> cue_tracks;
-};
-
-// long_cues and no_cues offer their tracks 1 and 2 as channels 0 and 1.
+// long_cues, no_cues and multi_audio offer their tracks 1, 2, ... as channels 0, 1, ...
 uint64_t TrackOf(const host::ChannelRun& run) { return uint64_t(run.index) + 1; }
 
 // The frames between control sequence k - 1 and k (0: from the start).
@@ -87,24 +78,21 @@ std::vector<host::RunFrame> Segment(const host::ChannelRun& run, size_t k) {
   return {run.frames.begin() + ptrdiff_t(from), run.frames.begin() + ptrdiff_t(to)};
 }
 
-// "" when `got` is listed[from...] in order (all of it to the end when
-// `to_end`), else the first difference.
-std::string Follows(const std::vector<host::RunFrame>& got, const std::vector<Listed>& listed, size_t from,
-                    bool to_end) {
-  for (size_t j = 0; j < got.size(); ++j) {
-    if (from + j >= listed.size()) return "frame " + std::to_string(j) + " is past the track's end";
-    const Listed& want = listed[from + j];
-    if (got[j].time_us != want.time_us || got[j].size != want.size || got[j].adler32 != want.adler32) {
-      return "frame " + std::to_string(j) + ": got " + std::to_string(got[j].time_us) + " us " +
-             std::to_string(got[j].size) + " bytes, expected " + std::to_string(want.time_us) + " us " +
-             std::to_string(want.size) + " bytes";
+// The preroll-time properties (125) each channel received, from the sinks' threads.
+struct PrerollTimes {
+  std::mutex mutex;
+  std::map<int32_t, std::vector<uint64_t>> values;
+  static void Record(void* user, int32_t channel, MmfMra* mra) {
+    auto* self = static_cast<PrerollTimes*>(user);
+    uint32_t kind = 0, type = 0, low = 0;
+    uint16_t high = 0;
+    for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
+      if (kind != kMmfElementProperty || MmfGetMraPropertyElement(mra, i, &type, &low, &high) != 0) continue;
+      std::lock_guard<std::mutex> lock(self->mutex);
+      if (type == kMmfPropPrerollTime) self->values[channel].push_back(MmfPropertyValue(low, high));
     }
   }
-  if (to_end && from + got.size() != listed.size()) {
-    return std::to_string(got.size()) + " frames, expected " + std::to_string(listed.size() - from);
-  }
-  return "";
-}
+};
 
 host::RunnerOptions Options(std::vector<host::ControlAction> actions, bool preroll = false) {
   host::RunnerOptions options;
@@ -135,10 +123,14 @@ class ControlledSeekTest : public testing::TestWithParam<SeekCase> {};
 // start time (T; else the cue's time), which is delivered instead of dropped.
 TEST_P(ControlledSeekTest, EachChannelResumesAtTheFirstFrameOfTheChosenCluster) {
   const SeekCase& c = GetParam();
-  Fixture fx("long_cues");
+  CueModel fx("long_cues");
   std::vector<host::ControlAction> actions;
   for (uint64_t target : c.targets) actions.push_back(SeekTo(target, 1000000));
-  host::RunResult result = Play(Options(actions, c.preroll));
+  PrerollTimes preroll;
+  host::RunnerOptions options = Options(actions, c.preroll);
+  options.on_buffer = PrerollTimes::Record;
+  options.user = &preroll;
+  host::RunResult result = Play(options);
   ASSERT_TRUE(result.ok) << result.error;
   ASSERT_EQ(result.control_results, std::vector<int>(c.targets.size(), 0));
   ASSERT_EQ(result.channels.size(), 2u);
@@ -154,7 +146,7 @@ TEST_P(ControlledSeekTest, EachChannelResumesAtTheFirstFrameOfTheChosenCluster) 
       const size_t from = fx.FirstFrameInCluster(TrackOf(run), cue);
       const std::vector<host::RunFrame> got = Segment(run, k + 1);
       ASSERT_EQ(Follows(got, listed, from, k + 1 == c.targets.size()), "");
-      const uint64_t start = c.preroll && target != 0 ? target : fx.cue_times[cue];
+      const uint64_t start = c.preroll && target != 0 ? target : fx.times[cue];
       for (size_t j = 0; j < got.size(); ++j) {
         const Listed& frame = listed[from + j];
         const bool preroll_block = c.preroll && frame.time_us < start;
@@ -164,6 +156,18 @@ TEST_P(ControlledSeekTest, EachChannelResumesAtTheFirstFrameOfTheChosenCluster) 
               << "frame " << j << " at " << frame.time_us << " us";
         }
       }
+    }
+    // With preroll the last seek reports its time once; an earlier one may be
+    // overtaken by the next before anything is delivered.
+    const std::vector<uint64_t>& reported = preroll.values[run.index];
+    EXPECT_EQ(reported.empty(), !c.preroll);
+    size_t k = 0;
+    for (uint64_t time : reported) {
+      while (k < c.targets.size() && c.targets[k] != time) ++k;
+      EXPECT_LT(k++, c.targets.size()) << time << " us reported out of order or twice";
+    }
+    if (c.preroll) {
+      EXPECT_EQ(reported.back(), c.targets.back());
     }
   }
 }
@@ -182,7 +186,7 @@ INSTANTIATE_TEST_SUITE_P(LongCues, ControlledSeekTest,
 // Without Cues only the start can be found: a seek to 0 plays the file again,
 // any other time is refused with 4002 and playback goes on where it was.
 TEST(ControlledSeekWithoutCuesTest, ZeroReplaysAndAnyOtherTimeIsRefusedWithoutLosingAFrame) {
-  Fixture fx("no_cues");
+  CueModel fx("no_cues");
   host::RunResult result = Play(Options({SeekTo(5000000, 500000), SeekTo(0, 1000000)}), "no_cues");
   ASSERT_TRUE(result.ok) << result.error;
   EXPECT_EQ(result.control_results, (std::vector<int>{4002, 0}));
@@ -222,7 +226,7 @@ class ControlledScanTest : public testing::TestWithParam<ScanCase> {};
 // scan ends at the end of the cue table.
 TEST_P(ControlledScanTest, EachJumpDeliversTheFirstTrickTimeOfTheNextCuePointsCluster) {
   const ScanCase& c = GetParam();
-  Fixture fx("long_cues");
+  CueModel fx("long_cues");
   const auto kind = c.forward ? host::ControlAction::kScanForward : host::ControlAction::kScanBackward;
   host::RunnerOptions options = Options({SeekTo(c.from_us, 0), {kind, c.from_us, 0, c.speed}});
   options.channels = {0};
@@ -238,13 +242,13 @@ TEST_P(ControlledScanTest, EachJumpDeliversTheFirstTrickTimeOfTheNextCuePointsCl
   ASSERT_FALSE(jumps.empty());
   const uint64_t skip = 500 * (1000 * uint64_t(c.speed)) / 100;
   size_t cue = fx.Forward(jumps[0][0].time_us - 1);
-  ASSERT_EQ(fx.cue_times[cue], jumps[0][0].time_us) << "the first jump lands on a cue point";
+  ASSERT_EQ(fx.times[cue], jumps[0][0].time_us) << "the first jump lands on a cue point";
   if (c.forward) {
     EXPECT_GT(jumps[0][0].time_us, c.from_us) << "the scan starts after the clock's time";
   }
   for (size_t k = 0; k < jumps.size(); ++k) {
-    SCOPED_TRACE("jump " + std::to_string(k) + " to " + std::to_string(fx.cue_times[cue]));
-    const uint64_t t = fx.cue_times[cue];
+    SCOPED_TRACE("jump " + std::to_string(k) + " to " + std::to_string(fx.times[cue]));
+    const uint64_t t = fx.times[cue];
     std::vector<Listed> window;
     for (size_t i = fx.FirstFrameInCluster(1, cue); i < listed.size(); ++i) {
       if (listed[i].time_us >= t && listed[i].time_us <= t + 500000) window.push_back(listed[i]);
@@ -252,7 +256,7 @@ TEST_P(ControlledScanTest, EachJumpDeliversTheFirstTrickTimeOfTheNextCuePointsCl
     EXPECT_EQ(Follows(jumps[k], window, 0, false), "");
     const size_t next = c.forward ? fx.Forward(t + 500000 + skip) : fx.Backward(t > skip ? t - skip : t);
     if (k + 1 == jumps.size()) {
-      EXPECT_EQ(fx.cue_times[next], t) << "the last jump is at the end of the cue table";
+      EXPECT_EQ(fx.times[next], t) << "the last jump is at the end of the cue table";
     }
     cue = next;
   }
@@ -269,7 +273,7 @@ INSTANTIATE_TEST_SUITE_P(LongCues, ControlledScanTest,
 // a cue point (the one after the clock's time, which the sinks move), every
 // frame to the end.
 TEST(ControlledScanEndTest, NormalDeliveryResumesAtTheNextCuePointsCluster) {
-  Fixture fx("long_cues");
+  CueModel fx("long_cues");
   host::RunnerOptions options = Options({SeekTo(1000000, 0), {host::ControlAction::kScanForward, 1000000, 0, 100},
                                          {host::ControlAction::kScanEnd, 9000000, 0, 0}});
   host::RunResult result = Play(options);
@@ -285,9 +289,68 @@ TEST(ControlledScanEndTest, NormalDeliveryResumesAtTheNextCuePointsCluster) {
     // The cue point is the first video frame's time; the audio channel opens in the same Cluster.
     const uint64_t resumed = Segment(video, 3).at(0).time_us;
     const size_t cue = fx.Forward(resumed - 1);
-    ASSERT_EQ(fx.cue_times[cue], resumed);
+    ASSERT_EQ(fx.times[cue], resumed);
     EXPECT_EQ(Follows(after, fx.tracks.at(TrackOf(run)), fx.FirstFrameInCluster(TrackOf(run), cue), true), "");
   }
 }
+
+struct StressCase {
+  const char* file;
+  uint32_t seed;
+  uint64_t seek_range_us;  // seek targets fall in [0, this)
+};
+
+class ControlStressTest : public testing::TestWithParam<StressCase> {};
+
+// Channel threads at different paces and a controller thread that seeks,
+// pauses and resumes at random moments (fixed seeds, bounded rounds), then
+// stops: nothing hangs, and between two seeks each channel delivers its
+// track's frames without loss, repetition or reordering, from the first frame
+// of the Cluster that the seek's cue search picks.
+TEST_P(ControlStressTest, RandomSeeksPausesAndAStopNeitherHangNorLoseFrames) {
+  const StressCase& c = GetParam();
+  CueModel fx(c.file);
+  std::vector<uint64_t> targets;
+  host::RunnerOptions options;
+  options.input_buffer_size = 2048;  // many buffers: the ring fills and the faster channel waits
+  options.sink_delay_us = {0, 200, 50, 0};
+  options.script = [&targets, &c](host::PlaybackControl& control) {
+    std::mt19937 random(c.seed);
+    for (int round = 0; round < 30; ++round) {
+      const uint32_t pick = random() % 4;
+      if (pick < 2) {
+        targets.push_back(random() % c.seek_range_us);
+        EXPECT_EQ(control.Seek(targets.back()), 0);
+      } else {
+        EXPECT_EQ(pick == 2 ? control.Pause() : control.Resume(), 0);
+      }
+      std::this_thread::sleep_for(std::chrono::microseconds(random() % 3000));
+    }
+    (void)control.Stop();
+  };
+  host::RunResult result = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(c.file), options);
+  ASSERT_EQ(result.channels.size(), c.file == std::string("long_cues") ? 2u : 4u) << result.error;
+  for (const host::ChannelRun& run : result.channels) {
+    SCOPED_TRACE(run.name);
+    EXPECT_TRUE(run.end_result == kMmfEndOfStream || run.end_result == 16) << run.end_result;
+    EXPECT_EQ(run.foreign_elements, 0u);
+    EXPECT_FALSE(run.frames.empty());
+    ASSERT_EQ(run.seeks.size(), targets.size());
+    for (size_t k = 0; k <= targets.size(); ++k) {
+      const size_t first = k == 0 ? 0 : fx.FirstFrameInCluster(TrackOf(run), fx.Backward(targets[k - 1]));
+      ASSERT_EQ(Follows(Segment(run, k), fx.tracks.at(TrackOf(run)), first, false), "")
+          << "segment " << k << " (after the seek to " << (k ? targets[k - 1] : 0) << " us)";
+    }
+  }
+}
+
+// long_cues: two channels, 50 cue points; multi_audio: four channels, two cue points.
+INSTANTIATE_TEST_SUITE_P(Seeds, ControlStressTest,
+                         testing::Values(StressCase{"long_cues", 1, 26000000}, StressCase{"long_cues", 7, 26000000},
+                                         StressCase{"long_cues", 2026, 26000000},
+                                         StressCase{"multi_audio", 3, 2500000}),
+                         [](const testing::TestParamInfo<StressCase>& info) {
+                           return std::string(info.param.file) + "_seed" + std::to_string(info.param.seed);
+                         });
 
 }  // namespace

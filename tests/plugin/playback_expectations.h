@@ -1,9 +1,10 @@
 #pragma once
 // What a played fixture must deliver: for each offered track, the frames that
 // mkvinfo listed (NAME.blocks, or NAME.frames for a track stored with header
-// removal), with times of ticks × (TimecodeScale / 1000) microseconds.
+// removal), with times of ticks × (TimecodeScale / 1000) microseconds; and the
+// fixture's cue table with the searches a seek or a scan chooses cue points by.
 
-#include <cstring>
+#include <map>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -12,13 +13,10 @@
 
 #include "core/codec_table.h"
 #include "host/graph_runner.h"
+#include "tests/support/cluster_driver.h"
 #include "tests/support/fixtures.h"
 
 namespace playback_test {
-
-using testing_support::ExpectedFrame;
-using testing_support::FixtureExpectation;
-
 
 using testing_support::ExpectedFrame;
 using testing_support::FixtureExpectation;
@@ -34,18 +32,16 @@ inline std::ostream& operator<<(std::ostream& out, const Frame& f) {
   return out << "{" << f.time_us << " us, " << f.size << " bytes, " << std::hex << f.adler32 << std::dec << "}";
 }
 
-inline bool Supported(const std::string& codec) {
-  for (const mkv_codec_row& row : supported_codec_id) {
-    if (codec == row.codec_id) return true;
-  }
-  return false;
-}
-
 // Output channels follow the supported tracks in file order.
 inline std::vector<uint64_t> OfferedTracks(const FixtureExpectation& fixture) {
   std::vector<uint64_t> tracks;
   for (const auto& track : fixture.tracks) {
-    if (Supported(track.codec)) tracks.push_back(track.number);
+    for (const mkv_codec_row& row : supported_codec_id) {
+      if (track.codec == row.codec_id) {
+        tracks.push_back(track.number);
+        break;
+      }
+    }
   }
   return tracks;
 }
@@ -53,12 +49,9 @@ inline std::vector<uint64_t> OfferedTracks(const FixtureExpectation& fixture) {
 inline std::vector<Frame> ExpectedFrames(const std::string& name, const FixtureExpectation& fixture, uint64_t track) {
   const uint64_t scale = fixture.timecode_scale / 1000;
   std::vector<Frame> frames;
-  std::vector<testing_support::ExpectedFullFrame> full;
   for (const auto& t : fixture.tracks) {
-    if (t.number == track && t.fields.count("compression")) full = testing_support::LoadFullFrames(name);
-  }
-  if (!full.empty()) {
-    for (const auto& f : full) {
+    if (t.number != track || !t.fields.count("compression")) continue;
+    for (const auto& f : testing_support::LoadFullFrames(name)) {
       if (f.track == track) frames.push_back({static_cast<uint64_t>(f.ticks) * scale, f.size, f.adler32});
     }
     return frames;
@@ -70,9 +63,10 @@ inline std::vector<Frame> ExpectedFrames(const std::string& name, const FixtureE
   return frames;
 }
 
-inline std::vector<Frame> Delivered(const host::ChannelRun& run) {
+template <typename Got>
+std::vector<Frame> AsFrames(const std::vector<Got>& got) {
   std::vector<Frame> frames;
-  for (const host::RunFrame& f : run.frames) frames.push_back({f.time_us, f.size, f.adler32});
+  for (const Got& f : got) frames.push_back({f.time_us, f.size, f.adler32});
   return frames;
 }
 
@@ -89,13 +83,14 @@ inline std::string FirstDifference(const std::vector<Frame>& got, const std::vec
 }
 
 inline void CheckRun(const std::string& name, const FixtureExpectation& fixture, const std::vector<uint64_t>& offered,
-              const host::RunResult& result) {
+                     const host::RunResult& result) {
   ASSERT_TRUE(result.ok) << result.error;
   for (const host::ChannelRun& run : result.channels) {
     SCOPED_TRACE("channel " + std::to_string(run.index));
     const uint64_t track = offered[static_cast<size_t>(run.index)];
-    EXPECT_EQ(FirstDifference(Delivered(run), ExpectedFrames(name, fixture, track)), "") << "track " << track;
+    EXPECT_EQ(FirstDifference(AsFrames(run.frames), ExpectedFrames(name, fixture, track)), "") << "track " << track;
     EXPECT_EQ(run.foreign_elements, 0u) << "a frame element points outside the input buffers";
+    EXPECT_FALSE(run.incomplete_frame);
     // The first buffer: the whole CodecPrivate, or the three Vorbis headers without their lacing.
     for (const auto& t : fixture.tracks) {
       if (t.number != track) continue;
@@ -111,8 +106,83 @@ inline void CheckRun(const std::string& name, const FixtureExpectation& fixture,
         EXPECT_EQ(total, t.codec_private_size);
       }
     }
-    EXPECT_FALSE(run.incomplete_frame);
   }
+}
+
+// One frame of a track as the fixture lists it, and the block it is in.
+struct Listed : Frame {
+  size_t block;      // index in the file's block list
+  bool block_start;  // the block's first frame
+};
+
+// A fixture's frames per track and its cue points (one per distinct time, at
+// the earliest Cluster), with file offsets from the file's own bytes.
+struct CueModel {
+  explicit CueModel(const std::string& name) : expect(testing_support::LoadFixture(name)) {
+    scale = expect.timecode_scale / 1000;
+    for (size_t b = 0; b < expect.blocks.size(); ++b) {
+      const auto& block = expect.blocks[b];
+      for (size_t f = 0; f < block.frames.size(); ++f) {
+        tracks[block.track].push_back(
+            {{uint64_t(block.ticks) * scale, block.frames[f].size, block.frames[f].adler32}, b, f == 0});
+      }
+    }
+    const std::vector<uint8_t> bytes = testing_support::ReadFixtureBytes(name);
+    first_cluster = testing_support::FirstClusterOffset(bytes.data(), bytes.size());
+    if (expect.cues.empty()) return;
+    segment_data = first_cluster - expect.cues[0].cluster_position;
+    for (const auto& cue : expect.cues) {
+      const uint64_t position = cue.cluster_position + segment_data;
+      if (!times.empty() && times.back() == cue.time_ticks * scale) {
+        positions.back() = std::min(positions.back(), position);
+        continue;
+      }
+      times.push_back(cue.time_ticks * scale);
+      positions.push_back(position);
+      cue_tracks.push_back(cue.track);
+    }
+  }
+
+  // The first cue point after t, or the last.
+  size_t Forward(uint64_t t) const {
+    size_t f = 0;
+    while (f + 1 < times.size() && times[f] <= t) ++f;
+    return f;
+  }
+  // The last cue point at or before t (the first when none is), except that
+  // the last one's own time gives the one before.
+  size_t Backward(uint64_t t) const {
+    const size_t f = Forward(t);
+    if (times[f] > t) return f == 0 ? 0 : f - 1;
+    return t > times[f] || f == 0 ? f : f - 1;
+  }
+  // Index in `track`'s frames of its first frame in the Cluster of cue point
+  // `cue`: a Cluster opens with its cue track's block at the cue time.
+  size_t FirstFrameInCluster(uint64_t track, size_t cue) const {
+    size_t start = 0;
+    while (start < expect.blocks.size() &&
+           !(expect.blocks[start].track == cue_tracks[cue] && uint64_t(expect.blocks[start].ticks) * scale == times[cue])) {
+      ++start;
+    }
+    const auto& frames = tracks.at(track);
+    size_t i = 0;
+    while (i < frames.size() && frames[i].block < start) ++i;
+    return i;
+  }
+
+  FixtureExpectation expect;
+  uint64_t scale = 0, first_cluster = 0, segment_data = 0;
+  std::map<uint64_t, std::vector<Listed>> tracks;
+  std::vector<uint64_t> times, positions, cue_tracks;
+};
+
+// "" when `got` is listed[from...] in order (all of it to the end when
+// `to_end`), else the first difference.
+inline std::string Follows(const std::vector<host::RunFrame>& got, const std::vector<Listed>& listed, size_t from,
+                           bool to_end) {
+  const size_t end = to_end ? listed.size() : std::min(listed.size(), from + got.size());
+  return FirstDifference(AsFrames(got), std::vector<Frame>(listed.begin() + ptrdiff_t(std::min(from, end)),
+                                                           listed.begin() + ptrdiff_t(end)));
 }
 
 }  // namespace playback_test

@@ -1,6 +1,8 @@
-// Trick play through the plug-in's tables. Scans drive a
-// real file streamer in list mode: every request it reads (time marker, file
-// offset, bytes) must be the cue point that long_cues.cues leads to.
+// Trick play through the plug-in's tables. Scans drive a real file streamer
+// in list mode: every request it reads (time marker, file offset, bytes) must
+// be the cue point that long_cues.cues leads to: each next request names the
+// Cluster of the cue point that the previous request's time, moved by
+// TrickTime and the speed, leads to.
 
 #include <algorithm>
 
@@ -10,8 +12,7 @@
 #include "host/graph_clock.h"
 #include "platform/mmf_status.h"
 #include "tests/plugin/graph_harness.h"
-#include "tests/support/cluster_driver.h"
-#include "tests/support/fixtures.h"
+#include "tests/plugin/playback_expectations.h"
 #include "tests/support/log_recorder.h"
 
 namespace {
@@ -32,48 +33,6 @@ struct Read {
 std::ostream& operator<<(std::ostream& out, const Read& r) {
   return out << "{" << r.time << " us at " << r.offset << ", " << r.bytes << " bytes}";
 }
-
-// The cue table from mkvinfo, with the searches the cue points are chosen by.
-class CueTable {
- public:
-  explicit CueTable(const std::string& name) {
-    auto fixture = testing_support::LoadFixture(name);
-    auto bytes = testing_support::ReadFixtureBytes(name);
-    const uint64_t segment = testing_support::FirstClusterOffset(bytes.data(), bytes.size()) -
-                             fixture.cues.at(0).cluster_position;
-    for (const auto& cue : fixture.cues) {
-      const uint64_t time = cue.time_ticks * (fixture.timecode_scale / 1000);
-      const uint64_t position = cue.cluster_position + segment;
-      if (!times_.empty() && times_.back() == time) {
-        positions_.back() = std::min(positions_.back(), position);
-      } else {
-        times_.push_back(time);
-        positions_.push_back(position);
-      }
-    }
-  }
-  size_t size() const { return times_.size(); }
-  uint64_t time(size_t i) const { return times_[i]; }
-  uint64_t position(size_t i) const { return positions_[i]; }
-
-  // The first cue point after t, or the last.
-  size_t Forward(uint64_t t) const {
-    for (size_t i = 0; i < size(); ++i) {
-      if (times_[i] > t) return i;
-    }
-    return size() - 1;
-  }
-  // The last at or before t, the first when none is; at the last one's time, the one before.
-  size_t Backward(uint64_t t) const {
-    size_t i = Forward(t);
-    if (times_[i] > t) return i == 0 ? 0 : i - 1;
-    return t > times_[i] || i == 0 ? i : i - 1;
-  }
-
- private:
-  std::vector<uint64_t> times_;
-  std::vector<uint64_t> positions_;
-};
 
 // long_cues with the streamer, its list maker and the graph clock connected
 // as the framework connects them; `channels` are the outputs acquired.
@@ -137,7 +96,7 @@ class TrickPlayTest : public testing::Test {
 
   MkvContext* context() { return connected_.context(); }
 
-  CueTable cues_{"long_cues"};
+  playback_test::CueModel cues_{"long_cues"};
   plugin_test::Connected connected_;
   MmfFilterHandle* handle_ = nullptr;
   std::unique_ptr<host::InputStream> source_;
@@ -166,10 +125,10 @@ TEST_P(ScanTest, EveryStepReadsTheClusterOfTheExpectedCuePoint) {
   std::vector<Read> expected;
   size_t cue = k.forward ? cues_.Forward(k.now_us) : cues_.Backward(k.now_us);
   for (;;) {
-    expected.push_back({cues_.time(cue), cues_.position(cue), kBufferSize});
-    const uint64_t t = cues_.time(cue);
+    expected.push_back({cues_.times.at(cue), cues_.positions.at(cue), kBufferSize});
+    const uint64_t t = cues_.times.at(cue);
     const size_t next = k.forward ? cues_.Forward(t + 500000 + skip) : cues_.Backward(t > skip ? t - skip : t);
-    if (cues_.time(next) == t) break;
+    if (cues_.times.at(next) == t) break;
     cue = next;
   }
   ASSERT_EQ(k.forward ? Trick().ScanForward(handle_, k.speed) : Trick().ScanBackward(handle_, k.speed), 0);
@@ -189,15 +148,30 @@ INSTANTIATE_TEST_SUITE_P(LongCues, ScanTest,
                                          ScanCase{"BackwardSpeed100FromTheEnd", false, 100, 30000000}),
                          [](const testing::TestParamInfo<ScanCase>& info) { return info.param.name; });
 
-TEST_F(TrickPlayTest, TheFirstRequestIsTrickTimesBytesRaisedToWholeInputBuffers) {
+TEST_F(TrickPlayTest, TheRequestIsTrickTimesBytesRaisedToWholeInputBuffersAndEndsWithoutAByteRate) {
   Connect("long_cues", {0, 1});
   context()->ByteRate = 100000;  // 50000 bytes in 500 ms: 49 buffers of 1024
   clock_.Consumed(7200000);
   ASSERT_EQ(Trick().ScanForward(handle_, 100), 0);
   const MmfReadRequest& request = *context()->CurrentReadList->Request;
   EXPECT_EQ(request.Length, 50176);
-  EXPECT_EQ(request.Time, cues_.time(cues_.Forward(7200000)));
+  EXPECT_EQ(request.Time, cues_.times.at(cues_.Forward(7200000)));
   EXPECT_EQ(context()->CurrentReadList->Ready, 1u);
+
+  // The list maker hands an entry other than the current one the current one back.
+  MmfReadListEntry* current = context()->CurrentReadList;
+  const auto* list_maker = HostPlugin().Get<MmfListMakerOps>("MediaListMaker");
+  for (MmfReadListEntry* other : {static_cast<MmfReadListEntry*>(nullptr), current + 1}) {
+    MmfReadListEntry* out = nullptr;
+    ASSERT_EQ(list_maker->GetNextReadList(handle_->InputChannel, &out, other), 0);
+    EXPECT_EQ(out, current);
+  }
+  // Without a byte rate the next request ends the stream.
+  context()->ByteRate = 0;
+  MmfReadListEntry* next = nullptr;
+  ASSERT_EQ(list_maker->GetNextReadList(handle_->InputChannel, &next, current), 0);
+  EXPECT_NE(next, current);
+  EXPECT_EQ(next->Request->Length, -1);
 }
 
 TEST_F(TrickPlayTest, ScanEndPutsANormalRequestInTheScansDirectionAndStreamsOnFromIt) {
@@ -215,7 +189,7 @@ TEST_F(TrickPlayTest, ScanEndPutsANormalRequestInTheScansDirectionAndStreamsOnFr
     const size_t cue = forward ? cues_.Forward(12250000) : cues_.Backward(12250000);
     std::vector<Read> reads = Reads(8);
     ASSERT_EQ(reads.size(), 1u) << "one marker, then the file in order";
-    EXPECT_EQ(reads[0], (Read{cues_.time(cue), cues_.position(cue), 8 * kBufferSize}));
+    EXPECT_EQ(reads[0], (Read{cues_.times.at(cue), cues_.positions.at(cue), 8 * kBufferSize}));
     TearDown();
   }
 }
@@ -244,8 +218,8 @@ TEST_P(AudioScanTest, OnlyASlowAudioOnlyScanStreamsOnWithoutSkipping) {
   const size_t cue = cues_.Forward(9100000);
   std::vector<Read> reads = Reads(6);
   ASSERT_FALSE(reads.empty());
-  EXPECT_EQ(reads[0].time, cues_.time(cue));
-  EXPECT_EQ(reads[0].offset, cues_.position(cue));
+  EXPECT_EQ(reads[0].time, cues_.times.at(cue));
+  EXPECT_EQ(reads[0].offset, cues_.positions.at(cue));
   if (k.skips) {
     EXPECT_GT(reads.size(), 1u) << "one request per cue point";
     for (const Read& read : reads) EXPECT_EQ(read.bytes, kBufferSize);

@@ -1,6 +1,9 @@
-// Output assembly on crafted input: what lies between Clusters, laces with
-// empty frames or bytes after their last frame, and an input buffer with more
-// properties than an output buffer has room for.
+// Playback through a real graph (streamer → kelvane → one sink per acquired
+// channel): every fixture against mkvinfo's frames at several input buffer
+// sizes, channels pulled at different speeds on their own threads, and
+// output assembly on crafted input (what lies between Clusters, laces with
+// empty frames or bytes after their last frame, more input properties than an
+// output buffer has room for, a decoder configuration too large).
 
 #include <cstdio>
 #include <fstream>
@@ -14,6 +17,7 @@
 #include "platform/mmf_status.h"
 #include "platform/mra_pool.h"
 #include "tests/plugin/graph_harness.h"
+#include "tests/plugin/playback_expectations.h"
 #include "tests/support/block_builder.h"
 #include "tests/support/cluster_driver.h"
 #include "tests/support/fixtures.h"
@@ -22,6 +26,63 @@
 namespace {
 
 using ebml::Bytes;
+using namespace playback_test;
+
+class PlaybackFixtureTest : public testing::TestWithParam<std::string> {};
+
+// With several tracks, also each channel acquired alone.
+TEST_P(PlaybackFixtureTest, EveryTrackDeliversTheListedFramesAtEveryBufferSize) {
+  const std::string name = GetParam();
+  const FixtureExpectation fixture = testing_support::LoadFixture(name);
+  const std::vector<uint64_t> offered = OfferedTracks(fixture);
+  if (fixture.doc_type != "matroska" || offered.empty()) {
+    host::RunResult refused = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), {});
+    EXPECT_EQ(refused.rating, 0);
+    EXPECT_TRUE(refused.channels.empty());
+    return;
+  }
+  for (uint32_t size : {1000u, 4096u, 32768u, 1u << 20}) {
+    SCOPED_TRACE("input buffers of " + std::to_string(size) + " bytes");
+    host::RunnerOptions options;
+    options.input_buffer_size = size;
+    for (int32_t only = offered.size() < 2 ? -1 : int32_t(offered.size()) - 1; only >= -1; --only) {
+      SCOPED_TRACE(only < 0 ? "every channel acquired" : "only channel " + std::to_string(only) + " acquired");
+      options.channels = only < 0 ? std::vector<int32_t>{} : std::vector<int32_t>{only};
+      CheckRun(name, fixture, offered, host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), options));
+    }
+  }
+}
+
+INSTANTIATE_TEST_SUITE_P(Fixtures, PlaybackFixtureTest, testing::ValuesIn(testing_support::FixtureNames()),
+                         [](const testing::TestParamInfo<std::string>& info) { return info.param; });
+
+struct ThreadsCase {
+  const char* fixture;
+  std::vector<uint32_t> sink_delay_us;  // per channel
+};
+
+class PlaybackThreadsTest : public testing::TestWithParam<ThreadsCase> {};
+
+// Each file is larger than 39 input buffers of 1000 bytes: while a slow sink
+// sleeps after its first buffer, the fast channels fill the ring and wait for
+// room until the slow one moves past the tail. Run under ThreadSanitizer.
+TEST_P(PlaybackThreadsTest, ChannelsAtDifferentSpeedsEachGetTheirWholeTrack) {
+  const ThreadsCase& c = GetParam();
+  const FixtureExpectation fixture = testing_support::LoadFixture(c.fixture);
+  host::RunnerOptions options;
+  options.input_buffer_size = 1000;
+  options.sink_delay_us = c.sink_delay_us;
+  CheckRun(c.fixture, fixture, OfferedTracks(fixture),
+           host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(c.fixture), options));
+}
+
+INSTANTIATE_TEST_SUITE_P(Speeds, PlaybackThreadsTest,
+                         testing::Values(ThreadsCase{"long_cues", {0, 3000}}, ThreadsCase{"long_cues", {3000, 0}},
+                                         ThreadsCase{"multi_audio", {2000, 0, 1000, 0}},
+                                         ThreadsCase{"multi_audio", {0, 0, 0, 3000}}),
+                         [](const testing::TestParamInfo<ThreadsCase>& info) {
+                           return std::string(info.param.fixture) + "_" + std::to_string(info.index);
+                         });
 
 // Info and Tracks of a file with one MP3 track.
 Bytes AudioHeader() {
