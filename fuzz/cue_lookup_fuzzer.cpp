@@ -1,0 +1,317 @@
+// Cue lookup and time/position conversion over cue tables made from the
+// input: arbitrary times and cluster positions, unsorted, repeated, next to
+// the 64-bit limits, or none at all; output channels with track numbers that
+// may or may not match, acquired or not. The input then names queries
+// (GetCueingPosition both ways, ConvertToPosition, ConvertToTime, Seek, the
+// byte-rate estimate, a channel's acquisition toggled) with fuzzed times and
+// positions. A small model of the search rules gives the one answer each
+// query may have; the filter's answer must be exactly that.
+//
+// Input: flags (bit 0: the file has Cues, bit 1: EnablePreroll), timecode
+// scale, Segment data position, first Cluster position, channel count (0-4)
+// with each channel's track and acquired bit, cue count (0-63) with each
+// cue's ticks and up to 4 positions (track, cluster, codec state), then
+// queries of one op byte and one number each until the input ends.
+
+#include <cstdint>
+#include <cstdlib>
+#include <memory>
+#include <vector>
+
+#include "core/memory.h"
+#include "core/queue.h"
+#include "filter/cue_search.h"
+#include "filter/mkv_context.h"
+#include "filter/rating.h"
+#include "filter/time_converter.h"
+#include "fuzz/fuzz_input.h"
+#include "host/heap_control.h"
+#include "host/log_control.h"
+
+namespace {
+
+constexpr uint32_t kMaxCues = 63;
+constexpr uint32_t kMaxPositionsPerCue = 4;
+constexpr int32_t kMaxChannels = 4;
+constexpr int kMaxQueries = 256;
+constexpr int kNoConversion = 4002;
+constexpr int kNoCueingData = 48;
+
+void Check(bool condition) {
+  if (!condition) std::abort();
+}
+
+struct ModelPosition {
+  uint64_t track, cluster;
+};
+struct ModelCue {
+  uint64_t ticks;
+  std::vector<ModelPosition> positions;
+};
+struct ModelChannel {
+  uint64_t track;
+  bool acquired;
+};
+
+// The search and conversion rules over plain vectors, in list order.
+struct Model {
+  bool has_cues = false;
+  bool preroll = false;
+  uint64_t scale = 0, segment = 0, first_cluster = 0;
+  std::vector<ModelCue> cues;
+  std::vector<ModelChannel> channels;
+  bool validated = false, all_tracks = false;
+  uint64_t last_position_time = 0;
+
+  uint64_t Time(const ModelCue& cue) const { return cue.ticks * (scale / 1000); }
+
+  void Validate() {
+    validated = true;
+    for (const ModelCue& cue : cues) {
+      for (const ModelPosition& p : cue.positions) {
+        for (const ModelChannel& c : channels) {
+          if (c.acquired && c.track == p.track) return;
+        }
+      }
+    }
+    all_tracks = true;
+  }
+
+  bool Counts(const ModelPosition& p) const {
+    for (const ModelChannel& c : channels) {
+      if (c.track == p.track) return c.acquired || all_tracks;
+    }
+    return false;
+  }
+
+  int Search(uint64_t* time, bool forward, uint64_t* position) {
+    if (!has_cues) return kNoCueingData;
+    *position = kNoCuePosition;
+    if (!validated) Validate();
+    if (cues.empty()) return 0;
+    const auto target = static_cast<int64_t>(*time);
+    size_t i = 0;
+    while (i + 1 < cues.size() && static_cast<int64_t>(Time(cues[i])) <= target) ++i;
+    const ModelCue& found = cues[i];
+    const ModelCue& before = i > 0 ? cues[i - 1] : found;
+    const ModelCue* chosen = &found;
+    if (!forward) {
+      const bool last = i + 1 == cues.size();
+      chosen = last && target > static_cast<int64_t>(Time(found)) ? &found : &before;
+    }
+    *time = Time(*chosen);
+    for (const ModelPosition& p : chosen->positions) {
+      if (!Counts(p)) continue;
+      const uint64_t bytes = segment + p.cluster;
+      if (static_cast<int64_t>(bytes) < static_cast<int64_t>(*position)) *position = bytes;
+    }
+    return 0;
+  }
+
+  int ToPosition(uint64_t time, uint64_t* position) {
+    last_position_time = time;
+    uint64_t copy = time;
+    if (Search(&copy, false, position) == 0) return 0;
+    if (time != 0) return kNoConversion;
+    *position = first_cluster;
+    return 0;
+  }
+
+  int ToTime(uint64_t position, uint64_t* time) {
+    if (last_position_time != 0 && preroll) {
+      *time = last_position_time;
+      last_position_time = 0;
+      return 0;
+    }
+    *time = 0;
+    if (!has_cues) return position == first_cluster ? 0 : kNoConversion;
+    if (!validated) Validate();
+    uint64_t previous = 0;
+    for (const ModelCue& cue : cues) {
+      for (const ModelPosition& p : cue.positions) {
+        if (!Counts(p)) continue;
+        const uint64_t bytes = segment + p.cluster;
+        if (bytes == position) {
+          *time = Time(cue);
+          return 0;
+        }
+        if (static_cast<int64_t>(bytes) > static_cast<int64_t>(position)) {
+          *time = previous;
+          return 0;
+        }
+      }
+      previous = Time(cue);
+    }
+    return 0;
+  }
+
+  int32_t ByteRate() {
+    uint64_t first_time = 0, last_time = INT64_MAX, first_position = 0, last_position = 0;
+    if (Search(&first_time, false, &first_position) != 0 || Search(&last_time, false, &last_position) != 0) return 0;
+    if (first_position == kNoCuePosition || last_position == kNoCuePosition) return 0;
+    const auto dt = static_cast<int64_t>(last_time - first_time);
+    const auto dpos = static_cast<int64_t>(last_position - first_position);
+    if (dt <= 0 || dpos <= 0 || dt / 1000000 <= 0) return 0;
+    return static_cast<int32_t>(dpos / (dt / 1000000));
+  }
+};
+
+// The filter's records around the same table.
+class FilterUnderTest {
+ public:
+  explicit FilterUnderTest(const Model& model)
+      : context_(std::make_unique<MkvContext>()),
+        channels_(model.channels.size()),
+        states_(model.channels.size()),
+        tracks_(model.channels.size()) {
+    filter_.Context = context_.get();
+    filter_.OutputChannels = channels_.data();
+    context_->OutputChannelCount = static_cast<int32_t>(model.channels.size());
+    context_->EnablePreroll = model.preroll ? 1 : 0;
+    for (size_t k = 0; k < model.channels.size(); ++k) {
+      tracks_[k].track_number = model.channels[k].track;
+      states_[k].Track = &tracks_[k];
+      states_[k].Acquired = model.channels[k].acquired ? 1 : 0;
+      channels_[k].State = &states_[k];
+      channels_[k].Flags = model.channels[k].acquired ? kChannelAcquired : 0;
+    }
+    mkv_file_info& info = context_->FileInfo;
+    info.timecode_scale = model.scale;
+    info.segment_data_position = model.segment;
+    info.first_cluster_position = model.first_cluster;
+    info.parse_flags = model.has_cues ? kMetCues : 0;
+    for (const ModelCue& row : model.cues) {
+      auto* cue = mem_new_zeroed<mkv_cue_point>();
+      Check(cue != nullptr);
+      cue->cue_time = row.ticks;
+      for (const ModelPosition& p : row.positions) {
+        auto* position = mem_new_zeroed<mkv_cue_track_position>();
+        Check(position != nullptr);
+        position->cue_track = p.track;
+        position->cue_cluster_position = p.cluster;
+        position->cue_codec_state = p.track & 1;
+        Check(mkv_queue_append(&cue->track_positions, position));
+      }
+      Check(mkv_queue_append(&info.cue_points, cue));
+    }
+  }
+  ~FilterUnderTest() { free_cue_points(&context_->FileInfo.cue_points); }
+
+  MkvFilter* filter() { return &filter_; }
+  MkvContext* context() { return context_.get(); }
+  MkvChannelState& state(size_t k) { return states_[k]; }
+  MkvChannel& channel(size_t k) { return channels_[k]; }
+
+ private:
+  MkvFilter filter_{};
+  std::unique_ptr<MkvContext> context_;
+  std::vector<MkvChannel> channels_;
+  std::vector<MkvChannelState> states_;
+  std::vector<mkv_track_info> tracks_;
+};
+
+Model ReadModel(fuzz_input::Reader& in) {
+  Model model;
+  const uint8_t flags = in.Byte();
+  model.has_cues = flags & 1;
+  model.preroll = flags & 2;
+  model.scale = in.Number();
+  model.segment = in.Number();
+  model.first_cluster = in.Number();
+  const auto channel_count = static_cast<int32_t>(in.Byte() % (kMaxChannels + 1));
+  for (int32_t k = 0; k < channel_count; ++k) {
+    const uint8_t b = in.Byte();
+    model.channels.push_back({static_cast<uint64_t>(b & 7), (b & 8) != 0});
+  }
+  const uint32_t cue_count = in.Byte() % (kMaxCues + 1);
+  for (uint32_t i = 0; i < cue_count && !in.empty(); ++i) {
+    ModelCue cue{in.Number(), {}};
+    const uint32_t positions = in.Byte() % (kMaxPositionsPerCue + 1);
+    for (uint32_t j = 0; j < positions; ++j) {
+      const uint64_t track = in.Byte() & 7;
+      cue.positions.push_back({track, in.Number()});
+    }
+    model.cues.push_back(cue);
+  }
+  return model;
+}
+
+void RunQueries(fuzz_input::Reader& in, Model& model, FilterUnderTest& under_test) {
+  MkvFilter* filter = under_test.filter();
+  MkvContext* context = under_test.context();
+  for (int q = 0; q < kMaxQueries && !in.empty(); ++q) {
+    const uint8_t op = in.Byte();
+    const uint64_t value = in.Number();
+    switch (op % 7) {
+      case 0:
+      case 1: {
+        const bool forward = op % 7 == 1;
+        uint64_t want_time = value, want_position = 0xA5A5;
+        uint64_t got_time = value, got_position = 0xA5A5;
+        const int want = model.Search(&want_time, forward, &want_position);
+        const int got = GetCueingPosition(filter, &got_time, forward ? 1 : 0, &got_position);
+        Check(got == want && got_time == want_time && got_position == want_position);
+        break;
+      }
+      case 2: {
+        uint64_t want_position = 0x5A5A, got_position = 0x5A5A;
+        const int want = model.ToPosition(value, &want_position);
+        const int got = ConvertToPosition(filter, value, &got_position);
+        Check(got == want && got_position == want_position && context->LastPositionTime == value);
+        break;
+      }
+      case 3: {
+        uint64_t want_time = 0x5A5A, got_time = 0x5A5A;
+        const int want = model.ToTime(value, &want_time);
+        const int got = ConvertToTime(filter, value, &got_time);
+        Check(got == want && got_time == want_time && context->LastPositionTime == model.last_position_time);
+        break;
+      }
+      case 4: {
+        Check(Seek(filter, value, value ^ 0x55) == 0);
+        for (size_t k = 0; k < model.channels.size(); ++k) {
+          if (!model.preroll || !model.channels[k].acquired) continue;
+          Check(under_test.state(k).PrerollTime == value && under_test.state(k).PrerollPending == 1);
+        }
+        break;
+      }
+      case 5: {
+        const int32_t want = model.ByteRate();
+        CalcOverallByteRate(filter);
+        Check(context->ByteRate == want);
+        break;
+      }
+      default: {
+        // Acquisition may change after the table was validated; the flags stay.
+        if (model.channels.empty()) break;
+        const size_t k = value % model.channels.size();
+        model.channels[k].acquired = !model.channels[k].acquired;
+        under_test.state(k).Acquired = model.channels[k].acquired ? 1 : 0;
+        under_test.channel(k).Flags = model.channels[k].acquired ? kChannelAcquired : 0;
+        break;
+      }
+    }
+    const uint32_t flags = context->CueTableFlags;
+    Check(((flags & kCueTableValidated) != 0) == model.validated);
+    Check(!model.validated || ((flags & kCueTableAllTracksCount) != 0) == model.all_tracks);
+  }
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerInitialize(int*, char***) {
+  host::SetLogThreshold(0);
+  return 0;
+}
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+  const int64_t live_before = host::LiveBlockCount();
+  {
+    fuzz_input::Reader in(data, size);
+    Model model = ReadModel(in);
+    FilterUnderTest under_test(model);
+    RunQueries(in, model, under_test);
+  }
+  Check(host::LiveBlockCount() == live_before);
+  return 0;
+}

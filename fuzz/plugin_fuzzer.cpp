@@ -1,0 +1,370 @@
+// The whole plug-in as a framework drives it: loaded by path, the input rated,
+// output channels acquired, and playback through a real graph (the host's
+// file streamer upstream, sinks downstream) while a controller seeks,
+// flushes, pauses, resumes, scans forward and backward, ends a scan and
+// stops, as the input commands.
+//
+// Input: a control header, then the file. The file starts at the first EBML
+// magic (1A 45 DF A3) within the first 64 bytes; the bytes before it are the
+// header, so a fixture on its own is a seed that plays all its channels with
+// no commands. Without a magic the first 8 bytes are the header. Header:
+//   byte 0: bits 0-1 channel threads (0: one channel pulled on this thread,
+//           deterministic; 1-3: that many channels, each on a sink thread),
+//           bit 2 EnablePreroll, bits 3-7 which channel the deterministic
+//           mode plays;
+//   byte 1: input buffer size code; byte 2: TrickTime code (0: default);
+//   then commands of an op byte and an argument (see Command).
+// KELVANE_FUZZ_SINGLE=1 forces the deterministic mode, to reproduce a crash.
+//
+// Every answer must be a specified one, every frame element must lie inside
+// the buffer it names (threaded runs: inside an input buffer), and after
+// teardown no block the plug-in allocated may remain.
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <initializer_list>
+#include <memory>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "fuzz/fuzz_input.h"
+#include "host/file_streamer.h"
+#include "host/graph_clock.h"
+#include "host/graph_runner.h"
+#include "host/graph_setup.h"
+#include "host/heap_control.h"
+#include "host/input_streams.h"
+#include "host/log_control.h"
+#include "host/memory_pools.h"
+#include "host/playback_control.h"
+#include "host/plugin_loader.h"
+#include "platform/media_buffer.h"
+#include "platform/mmf_status.h"
+
+namespace {
+
+// Bounds of one execution: the file is cut, input buffers are never so small
+// that a file takes more than kMaxInputBuffers of them, and the deterministic
+// mode pulls at most kMaxPulls output buffers.
+constexpr size_t kMaxFileBytes = 48 * 1024;
+constexpr size_t kMaxInputBuffers = 2048;
+constexpr int kMaxCommands = 24;
+constexpr int kMaxPulls = 4000;
+constexpr int kMaxShortInputs = 64;
+constexpr size_t kHeaderSearch = 64;
+constexpr size_t kHeaderWithoutMagic = 8;
+
+void Fail(const char* what, long value) {
+  std::fprintf(stderr, "plugin fuzzer: %s (%ld)\n", what, value);
+  std::abort();
+}
+void Check(bool condition, const char* what, long value = 0) {
+  if (!condition) Fail(what, value);
+}
+bool OneOf(int value, std::initializer_list<int> allowed) {
+  return std::find(allowed.begin(), allowed.end(), value) != allowed.end();
+}
+
+const host::Plugin* plugin = nullptr;
+std::string scratch_path;
+
+// What NextBuffer may end with: an error, the end of the stream, a short
+// input, or the stopped state.
+bool SpecifiedEnd(int result) { return OneOf(result, {1, kMmfEndOfStream, 4, 16}); }
+bool SpecifiedScan(int result) { return OneOf(result, {0, 48, kMmfInvalidArgument, kMmfNotAvailable, 12}); }
+bool SpecifiedSeek(int result) { return OneOf(result, {0, kMmfNoConversion}); }
+bool SpecifiedControl(int result) { return OneOf(result, {0, kMmfStoppedAfterError}); }
+
+struct Command {
+  enum Kind { kSeek, kPause, kResume, kScanForward, kScanBackward, kScanEnd, kFlush, kWait, kStop };
+  Kind kind;
+  uint64_t time_us;
+  uint32_t speed;
+  uint32_t amount;  // kWait: pulls (deterministic) or quarter milliseconds (threads)
+};
+
+struct Header {
+  int threads = 0;
+  bool preroll = false;
+  uint32_t channel = 0;
+  uint32_t buffer_size = 4096;
+  int32_t trick_time_ms = 0;
+  std::vector<Command> commands;
+};
+
+Command ReadCommand(fuzz_input::Reader& in) {
+  const uint8_t op = in.Byte();
+  Command command{static_cast<Command::Kind>(op % 9), 0, 0, 0};
+  // A seek mostly within the first ten seconds, sometimes anywhere.
+  command.time_us = op & 0x80 ? in.Number() : uint64_t{in.Byte()} * 40000;
+  command.speed = op & 0x40 ? static_cast<uint32_t>(in.Number()) : 100u * (1 + in.Byte() % 16);
+  command.amount = in.Byte();
+  return command;
+}
+
+Header ReadHeader(const uint8_t* data, size_t size) {
+  fuzz_input::Reader in(data, size);
+  Header header;
+  const uint8_t flags = in.Byte();
+  header.threads = flags & 3;
+  header.preroll = flags & 4;
+  header.channel = flags >> 3;
+  const uint8_t code = in.Byte();
+  header.buffer_size = code < 128 ? code + 1u : (code - 127u) * 512u;
+  const uint8_t trick = in.Byte();
+  header.trick_time_ms = trick ? 500 + trick * 2 : 0;
+  while (!in.empty() && header.commands.size() < kMaxCommands) header.commands.push_back(ReadCommand(in));
+  const char* single = std::getenv("KELVANE_FUZZ_SINGLE");
+  if (single && *single && *single != '0') header.threads = 0;
+  return header;
+}
+
+// Where the file starts: at the EBML magic near the front, else after a fixed header.
+size_t FileStart(const uint8_t* data, size_t size) {
+  static const uint8_t kMagic[] = {0x1A, 0x45, 0xDF, 0xA3};
+  const size_t limit = std::min(size, kHeaderSearch + sizeof kMagic);
+  for (size_t i = 0; i + sizeof kMagic <= limit; ++i) {
+    if (std::memcmp(data + i, kMagic, sizeof kMagic) == 0) return i;
+  }
+  return std::min(size, kHeaderWithoutMagic);
+}
+
+void CheckBufferElements(MmfMra* mra) {
+  uint32_t kind = 0;
+  for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
+    if (kind != kMmfElementBuffer) continue;
+    MmfPoolBuffer* handle = nullptr;
+    uint8_t* address = nullptr;
+    uint32_t size = 0;
+    if (MmfGetMraBufferElement(mra, i, &handle, &address, &size) != 0) continue;
+    Check(handle && address >= handle->Data && size <= handle->Size &&
+              static_cast<size_t>(address - handle->Data) <= handle->Size - size,
+          "a buffer element outside its buffer", static_cast<long>(size));
+  }
+}
+
+uint64_t LastTime(MmfMra* mra) {
+  uint64_t time = 0;
+  uint32_t kind = 0;
+  for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
+    uint32_t type = 0, low = 0;
+    uint16_t high = 0;
+    if (kind != kMmfElementProperty || MmfGetMraPropertyElement(mra, i, &type, &low, &high) != 0) continue;
+    if (type == kMmfPropVideoTime || type == kMmfPropAudioTime || type == kMmfPropSubtitleTime) {
+      time = MmfPropertyValue(low, high);
+    }
+  }
+  return time;
+}
+
+// One channel pulled on the calling thread, the commands done between pulls:
+// the same input always takes the same path.
+void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
+  auto rating_stream = host::MakeMemoryStream(file, size, true, "fuzz");
+  auto source = host::MakeMemoryStream(file, size, true, "fuzz");
+  host::MemoryPool prefix_pool(4096, 16);
+  host::MemoryPool config_pool(65536, 8);
+  // As many input buffers as the runner gives a graph: the ring's plus what frames still point into.
+  const uint32_t buffers = std::clamp<uint32_t>((16u << 20) / header.buffer_size, 48, 2048);
+  host::FileStreamer streamer(source.get(), host::StreamerConfig{header.buffer_size, buffers});
+  host::SetupOptions setup;
+  setup.buffer_size = header.buffer_size;
+  setup.configure_outputs = false;
+  setup.upstream = host::FileStreamer::Ops();
+  setup.input_pool = host::MemoryPool::Ops();
+  setup.input_pool_param = prefix_pool.handle();
+  host::FilterGraph graph(*plugin, *rating_stream, setup);
+  Check(OneOf(graph.rating(), {0, kMmfRatingAccepted}), "rating", graph.rating());
+  if (!graph.rated() || graph.outputs().empty()) return;
+  MmfFilterHandle* handle = graph.handle();
+  handle->InputChannel->Peer = streamer.output();
+  if (const auto* list_maker = plugin->Get<MmfListMakerOps>("MediaListMaker")) {
+    streamer.ConnectListMaker(list_maker, handle->InputChannel);
+  }
+  const int64_t first_cluster = rating_stream->Tell();
+  const MmfMediaOutputOps* output = plugin->output();
+  const auto* control = plugin->Get<MmfMediaControlOps>("MediaControl");
+  const auto* flush = plugin->Get<MmfMediaFlushOps>("MediaFlush");
+  const host::OutputChannelSetup& chosen = graph.outputs()[header.channel % graph.outputs().size()];
+  MmfChannel* channel = chosen.channel;
+  Check(output->AcquireOutputChannel(channel) == kMmfOk, "acquire");
+  const bool configured = output->SetOutputFormat(channel, &chosen.offered) == kMmfOk &&
+                          output->SetOutputChannelMemoryPool(channel, host::MemoryPool::Ops(),
+                                                             config_pool.handle()) == kMmfOk;
+  host::GraphClock clock;
+  host::AttachGraphClock(handle->Graph, &clock);
+  if (configured && first_cluster >= 0) {
+    if (const AoResourceAccessOps* resources = plugin->resources()) {
+      int32_t on = 1;
+      if (header.preroll) (void)resources->SetResource(handle, "EnablePreroll", &on);
+      if (header.trick_time_ms) (void)resources->SetResource(handle, "TrickTime", &header.trick_time_ms);
+    }
+    (void)control->Start(handle);
+    (void)streamer.Seek(static_cast<uint64_t>(first_cluster), 0);
+    host::ControlTables tables{control, flush, plugin->converter(), plugin->seeker(),
+                               plugin->Get<MmfTrickPlayOps>("MediaTrickPlay")};
+    host::PlaybackControl playback(tables, handle, &streamer, &clock, 0);
+    int pulls = 0;
+    auto pull = [&](int count) {
+      for (int short_inputs = 0; count > 0 && pulls < kMaxPulls; --count, ++pulls) {
+        MmfMra* mra = nullptr;
+        const int result = output->NextBuffer(channel, &mra);
+        if (result == kMmfBufferDelivered && mra) {
+          CheckBufferElements(mra);
+          clock.Consumed(LastTime(mra));
+          (void)MmfReleaseMra(mra);
+          continue;
+        }
+        Check(SpecifiedEnd(result), "NextBuffer", result);
+        if (result != 4 || ++short_inputs > kMaxShortInputs) return;
+      }
+    };
+    for (const Command& command : header.commands) {
+      switch (command.kind) {
+        case Command::kSeek:
+          Check(SpecifiedSeek(playback.Seek(command.time_us)), "seek");
+          break;
+        case Command::kPause:
+          Check(SpecifiedControl(playback.Pause()), "pause");
+          break;
+        case Command::kResume:
+          Check(SpecifiedControl(playback.Resume()), "resume");
+          break;
+        case Command::kScanForward:
+          Check(SpecifiedScan(playback.ScanForward(command.speed)), "scan forward");
+          break;
+        case Command::kScanBackward:
+          Check(SpecifiedScan(playback.ScanBackward(command.speed)), "scan backward");
+          break;
+        case Command::kScanEnd:
+          Check(SpecifiedScan(playback.ScanEnd()), "scan end");
+          break;
+        case Command::kFlush:
+          Check(flush->Flush(handle) == kMmfOk, "flush");
+          break;
+        case Command::kStop:
+          Check(SpecifiedControl(control->Stop(handle)), "stop");
+          break;
+        case Command::kWait:
+          pull(command.amount);
+          break;
+      }
+    }
+    pull(kMaxPulls);
+    (void)control->Stop(handle);
+  }
+  (void)flush->Flush(handle);
+  (void)output->ReleaseOutputChannel(channel);
+  host::AttachGraphClock(handle->Graph, nullptr);
+}
+
+// Threads: RunGraph's sinks, and this controller's commands as its script.
+void PlayThreaded(const uint8_t* file, size_t size, const Header& header) {
+  size_t outputs = 0;
+  {
+    auto stream = host::MakeMemoryStream(file, size, true, "fuzz");
+    host::SetupOptions setup;
+    setup.configure_outputs = false;
+    host::FilterGraph graph(*plugin, *stream, setup);
+    if (!graph.rated()) return;
+    outputs = graph.outputs().size();
+  }
+  FILE* out = std::fopen(scratch_path.c_str(), "wb");
+  Check(out != nullptr, "scratch file");
+  Check(std::fwrite(file, 1, size, out) == size, "scratch write");
+  std::fclose(out);
+
+  host::RunnerOptions options;
+  options.input_buffer_size = header.buffer_size;
+  options.checksum = false;
+  options.preroll = header.preroll;
+  options.trick_time_ms = header.trick_time_ms;
+  for (size_t k = 0; k < std::min<size_t>(outputs, static_cast<size_t>(header.threads)); ++k) {
+    options.channels.push_back(static_cast<int32_t>(k));
+    options.sink_delay_us.push_back(static_cast<uint32_t>(k) * 50);
+  }
+  std::vector<int> answers;
+  if (!header.commands.empty()) {
+    options.script = [&](host::PlaybackControl& playback) {
+      for (const Command& command : header.commands) {
+        switch (command.kind) {
+          case Command::kSeek:
+            Check(SpecifiedSeek(playback.Seek(command.time_us)), "seek");
+            break;
+          case Command::kPause:
+            Check(SpecifiedControl(playback.Pause()), "pause");
+            break;
+          case Command::kResume:
+            Check(SpecifiedControl(playback.Resume()), "resume");
+            break;
+          case Command::kScanForward:
+            Check(SpecifiedScan(playback.ScanForward(command.speed)), "scan forward");
+            break;
+          case Command::kScanBackward:
+            Check(SpecifiedScan(playback.ScanBackward(command.speed)), "scan backward");
+            break;
+          case Command::kScanEnd:
+          case Command::kFlush:  // a flush happens only inside a sequence on a running graph
+            Check(SpecifiedScan(playback.ScanEnd()), "scan end");
+            break;
+          case Command::kWait:
+            std::this_thread::sleep_for(std::chrono::microseconds(250 * (command.amount % 8)));
+            break;
+          case Command::kStop:
+            Check(SpecifiedControl(playback.Stop()), "stop");
+            return;  // stopped sinks end; no sequence may follow
+        }
+      }
+    };
+  }
+  host::RunResult run = host::RunGraph(*plugin, scratch_path, options);
+  Check(OneOf(run.rating, {0, kMmfRatingAccepted}), "rating", run.rating);
+  for (const host::ChannelRun& channel : run.channels) {
+    Check(channel.foreign_elements == 0, "a frame element outside every input buffer",
+          static_cast<long>(channel.foreign_elements));
+    if (channel.buffers > 0 || run.error.empty()) Check(SpecifiedEnd(channel.end_result), "end", channel.end_result);
+  }
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerInitialize(int*, char***) {
+  host::SetLogThreshold(0);
+  std::string error;
+  static std::unique_ptr<host::Plugin> loaded = host::Plugin::Load(KELVANE_PLUGIN_PATH, &error);
+  if (!loaded) {
+    std::fprintf(stderr, "plugin fuzzer: %s\n", error.c_str());
+    std::abort();
+  }
+  plugin = loaded.get();
+  const char* dir = access("/dev/shm", W_OK) == 0 ? "/dev/shm" : "/tmp";
+  scratch_path = std::string(dir) + "/kelvane_plugin_fuzz_" + std::to_string(getpid()) + ".mkv";
+  std::atexit([] { std::remove(scratch_path.c_str()); });
+  return 0;
+}
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+  const size_t start = FileStart(data, size);
+  const Header header = ReadHeader(data, start);
+  const uint8_t* file = data + start;
+  const size_t file_size = std::min(size - start, kMaxFileBytes);
+  Header bounded = header;
+  const size_t least = (file_size + kMaxInputBuffers - 1) / kMaxInputBuffers;
+  bounded.buffer_size = static_cast<uint32_t>(std::max<size_t>(header.buffer_size, least));
+  const int64_t live_before = host::LiveBlockCount();
+  if (header.threads == 0) {
+    PlayDeterministic(file, file_size, bounded);
+  } else {
+    PlayThreaded(file, file_size, bounded);
+  }
+  Check(host::LiveBlockCount() == live_before, "blocks left after teardown",
+        static_cast<long>(host::LiveBlockCount() - live_before));
+  return 0;
+}
