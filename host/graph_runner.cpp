@@ -140,7 +140,10 @@ class Sink {
     if (options_.checksum) adler_.Update(address, size);
     if (in_parts_ && !last_part_) return;
     frame_.adler32 = options_.checksum ? adler_.Value() : 0;
-    run_->frames.push_back(frame_);
+    ++run_->frame_count;
+    run_->last_time_us = frame_.time_us;
+    if (options_.keep_frames) run_->frames.push_back(frame_);
+    if (options_.on_frame) options_.on_frame(options_.user, run_->index, frame_);
     in_parts_ = false;
     last_part_ = false;
   }
@@ -163,7 +166,7 @@ void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun
   Sink sink(run, options, config_pool, prefix_pool);
   auto restart = [&] {
     if (playback->Flushed()) sink.Restart();
-    run->seeks.push_back(run->frames.size());
+    run->seeks.push_back(static_cast<size_t>(run->frame_count));
   };
   int short_inputs = 0;
   for (;;) {
@@ -182,7 +185,7 @@ void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun
     short_inputs = 0;
     ++run->buffers;
     sink.Consume(mra);
-    if (playback && !run->frames.empty() && playback->Consumed(run->frames.back().time_us)) restart();
+    if (playback && run->frame_count && playback->Consumed(run->last_time_us)) restart();
     if (options.on_buffer) options.on_buffer(options.user, run->index, mra);
     (void)MmfReleaseMra(mra);
     if (delay_us) std::this_thread::sleep_for(std::chrono::microseconds(delay_us));

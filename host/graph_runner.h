@@ -17,6 +17,13 @@
 
 namespace host {
 
+struct RunFrame {
+  uint64_t time_us = 0;  // the last timestamp property before the frame
+  uint32_t size = 0;
+  uint32_t adler32 = 0;  // 0 when checksums are off
+  bool marked = false;   // a time marker (property 3) came since the frame before
+};
+
 struct RunnerOptions {
   uint32_t input_buffer_size = 32768;
   // Indexes of the output channels to acquire; empty: all of them.
@@ -30,6 +37,11 @@ struct RunnerOptions {
   // buffer goes back; the buffer's elements are readable.
   void (*on_buffer)(void* user, int32_t channel, MmfMra* buffer) = nullptr;
   void* user = nullptr;
+  // Called on a sink's thread with each whole frame as it completes (not with
+  // decoder-configuration packets). With keep_frames off, ChannelRun::frames
+  // stays empty, so a long file costs no memory per frame.
+  void (*on_frame)(void* user, int32_t channel, const RunFrame& frame) = nullptr;
+  bool keep_frames = true;
   // Another upstream filter in place of the file streamer: its output channel
   // and operations. It delivers from the first Cluster on.
   const MmfMediaOutputOps* upstream = nullptr;
@@ -42,20 +54,15 @@ struct RunnerOptions {
   int32_t trick_time_ms = 0;  // sets "TrickTime" when not 0
 };
 
-struct RunFrame {
-  uint64_t time_us = 0;  // the last timestamp property before the frame
-  uint32_t size = 0;
-  uint32_t adler32 = 0;  // 0 when checksums are off
-  bool marked = false;   // a time marker (property 3) came since the frame before
-};
-
 struct ChannelRun {
   int32_t index = -1;  // output channel index
   std::string name;
   uint32_t fourcc = 0;
   std::vector<RunFrame> config;  // decoder-configuration packets (property 30)
-  std::vector<RunFrame> frames;
-  std::vector<size_t> seeks;  // frames.size() when each control sequence took effect
+  std::vector<RunFrame> frames;  // empty unless RunnerOptions::keep_frames
+  uint64_t frame_count = 0;      // frames delivered, kept or not
+  uint64_t last_time_us = 0;     // time of the last of them
+  std::vector<size_t> seeks;     // frame_count when each control sequence took effect
   int end_result = 0;             // NextBuffer's last answer
   uint64_t buffers = 0;           // output media buffers consumed
   uint64_t skip_marks = 0;        // properties 37

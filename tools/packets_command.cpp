@@ -9,6 +9,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -25,6 +26,7 @@
 #include "tools/command_line.h"
 #include "tools/commands.h"
 #include "tools/control_options.h"
+#include "tools/frame_lines.h"
 #include "tools/json_writer.h"
 
 const char kPacketsHelp[] =
@@ -277,6 +279,14 @@ int RunPackets(int argc, char** argv) {
                         ChannelList(tracks).c_str());
     }
   }
+  // Plain playback in lines streams the frame lines instead of keeping every frame.
+  std::unique_ptr<FrameLines> lines;
+  if (!options.json && options.run.actions.empty() && !tracks.empty()) {
+    lines = std::make_unique<FrameLines>(tracks, options.run.checksum);
+    options.run.on_frame = FrameLines::OnFrame;
+    options.run.user = lines.get();
+    options.run.keep_frames = false;
+  }
   host::RunResult result = host::RunGraph(*plugin, file, options.run);
   if (!result.ok) {
     if (result.rating != kAcceptedRating) return RefusedFile("packets", file, result.rating);
@@ -291,6 +301,9 @@ int RunPackets(int argc, char** argv) {
     }
   }
   options.json ? WriteJson(file, result, tracks, options.run.checksum)
-               : PrintLines(result, tracks, options.run.checksum);
+               : PrintLines(result, tracks, options.run.checksum);  // with `lines`: only the configurations
+  for (const host::ChannelRun& run : result.channels) {
+    if (lines && !lines->Write(run.index, stdout)) return Failure("packets", "cannot write the frame lines");
+  }
   return kExitOk;
 }
