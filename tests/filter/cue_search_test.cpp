@@ -1,6 +1,7 @@
 // GetCueingPosition and ValidateCueingTable, built into this binary (the
 // plug-in hides them), over cue tables made in memory: the rules of the
-// search, which positions count, and long_cues' cue table from mkvinfo.
+// search and which positions count. Real cue tables are searched through the
+// plug-in's seeks and scans.
 
 #include <memory>
 #include <vector>
@@ -10,7 +11,6 @@
 #include "core/memory.h"
 #include "filter/cue_search.h"
 #include "filter/mkv_context.h"
-#include "tests/support/fixtures.h"
 #include "tests/support/log_recorder.h"
 
 namespace {
@@ -143,24 +143,6 @@ TEST(GetCueingPositionTest, FileWithoutCuesAnswers48AndWritesNothing) {
 TEST(GetCueingPositionTest, ScaleBelowOneMicrosecondGivesTimeZero) {
   CueTable table({{0, {{1, 10}}}, {900, {{1, 20}}}}, {1}, 999);
   EXPECT_EQ(table.Search(0, true).time, 0u);
-}
-
-// long_cues: 50 cue points from mkvinfo; forward goes to the next one, or the
-// last (the backward search is checked through ConvertToPosition).
-TEST(GetCueingPositionTest, LongCuesTableFromMkvinfo) {
-  testing_support::FixtureExpectation fx = testing_support::LoadFixture("long_cues");
-  ASSERT_EQ(fx.cues.size(), 50u);
-  std::vector<CueRow> rows;
-  for (const auto& cue : fx.cues) rows.push_back({cue.time_ticks, {{cue.track, cue.cluster_position}}});
-  CueTable table(rows, {1, 2});
-  const uint64_t us_per_tick = fx.timecode_scale / 1000;
-  for (size_t i = 0; i < rows.size(); ++i) {
-    SCOPED_TRACE(i);
-    const size_t next = std::min(i + 1, rows.size() - 1);
-    CueTable::Found forward = table.Search(rows[i].ticks * us_per_tick, true);
-    EXPECT_EQ(forward.time, rows[next].ticks * us_per_tick);
-    EXPECT_EQ(forward.position, fx.cues[next].cluster_position + kSegmentData);
-  }
 }
 
 }  // namespace

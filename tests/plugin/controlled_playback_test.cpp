@@ -269,31 +269,6 @@ INSTANTIATE_TEST_SUITE_P(LongCues, ControlledScanTest,
                                          ScanCase{"RewindSpeed250", false, 250, 22000000}),
                          [](const testing::TestParamInfo<ScanCase>& info) { return info.param.name; });
 
-// ScanEnd returns to normal delivery: from the first frame of the Cluster of
-// a cue point (the one after the clock's time, which the sinks move), every
-// frame to the end.
-TEST(ControlledScanEndTest, NormalDeliveryResumesAtTheNextCuePointsCluster) {
-  CueModel fx("long_cues");
-  host::RunnerOptions options = Options({SeekTo(1000000, 0), {host::ControlAction::kScanForward, 1000000, 0, 100},
-                                         {host::ControlAction::kScanEnd, 9000000, 0, 0}});
-  host::RunResult result = Play(options);
-  ASSERT_TRUE(result.ok) << result.error;
-  ASSERT_EQ(result.control_results, (std::vector<int>{0, 0, 0}));
-  const host::ChannelRun& video = result.channels.at(0);
-  ASSERT_EQ(video.seeks.size(), 3u);
-  for (const host::ChannelRun& run : result.channels) {
-    SCOPED_TRACE(run.name);
-    ASSERT_EQ(run.seeks.size(), 3u);
-    const std::vector<host::RunFrame> after = Segment(run, 3);
-    ASSERT_FALSE(after.empty());
-    // The cue point is the first video frame's time; the audio channel opens in the same Cluster.
-    const uint64_t resumed = Segment(video, 3).at(0).time_us;
-    const size_t cue = fx.Forward(resumed - 1);
-    ASSERT_EQ(fx.times[cue], resumed);
-    EXPECT_EQ(Follows(after, fx.tracks.at(TrackOf(run)), fx.FirstFrameInCluster(TrackOf(run), cue), true), "");
-  }
-}
-
 struct StressCase {
   const char* file;
   uint32_t seed;

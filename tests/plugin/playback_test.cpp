@@ -202,8 +202,6 @@ TEST_P(PlaybackLaceTest, DeliversEveryFrameOnceAndPassesOverTheRest) {
   }
 }
 
-Bytes Filled(size_t n, uint8_t value) { return Bytes(n, value); }
-
 // A fixed-size lace of 3 frames over 32 bytes: 10 bytes each, 2 left over.
 Bytes FixedLaceWithRemainder() {
   Bytes body = {
@@ -212,7 +210,7 @@ Bytes FixedLaceWithRemainder() {
       0x84,        // key frame, fixed-size lacing
       0x02,        // 3 frames
   };
-  for (uint8_t value : {0x11, 0x22, 0x33}) body = ebml::cat({body, Filled(10, value)});
+  for (uint8_t value : {0x11, 0x22, 0x33}) body = ebml::cat({body, Bytes(10, value)});
   body.push_back(0xEE);
   body.push_back(0xEF);
   return ebml::element(ebml::kSimpleBlock, body);
@@ -222,16 +220,16 @@ INSTANTIATE_TEST_SUITE_P(
     Laces, PlaybackLaceTest,
     testing::Values(
         LaceCase{"FixedLaceRemainder",
-                 OneCluster({FixedLaceWithRemainder(), ebml::simple_block(1, 10, ebml::kKeyFrame, {Filled(12, 0x55)})}),
-                 {Filled(10, 0x11), Filled(10, 0x22), Filled(10, 0x33), Filled(12, 0x55)}},
+                 OneCluster({FixedLaceWithRemainder(), ebml::simple_block(1, 10, ebml::kKeyFrame, {Bytes(12, 0x55)})}),
+                 {Bytes(10, 0x11), Bytes(10, 0x22), Bytes(10, 0x33), Bytes(12, 0x55)}},
         LaceCase{"EmptyFrameInLace",
-                 OneCluster({ebml::ebml_laced_block(1, 0, ebml::kKeyFrame, {Bytes{}, Filled(9, 0x44), Filled(5, 0x45)}),
-                             ebml::simple_block(1, 10, ebml::kKeyFrame, {Filled(12, 0x55)})}),
-                 {Filled(9, 0x44), Filled(5, 0x45), Filled(12, 0x55)}},
+                 OneCluster({ebml::ebml_laced_block(1, 0, ebml::kKeyFrame, {Bytes{}, Bytes(9, 0x44), Bytes(5, 0x45)}),
+                             ebml::simple_block(1, 10, ebml::kKeyFrame, {Bytes(12, 0x55)})}),
+                 {Bytes(9, 0x44), Bytes(5, 0x45), Bytes(12, 0x55)}},
         LaceCase{"EveryFrameEmpty",
                  OneCluster({ebml::xiph_laced_block(1, 0, ebml::kKeyFrame, {Bytes{}, Bytes{}, Bytes{}}),
-                             ebml::simple_block(1, 10, ebml::kKeyFrame, {Filled(12, 0x55)})}),
-                 {Filled(12, 0x55)}}),
+                             ebml::simple_block(1, 10, ebml::kKeyFrame, {Bytes(12, 0x55)})}),
+                 {Bytes(12, 0x55)}}),
     [](const testing::TestParamInfo<LaceCase>& info) { return info.param.name; });
 
 TEST(PlaybackCasesTest, DecoderConfigurationLargerThanTheOutputBufferEndsTheChannelWithAnError) {

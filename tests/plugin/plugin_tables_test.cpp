@@ -253,7 +253,6 @@ struct SetCase {
 
 const SetCase kSetCases[] = {
     {"TrickTime", 2000, 0, "TrickTime", 1000},
-    {"TrickTime", 100, 0, "TrickTime", 500},
     {"TrickTime", 750, 0, "TrickTime", 750},
     {"TrickTime", -5, 0, "TrickTime", 500},
     {"TrickPlaySkipStartSpeed", 0, 0, "TrickPlaySkipStartSpeed", 500},
@@ -263,13 +262,10 @@ const SetCase kSetCases[] = {
     {"Duration", 5, 1, nullptr, 0},
     {"TrackAudioLang", 5, 1, nullptr, 0},
     {"TrackCountAudio", 5, 1, "TrackCountAudio", 0},
-    {"TrackCountVideo", 5, 1, "TrackCountVideo", 0},
     {"AVSyncDelay", 5, 22, "AVSyncDelay", 0},
     {"CurrentAudioTrack", 5, 22, "CurrentAudioTrack", 0},
-    {"CurrentVideoTrack", 5, 22, "CurrentVideoTrack", 0},
     {"tricktime", 700, 4032, "TrickTime", 500},
     {"TrickTime ", 700, 4032, "TrickTime", 500},
-    {"", 700, 4032, "TrickTime", 500},
     {"Volume", 1, 4032, nullptr, 0},
 };
 
