@@ -1,6 +1,8 @@
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 
+#include "host/log_control.h"
 #include "tools/command_line.h"
 #include "tools/commands.h"
 
@@ -40,6 +42,10 @@ void PrintUsage(FILE* out) {
                "  2  usage: an unknown command or option, a malformed value, a missing FILE, or a\n"
                "     track or channel the file does not offer\n"
                "\n"
+               "environment:\n"
+               "  KELVANE_LOG=LEVEL  show the plug-in's log messages up to LEVEL on standard error:\n"
+               "                     2 failures (default), 3 also degraded results, 5 also notices\n"
+               "\n"
                "examples:\n"
                "  kelvane info movie.mkv\n"
                "  kelvane probe --json movie.mkv\n"
@@ -53,6 +59,18 @@ const Command* Find(const char* name) {
   return nullptr;
 }
 
+// The plug-in's failures by default; its degraded results and notices only on request.
+constexpr int kDefaultLogLevel = 2;
+
+void SetLogLevel() {
+  const char* level = std::getenv("KELVANE_LOG");
+  unsigned long value = kDefaultLogLevel;
+  if (level && !ParseNumber(level, 9, &value)) {
+    std::fprintf(stderr, "kelvane: KELVANE_LOG='%s' is not a level from 0 to 9; using %d\n", level, kDefaultLogLevel);
+  }
+  host::SetLogThreshold(static_cast<int>(value));
+}
+
 int UnknownCommand(const char* name) {
   std::fprintf(stderr, "kelvane: unknown command '%s'\ntry 'kelvane --help'\n", name);
   return kExitUsage;
@@ -61,6 +79,7 @@ int UnknownCommand(const char* name) {
 }  // namespace
 
 int main(int argc, char** argv) {
+  SetLogLevel();
   if (argc < 2) {
     std::fprintf(stderr, "kelvane: no command given\n");
     PrintUsage(stderr);

@@ -1,0 +1,149 @@
+#!/usr/bin/env bash
+# The kelvane tool as a person and a script use it: help texts, error
+# messages and exit codes from a table, then every command's --json output
+# parsed by a strict JSON reader, including a file name full of quotes,
+# backslashes, control characters and bytes that are not UTF-8.
+#   check_cli.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
+set -uo pipefail
+source_dir=$1
+shift
+kelvane=("$@")
+fixtures=$source_dir/tests/fixtures
+
+failures=0
+fail() { echo "FAIL $*"; failures=$((failures + 1)); }
+
+work=$(mktemp -d)
+trap 'rm -rf "$work"' EXIT
+mkv=$fixtures/avc_aac.mkv
+not_mkv=$source_dir/README.md
+missing=$work/missing.mkv
+
+# exit code | stream (out, err) | expected substring | arguments (words; $mkv, $not_mkv, $missing, $work expand)
+table=$(cat <<'EOF'
+0|out|usage: kelvane COMMAND|--help
+0|out|exit codes:|-h
+0|out|docs/json.md|help
+0|out|KELVANE_LOG|--help
+2|err|no command given|
+2|err|unknown command 'frob'|frob
+2|err|try 'kelvane --help'|help frob
+0|out|usage: kelvane info [--json] FILE|info --help
+0|out|the demuxer's own header parser|info -h
+0|out|usage: kelvane info|help info
+2|err|kelvane info: no FILE given|info
+2|err|kelvane info: unknown option '--frob'|info --frob $mkv
+2|err|try 'kelvane info --help'|info --frob $mkv
+2|err|kelvane info: one FILE only|info $mkv $mkv
+1|err|kelvane info: cannot open $missing: No such file or directory|info $missing
+1|err|kelvane info: cannot read $work: Is a directory|info $work
+1|err|kelvane info: $not_mkv: not a Matroska file|info $not_mkv
+0|out|DocType: matroska|info $mkv
+0|out|usage: kelvane probe [--json] [--plugin PATH] FILE|probe --help
+0|out|--plugin PATH|probe -h
+2|err|kelvane probe: no FILE given|probe --json
+2|err|kelvane probe: --plugin needs a PATH|probe $mkv --plugin
+2|err|kelvane probe: unknown option '--frob'|probe --frob $mkv
+1|err|kelvane probe: cannot open $missing: No such file or directory|probe $missing
+1|err|kelvane probe: $not_mkv: the plug-in refused it: rating 0|probe $not_mkv
+1|out|rating: 0|probe $not_mkv
+1|err|kelvane probe: cannot load the plug-in $missing|probe --plugin $missing $mkv
+0|out|fourcc: AVC1|probe $mkv
+0|out|usage: kelvane packets [OPTIONS] FILE|packets --help
+0|out|--channels K,K,...|packets -h
+0|out|--buffer-size BYTES|packets -h
+0|out|--no-hash|packets -h
+0|out|--trick-time MS|packets -h
+0|out|--seek TIME[@AT]|help packets
+2|err|kelvane packets: no FILE given|packets --no-hash
+2|err|kelvane packets: --buffer-size: '0' is not a number of bytes|packets --buffer-size 0 $mkv
+2|err|kelvane packets: --buffer-size: 'big' is not a number of bytes|packets --buffer-size big $mkv
+2|err|kelvane packets: --buffer-size needs a value|packets $mkv --buffer-size
+2|err|kelvane packets: --channels: 'x' is not a list|packets --channels x $mkv
+2|err|kelvane packets: --channels: '0,0' is not a list of distinct|packets --channels 0,0 $mkv
+2|err|offers no channel 2; its channels: 0 (track 1), 1 (track 2)|packets --channels 2 $mkv
+2|err|kelvane packets: --seek: '1@x' is not TIME[@AT]|packets --seek 1@x $mkv
+2|err|kelvane packets: --ff: '-3' is not SPEED[@AT]|packets --ff -3 $mkv
+2|err|kelvane packets: --trick-time: '0' is not MS|packets --trick-time 0 $mkv
+2|err|kelvane packets: --scan-end needs a value|packets $mkv --scan-end
+2|err|try 'kelvane packets --help'|packets --frob $mkv
+2|err|kelvane packets: FILE cannot be standard input|packets -
+1|err|kelvane packets: cannot open $missing: No such file or directory|packets $missing
+1|err|kelvane packets: $not_mkv: the plug-in refused it: rating 0|packets $not_mkv
+0|out|0 1 0 2300 66fcf3ed|packets $mkv
+0|out|usage: kelvane metadata [--json] [--plugin PATH] FILE|metadata --help
+0|out|NUM4|metadata -h
+2|err|kelvane metadata: no FILE given|metadata
+2|err|kelvane metadata: unknown option '--frob'|metadata --frob $mkv
+2|err|kelvane metadata: FILE cannot be standard input|metadata -
+1|err|kelvane metadata: cannot read $work: Is a directory|metadata $work
+1|err|kelvane metadata: $not_mkv: the plug-in refused it|metadata $not_mkv
+0|out|Width (NUM4): 160|metadata $mkv
+EOF
+)
+
+while IFS='|' read -r code stream want args; do
+  want=${want//\$missing/$missing}; want=${want//\$not_mkv/$not_mkv}; want=${want//\$work/$work}
+  args=${args//\$mkv/$mkv}; args=${args//\$missing/$missing}; args=${args//\$not_mkv/$not_mkv}; args=${args//\$work/$work}
+  # shellcheck disable=SC2086
+  "${kelvane[@]}" $args </dev/null >"$work/out" 2>"$work/err"
+  got=$?
+  [[ $got == "$code" ]] || fail "kelvane $args: exit code $got, expected $code"
+  grep -qF -- "$want" "$work/$stream" || fail "kelvane $args: no '$want' on std$stream: $(head -c 300 "$work/$stream")"
+  # Help goes to standard output only; errors to standard error only.
+  if [[ $code == 0 ]]; then
+    [[ ! -s $work/err ]] || fail "kelvane $args: succeeded but wrote to stderr: $(head -c 200 "$work/err")"
+  elif [[ $code == 2 ]]; then
+    [[ ! -s $work/out ]] || fail "kelvane $args: usage error but wrote to stdout"
+  fi
+done <<<"$table"
+
+# Every help text names every option the command accepts.
+for command in info probe packets metadata; do
+  help=$("${kelvane[@]}" "$command" --help)
+  accepted=$(grep -o -- '--[a-z-]*' <<<"$help" | sort -u)
+  for option in $accepted; do
+    "${kelvane[@]}" "$command" "$option" >/dev/null 2>"$work/err" </dev/null
+    grep -q "unknown option '$option'" "$work/err" && fail "$command --help mentions $option, which it refuses"
+  done
+done
+
+# --json: a strict parse (no NaN or Infinity, no raw control characters), the
+# common header fields, and the file name back exactly as given, with the
+# bytes that are not UTF-8 replaced by U+FFFD.
+check_json() {  # command file
+  python3 -c '
+import json, sys
+def refuse(name): raise ValueError("not JSON: " + name)
+doc = json.load(open(sys.argv[1], "rb"), parse_constant=refuse)
+assert doc["schema_version"] == 1, "schema_version"
+assert doc["command"] == sys.argv[2], "command"
+want = sys.argv[3].encode("utf-8", "surrogateescape").decode("utf-8", "replace")
+assert doc["file"] == want, "file %r, expected %r" % (doc["file"], want)
+assert isinstance(doc.get("channels", doc.get("tracks", doc.get("entries"))), list), "main list"
+' "$work/json" "$1" "$2"
+}
+if command -v python3 >/dev/null; then
+  odd=$work/$'odd "name" \\ \x01\t\x7f \xff\xc3( caf\xc3\xa9.mkv'
+  ln -s "$(cd "$fixtures" && pwd)/tags.mkv" "$odd"
+  for file in "$fixtures"/*.mkv "$odd"; do
+    for command in info probe metadata packets; do
+      extra=()
+      [[ $command == packets ]] && extra=(--no-hash)
+      "${kelvane[@]}" "$command" --json "${extra[@]}" "$file" >"$work/json" 2>/dev/null
+      status=$?
+      [[ $file == "$odd" && $status != 0 ]] && fail "$command --json on the oddly named file: exit code $status"
+      if [[ $status == 0 || ($command == probe && $status == 1) ]]; then
+        err=$(check_json "$command" "$file" 2>&1) || fail "$command --json $(basename "$file"): $(tail -1 <<<"$err")"
+      fi
+    done
+  done
+else
+  fail "python3 is needed to validate the --json output"
+fi
+
+if ((failures)); then
+  echo "$failures failures"
+  exit 1
+fi
+echo "kelvane help, errors, exit codes and JSON output as documented"
