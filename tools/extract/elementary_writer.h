@@ -1,0 +1,18 @@
+#pragma once
+// Codecs whose frames, put one after the other, are already a stream that
+// decoders read (MPEG audio, AC-3, DTS, MPEG-1/2 and MPEG-4 Part 2 video).
+// For video the decoder configuration (the sequence or VOL headers) goes
+// first unless the first frame begins with it.
+
+#include "tools/extract/frame_writer.h"
+
+class ElementaryWriter : public FrameWriter {
+ public:
+  ElementaryWriter(OutputFile* out, bool headers_first) : FrameWriter(out), headers_first_(headers_first) {}
+  bool Begin(const std::vector<Bytes>& config) override;
+  bool Frame(const FrameView& frame) override;
+
+ private:
+  bool headers_first_;
+  Bytes headers_;  // still to be written before the first frame
+};
