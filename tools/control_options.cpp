@@ -6,7 +6,7 @@
 
 const char kControlUsage[] =
     "  --seek TIME[@AT]    seek to TIME seconds once playback reaches AT seconds (repeatable;\n"
-    "                      AT defaults to 0: at once)\n"
+    "                      without @AT: AT is 0)\n"
     "  --ff SPEED[@AT]     fast forward from AT; SPEED in percent (400: skip 4 x TrickTime per jump)\n"
     "  --rew SPEED[@AT]    rewind likewise\n"
     "  --scan-end AT       end the scan once playback reaches AT seconds\n"

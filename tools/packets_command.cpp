@@ -47,10 +47,11 @@ const char kPacketsHelp[] =
     "\n"
     "options:\n"
     "  --channels K,K,...  output channels to acquire, by index (default: all)\n"
-    "  --buffer-size BYTES bytes per input buffer, 1 to 67108864 (default 32768)\n"
+    "  --buffer-size BYTES\n"
+    "                      bytes per input buffer, 1 to 67108864 (default 32768)\n"
     "  --no-hash           no Adler-32 of the frames\n"
     "  --json              one JSON document instead of lines (docs/json.md, section packets)\n"
-    "%s"
+    "  --plugin PATH       the plug-in to load (default: kelvane.so beside this program)\n"
     "  -h, --help          this text\n"
     "playback control:\n"
     "%s"
@@ -99,7 +100,7 @@ int ParseOptions(int argc, char** argv, Options* options) {
   for (int i = 0; i < argc; ++i) {
     const char* arg = argv[i];
     if (IsHelpOption(arg)) {
-      std::printf(kPacketsHelp, kPluginOptionHelp, kControlUsage);
+      std::printf(kPacketsHelp, kControlUsage);
       return kExitOk;
     }
     std::string error;
