@@ -14,7 +14,8 @@
 //           mode plays;
 //   byte 1: input buffer size code; byte 2: TrickTime code (0: default);
 //   then commands of an op byte and an argument (see Command).
-// KELVANE_FUZZ_SINGLE=1 forces the deterministic mode, to reproduce a crash.
+// KELVANE_FUZZ_SINGLE=1 forces the deterministic mode, to reproduce a crash;
+// KELVANE_FUZZ_VERBOSE=1 prints what each run did.
 //
 // Every answer must be a specified one, every frame element must lie inside
 // the buffer it names (threaded runs: inside an input buffer), and after
@@ -53,7 +54,7 @@ namespace {
 // Bounds of one execution: the file is cut, input buffers are never so small
 // that a file takes more than kMaxInputBuffers of them, and the deterministic
 // mode pulls at most kMaxPulls output buffers.
-constexpr size_t kMaxFileBytes = 48 * 1024;
+constexpr size_t kMaxFileBytes = 160 * 1024;  // the largest fixture, Cues at its end
 constexpr size_t kMaxInputBuffers = 2048;
 constexpr int kMaxCommands = 24;
 constexpr int kMaxPulls = 4000;
@@ -73,6 +74,7 @@ bool OneOf(int value, std::initializer_list<int> allowed) {
 }
 
 const host::Plugin* plugin = nullptr;
+bool verbose = false;
 std::string scratch_path;
 
 // What NextBuffer may end with: an error, the end of the stream, a short
@@ -136,7 +138,9 @@ size_t FileStart(const uint8_t* data, size_t size) {
   return std::min(size, kHeaderWithoutMagic);
 }
 
-void CheckBufferElements(MmfMra* mra) {
+// The buffer elements of a delivered media buffer, each checked.
+uint64_t CheckBufferElements(MmfMra* mra) {
+  uint64_t count = 0;
   uint32_t kind = 0;
   for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
     if (kind != kMmfElementBuffer) continue;
@@ -147,7 +151,9 @@ void CheckBufferElements(MmfMra* mra) {
     Check(handle && address >= handle->Data && size <= handle->Size &&
               static_cast<size_t>(address - handle->Data) <= handle->Size - size,
           "a buffer element outside its buffer", static_cast<long>(size));
+    ++count;
   }
+  return count;
 }
 
 uint64_t LastTime(MmfMra* mra) {
@@ -211,13 +217,15 @@ void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
     host::ControlTables tables{control, flush, plugin->converter(), plugin->seeker(),
                                plugin->Get<MmfTrickPlayOps>("MediaTrickPlay")};
     host::PlaybackControl playback(tables, handle, &streamer, &clock, 0);
-    int pulls = 0;
+    int pulls = 0, last_result = 0;
+    uint64_t elements = 0;
     auto pull = [&](int count) {
       for (int short_inputs = 0; count > 0 && pulls < kMaxPulls; --count, ++pulls) {
         MmfMra* mra = nullptr;
         const int result = output->NextBuffer(channel, &mra);
+        last_result = result;
         if (result == kMmfBufferDelivered && mra) {
-          CheckBufferElements(mra);
+          elements += CheckBufferElements(mra);
           clock.Consumed(LastTime(mra));
           (void)MmfReleaseMra(mra);
           continue;
@@ -258,6 +266,10 @@ void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
       }
     }
     pull(kMaxPulls);
+    if (verbose) {
+      std::fprintf(stderr, "one thread: %s, %d output buffers, %llu buffer elements, ended with %d\n", channel->Name,
+                   pulls, static_cast<unsigned long long>(elements), last_result);
+    }
     (void)control->Stop(handle);
   }
   (void)flush->Flush(handle);
@@ -327,6 +339,10 @@ void PlayThreaded(const uint8_t* file, size_t size, const Header& header) {
   host::RunResult run = host::RunGraph(*plugin, scratch_path, options);
   Check(OneOf(run.rating, {0, kMmfRatingAccepted}), "rating", run.rating);
   for (const host::ChannelRun& channel : run.channels) {
+    if (verbose) {
+      std::fprintf(stderr, "thread of %s: %zu frames, %zu sequences, ended with %d\n", channel.name.c_str(),
+                   channel.frames.size(), channel.seeks.size(), channel.end_result);
+    }
     Check(channel.foreign_elements == 0, "a frame element outside every input buffer",
           static_cast<long>(channel.foreign_elements));
     if (channel.buffers > 0 || run.error.empty()) Check(SpecifiedEnd(channel.end_result), "end", channel.end_result);
@@ -344,6 +360,8 @@ extern "C" int LLVMFuzzerInitialize(int*, char***) {
     std::abort();
   }
   plugin = loaded.get();
+  const char* print = std::getenv("KELVANE_FUZZ_VERBOSE");
+  verbose = print && *print && *print != '0';
   const char* dir = access("/dev/shm", W_OK) == 0 ? "/dev/shm" : "/tmp";
   scratch_path = std::string(dir) + "/kelvane_plugin_fuzz_" + std::to_string(getpid()) + ".mkv";
   std::atexit([] { std::remove(scratch_path.c_str()); });
