@@ -1,9 +1,11 @@
 #!/usr/bin/env bash
-# Runs every fuzz target for SECONDS (default 60) each, seeded with the test
-# fixtures. A longer hunt: bash scripts/fuzz.sh 1800
+# Runs every fuzz target for SECONDS (default 45) each, seeded with the test
+# fixtures and fuzz/corpus/<target>/, with fuzz/<name>.dict or else the
+# Matroska element dictionary. A longer hunt: bash scripts/fuzz.sh 1800
+# New corpus files land in build/fuzz/corpus/<target>/, crashes in build/fuzz/.
 set -euo pipefail
 cd "$(dirname "$0")/.."
-seconds=${1:-60}
+seconds=${1:-45}
 cmake --preset fuzz >/dev/null
 cmake --build --preset fuzz -j"$(nproc)"
 status=0
