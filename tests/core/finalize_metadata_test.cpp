@@ -1,5 +1,10 @@
+// The metadata list: entries as add_metadata_entry takes them, and the list
+// FinalizeMetadata builds from a file model filled by hand the way the
+// handlers leave it. Real files' lists are compared in the fixture test.
+
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstring>
 #include <limits>
 #include <memory>
@@ -9,65 +14,87 @@
 #include "core/memory.h"
 #include "core/metadata_list.h"
 #include "core/status.h"
+#include "host/heap_control.h"
 
 namespace {
 
-// One entry as "Key NUM4 value", "Key NUM8 value" or "Key UTF8 text".
-std::string describe_entry(const mkv_metadata_list& list, int i) {
-  std::string out = std::string(list.key[i]) + " ";
-  switch (list.value_type[i]) {
-    case kMetadataTypeNum4: {
-      uint32_t value;
-      EXPECT_EQ(list.value_size[i], 4);
-      std::memcpy(&value, list.value[i], 4);
-      return out + "NUM4 " + std::to_string(value);
-    }
-    case kMetadataTypeNum8: {
-      int64_t value;
-      EXPECT_EQ(list.value_size[i], 8);
-      std::memcpy(&value, list.value[i], 8);
-      return out + "NUM8 " + std::to_string(value);
-    }
-    case kMetadataTypeUtf8:
-      return out + "UTF8 " + std::string(static_cast<const char*>(list.value[i]), static_cast<size_t>(list.value_size[i]));
-    default:
-      return out + "?";
-  }
-}
-
+// Each entry as "Key NUM4 value", "Key NUM8 value" or "Key UTF8 text".
 std::vector<std::string> describe(const mkv_metadata_list& list) {
   std::vector<std::string> out;
-  for (int i = 0; i < list.entry_count; ++i) out.push_back(describe_entry(list, i));
+  for (int i = 0; i < list.entry_count; ++i) {
+    std::string entry = std::string(list.key[i]) + " ";
+    uint32_t num4 = 0;
+    int64_t num8 = 0;
+    if (list.value_type[i] == kMetadataTypeNum4 && list.value_size[i] == 4) {
+      std::memcpy(&num4, list.value[i], 4);
+      entry += "NUM4 " + std::to_string(num4);
+    } else if (list.value_type[i] == kMetadataTypeNum8 && list.value_size[i] == 8) {
+      std::memcpy(&num8, list.value[i], 8);
+      entry += "NUM8 " + std::to_string(num8);
+    } else if (list.value_type[i] == kMetadataTypeUtf8) {
+      entry += "UTF8 " + std::string(static_cast<const char*>(list.value[i]), static_cast<size_t>(list.value_size[i]));
+    } else {
+      entry += "type " + std::to_string(list.value_type[i]) + " of " + std::to_string(list.value_size[i]) + " bytes";
+    }
+    out.push_back(entry);
+  }
   return out;
 }
 
+TEST(AddMetadataEntryTest, ValueSizeDecidesWhetherTheEntryIsAdded) {
+  static const uint8_t bytes[kMaxMetadataValueSize + 1] = {1, 2, 3};
+  for (int32_t size : {-1, 0, 3, kMaxMetadataValueSize, kMaxMetadataValueSize + 1, INT32_MIN}) {
+    bool fits = size >= 0 && size <= kMaxMetadataValueSize;
+    int64_t live = host::LiveBlockCount();
+    auto* list = mem_new_zeroed<mkv_metadata_list>();
+    ASSERT_NE(list, nullptr);
+    EXPECT_EQ(add_metadata_entry(list, "NUM8", "Key", bytes, size), fits ? kStatusOk : kStatusNoMemory) << size;
+    ASSERT_EQ(list->entry_count, fits ? 1 : 0) << size;
+    if (fits) {
+      EXPECT_STREQ(list->key[0], "Key");
+      EXPECT_EQ(list->value_type[0], kMetadataTypeNum8);
+      EXPECT_EQ(list->value_size[0], size);
+      ASSERT_NE(list->value[0], nullptr);
+      EXPECT_EQ(std::memcmp(list->value[0], bytes, static_cast<size_t>(size)), 0);
+    } else {
+      EXPECT_EQ(list->key[0], nullptr);
+      EXPECT_EQ(list->value[0], nullptr);
+    }
+    FreeMetadata(list);
+    EXPECT_EQ(host::LiveBlockCount(), live) << size;
+  }
+}
+
 // A file model filled by hand, as the handlers would leave it, with a list to build.
-class MetadataFixture {
+class MetadataFile {
  public:
-  MetadataFixture() : info_(std::make_unique<mkv_file_info>()) {
+  MetadataFile() : info_(std::make_unique<mkv_file_info>()) {
     std::memset(info_.get(), 0, sizeof(mkv_file_info));
     info_->parse_limits = &limits_;
     info_->metadata = mem_new_zeroed<mkv_metadata_list>();
     info_->timecode_scale = 1000000;
   }
-  ~MetadataFixture() { FreeMetadata(info_->metadata); }
+  ~MetadataFile() { FreeMetadata(info_->metadata); }
 
   mkv_file_info& info() { return *info_; }
   mkv_parse_limits& limits() { return limits_; }
-  mkv_metadata_list& list() { return *info_->metadata; }
-
-  void AddTag(const char* name, const char* text) {
+  std::vector<std::string> Finalize() {
+    EXPECT_EQ(FinalizeMetadata(info_.get()), kStatusOk);
+    return describe(*info_->metadata);
+  }
+  // `length` defaults to the string's.
+  void AddTag(const char* name, const char* text, int length = -1) {
     mkv_tag_entry& tag = info_->tags[info_->tag_count++];
     tag.name = const_cast<char*>(name);
     tag.string = const_cast<char*>(text);
-    tag.length = text ? static_cast<uint32_t>(std::strlen(text)) : 0;
+    tag.length = length >= 0 ? uint32_t(length) : text ? static_cast<uint32_t>(std::strlen(text)) : 0;
   }
   mkv_track_info& AddTrack(uint64_t type, const char* codec_id = nullptr) {
     mkv_track_info& track = info_->tracks[info_->track_count++];
     track.track_type = type;
     track.codec_id = const_cast<char*>(codec_id);
-    if (type == 1) ++info_->video_track_count;
-    if (type == 2) ++info_->audio_track_count;
+    info_->video_track_count += type == 1;
+    info_->audio_track_count += type == 2;
     return track;
   }
 
@@ -77,12 +104,12 @@ class MetadataFixture {
 };
 
 TEST(FinalizeMetadataTest, EntriesComeInTagThenFileThenTrackOrder) {
-  MetadataFixture file;
+  MetadataFile file;
   file.AddTag("ARTIST", "Someone");
   file.AddTag("title", "lower case is not offered");
-  file.AddTag("TITLE", "abc");
-  file.AddTag("GENRE", nullptr);  // a name without a string
-  file.AddTag("ALBUM", "Album");
+  file.AddTag("TITLE", "abcdef", 3);  // only the first three bytes were the TagString
+  file.AddTag("GENRE", nullptr);       // a name without a string
+  file.AddTag("ALBUM", "xy", 40);      // a longer TagBinary was read after the string
   file.AddTag("COMMENT", "c");
   file.AddTag("ENCODER", "not offered");
   file.info().duration = 5000.0;
@@ -97,100 +124,72 @@ TEST(FinalizeMetadataTest, EntriesComeInTagThenFileThenTrackOrder) {
   audio.sampling_frequency = 44100.0;
   audio.channels = 6;
   audio.pixel_width = 9;  // not offered for audio
-
-  EXPECT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
-  EXPECT_EQ(describe(file.list()), (std::vector<std::string>{
-                                       "Artist UTF8 Someone", "Name UTF8 abc", "Album UTF8 Album", "Comment UTF8 c",
-                                       "Seekable NUM4 1", "TrackCount NUM4 2",
-                                       "MediaType NUM4 2147483650", "Fourcc NUM4 1096172337", "Width NUM4 320",
-                                       "Height NUM4 240", "PixelWidth NUM4 1", "PixelHeight NUM4 1",
-                                       "Duration NUM8 5000000", "Channels NUM4 0", "SampleRate NUM4 24",
-                                       "MediaType NUM4 2147483652", "Fourcc NUM4 1295270211", "Width NUM4 0",
-                                       "Height NUM4 0", "PixelWidth NUM4 1", "PixelHeight NUM4 1",
-                                       "Duration NUM8 5000000", "Channels NUM4 6", "SampleRate NUM4 44100",
-                                   }));
+  EXPECT_EQ(file.Finalize(), (std::vector<std::string>{
+                                 "Artist UTF8 Someone", "Name UTF8 abc", "Album UTF8 xy", "Comment UTF8 c", "Seekable NUM4 1",
+                                 "TrackCount NUM4 2", "MediaType NUM4 2147483650", "Fourcc NUM4 1096172337", "Width NUM4 320",
+                                 "Height NUM4 240", "PixelWidth NUM4 1", "PixelHeight NUM4 1", "Duration NUM8 5000000",
+                                 "Channels NUM4 0", "SampleRate NUM4 24", "MediaType NUM4 2147483652", "Fourcc NUM4 1295270211",
+                                 "Width NUM4 0", "Height NUM4 0", "PixelWidth NUM4 1", "PixelHeight NUM4 1",
+                                 "Duration NUM8 5000000", "Channels NUM4 6", "SampleRate NUM4 44100",
+                             }));
 }
 
-TEST(FinalizeMetadataTest, TagValueStopsAtItsLengthAndAtItsTerminator) {
-  MetadataFixture file;
-  file.AddTag("TITLE", "abcdef");
-  file.info().tags[0].length = 3;  // only the first three bytes were the TagString
-  file.AddTag("ARTIST", "xy");
-  file.info().tags[1].length = 40;  // a longer TagBinary was read after the string
-  ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
-  EXPECT_EQ(describe_entry(file.list(), 0), "Name UTF8 abc");
-  EXPECT_EQ(describe_entry(file.list(), 1), "Artist UTF8 xy");
-}
-
-TEST(FinalizeMetadataTest, SeekableNeedsASeekableInputAndCues) {
-  const struct {
-    bool limits;
-    uint32_t input_seekable;
-    uint32_t flags;
-    uint32_t seekable;
-  } cases[] = {
-      {true, 1, kMetCues, 1}, {true, 1, 0, 0}, {true, 0, kMetCues, 0}, {false, 1, kMetCues, 0},
-  };
-  for (const auto& c : cases) {
-    MetadataFixture file;
-    file.limits().input_seekable = c.input_seekable;
-    if (!c.limits) file.info().parse_limits = nullptr;
-    file.info().parse_flags = c.flags;
-    ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
-    EXPECT_EQ(describe(file.list()), (std::vector<std::string>{"Seekable NUM4 " + std::to_string(c.seekable),
-                                                               "TrackCount NUM4 0"}));
-  }
-}
-
-// The number of the track's first entry under `key`, from its description.
-std::string value_of(const mkv_metadata_list& list, const std::string& key) {
-  for (const std::string& entry : describe(list)) {
-    if (entry.rfind(key + " ", 0) == 0) return entry.substr(entry.rfind(' ') + 1);
-  }
-  return key + " missing";
-}
-
-// Frame rates from DefaultDuration round; sampling frequencies and durations
-// truncate; whatever does not fit saturates or gives 0.
+// Seekable needs a seekable input and cues. Frame rates from DefaultDuration
+// round; sampling frequencies and durations truncate; whatever does not fit
+// saturates or gives 0.
 TEST(FinalizeMetadataTest, NumbersAreRoundedTruncatedAndClamped) {
   constexpr double kNan = std::numeric_limits<double>::quiet_NaN();
   constexpr double kInf = std::numeric_limits<double>::infinity();
+  constexpr uint64_t kNoTrack = 0;
   const struct {
     uint64_t track_type;
     uint64_t default_duration;
     double frequency;
     uint64_t timecode_scale;
     double duration;
-    const char* key;
-    std::string value;
+    std::string entry;
+    uint32_t input_seekable = 1, flags = 0;
+    bool limits = true;
   } cases[] = {
-      {1, 41708333, 0, 1000000, 0, "SampleRate", "24"},
-      {1, 0, 0, 1000000, 0, "SampleRate", "0"},
-      {1, 1, 0, 1000000, 0, "SampleRate", "1000000000"},
-      {1, 1000000000000, 0, 1000000, 0, "SampleRate", "0"},
-      {1, UINT64_MAX, 0, 1000000, 0, "SampleRate", "0"},
-      {2, 0, 22050.7, 1000000, 0, "SampleRate", "22050"},
-      {2, 0, -2.5, 1000000, 0, "SampleRate", std::to_string(uint32_t(-2))},
-      {2, 0, kNan, 1000000, 0, "SampleRate", "0"},
-      {2, 0, 1e12, 1000000, 0, "SampleRate", std::to_string(INT32_MAX)},
-      {2, 0, -1e12, 1000000, 0, "SampleRate", std::to_string(uint32_t{1} << 31)},
-      {2, 0, kInf, 1000000, 0, "SampleRate", std::to_string(INT32_MAX)},
-      {2, 0, 0, 1000, 2.5, "Duration", "2"},
-      {2, 0, 0, 22675, 44100.0, "Duration", "999967"},
-      {2, 0, 0, 1000000, kNan, "Duration", "0"},
-      {2, 0, 0, 1000000, 1e300, "Duration", std::to_string(INT64_MAX)},
-      {2, 0, 0, 1000000, -1e300, "Duration", std::to_string(INT64_MIN)},
+      {kNoTrack, 0, 0, 1000000, 0, "Seekable NUM4 1", 1, kMetCues},
+      {kNoTrack, 0, 0, 1000000, 0, "Seekable NUM4 0", 1, 0},
+      {kNoTrack, 0, 0, 1000000, 0, "Seekable NUM4 0", 0, kMetCues},
+      {kNoTrack, 0, 0, 1000000, 0, "Seekable NUM4 0", 1, kMetCues, false},
+      {1, 41708333, 0, 1000000, 0, "SampleRate NUM4 24"},
+      {1, 0, 0, 1000000, 0, "SampleRate NUM4 0"},
+      {1, 1, 0, 1000000, 0, "SampleRate NUM4 1000000000"},
+      {1, 1000000000000, 0, 1000000, 0, "SampleRate NUM4 0"},
+      {1, UINT64_MAX, 0, 1000000, 0, "SampleRate NUM4 0"},
+      {2, 0, 22050.7, 1000000, 0, "SampleRate NUM4 22050"},
+      {2, 0, -2.5, 1000000, 0, "SampleRate NUM4 " + std::to_string(uint32_t(-2))},
+      {2, 0, kNan, 1000000, 0, "SampleRate NUM4 0"},
+      {2, 0, 1e12, 1000000, 0, "SampleRate NUM4 " + std::to_string(INT32_MAX)},
+      {2, 0, -1e12, 1000000, 0, "SampleRate NUM4 " + std::to_string(uint32_t{1} << 31)},
+      {2, 0, kInf, 1000000, 0, "SampleRate NUM4 " + std::to_string(INT32_MAX)},
+      {2, 0, 0, 1000, 2.5, "Duration NUM8 2"},
+      {2, 0, 0, 22675, 44100.0, "Duration NUM8 999967"},
+      {2, 0, 0, 1000000, kNan, "Duration NUM8 0"},
+      {2, 0, 0, 1000000, 1e300, "Duration NUM8 " + std::to_string(INT64_MAX)},
+      {2, 0, 0, 1000000, -1e300, "Duration NUM8 " + std::to_string(INT64_MIN)},
   };
   for (const auto& c : cases) {
-    MetadataFixture file;
+    MetadataFile file;
     file.info().timecode_scale = c.timecode_scale;
     file.info().duration = c.duration;
-    mkv_track_info& track = file.AddTrack(c.track_type);
-    track.default_duration = c.default_duration;
-    track.sampling_frequency = c.frequency;
-    ASSERT_EQ(FinalizeMetadata(&file.info()), kStatusOk);
-    EXPECT_EQ(value_of(file.list(), c.key), c.value)
+    file.info().parse_flags = c.flags;
+    file.limits().input_seekable = c.input_seekable;
+    if (!c.limits) file.info().parse_limits = nullptr;
+    if (c.track_type != kNoTrack) {
+      mkv_track_info& track = file.AddTrack(c.track_type);
+      track.default_duration = c.default_duration;
+      track.sampling_frequency = c.frequency;
+    }
+    std::vector<std::string> entries = file.Finalize();
+    std::string key = c.entry.substr(0, c.entry.find(' ') + 1);
+    auto found = std::find_if(entries.begin(), entries.end(), [&](const std::string& e) { return e.starts_with(key); });
+    EXPECT_EQ(found == entries.end() ? key + "missing" : *found, c.entry)
         << c.default_duration << " " << c.frequency << " " << c.timecode_scale << " x " << c.duration;
+    EXPECT_EQ(entries.size(), c.track_type == kNoTrack ? 2u : 11u);
   }
 }
 
