@@ -6,7 +6,7 @@ set -euo pipefail
 what=${1:-test}
 packages=(cmake make g++ googletest libgtest-dev libgmock-dev)
 if [[ $what == test ]]; then
-  packages+=(g++-arm-linux-gnueabihf qemu-user clang libclang-rt-14-dev libbenchmark-dev)
+  packages+=(g++-arm-linux-gnueabihf qemu-user clang libclang-rt-14-dev libbenchmark-dev ffmpeg)
 fi
 
 missing=()

@@ -1,0 +1,121 @@
+#!/usr/bin/env bash
+# Runs `kelvane extract` on every fixture and decodes each extracted file with
+# ffmpeg: its decoded frames must be those ffmpeg decodes from that track of
+# the original file. Compared per decoded frame are the size and MD5 columns
+# of framemd5; the dts, pts and duration columns are ignored because
+# elementary streams (.h264, .mp3, .m2v...) carry no timestamps and other
+# containers count in other time bases. Also ignored, and said where:
+#  - PCM: a WAV demuxer cuts the samples into packets of its own choosing,
+#    so the whole decoded stream's MD5 is compared instead;
+#  - the end of the last audio frame, when the original drops it (a Matroska
+#    DiscardPadding, which an elementary stream cannot carry): the decoded
+#    samples must then be the original's followed by less than one frame.
+# Raw tracks (no stream format) compare each frame of NAME.raw, as its index
+# places it, with ffmpeg's packets of the track (-c copy). ffmpeg is required:
+# without it the check fails.
+#   check_extract.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
+set -uo pipefail
+source_dir=$1
+shift
+kelvane=("$@")
+fixtures=$source_dir/tests/fixtures
+work=$(mktemp -d)
+trap 'rm -rf "$work"' EXIT
+
+failures=0
+fail() { echo "FAIL $*"; failures=$((failures + 1)); }
+command -v ffmpeg >/dev/null || { echo "FAIL ffmpeg is missing (scripts/install-deps.sh test installs it)"; exit 1; }
+
+ff() { ffmpeg -nostdin -v error "$@"; }
+# "size md5" of each decoded frame.
+frames() { ff "$@" -fps_mode passthrough -f framemd5 - | awk -F', *' '!/^#/ { print $5, $6 }'; }
+# The decoded audio as 32-bit float samples, for the trimmed-tail comparison.
+samples() { ff "$@" -c:a pcm_f32le -f f32le - 2>/dev/null; }  # may be cut short by head
+
+compare_raw() {  # label original stream raw index
+  local want got
+  want=$(ff -i "$2" -map "0:$3" -c copy -f framemd5 - | awk -F', *' '!/^#/ { print $5, $6 }')
+  got=$(perl -MDigest::MD5=md5_hex -e '
+    open my $raw, "<:raw", $ARGV[0] or die; my $bytes = do { local $/; <$raw> };
+    open my $index, "<", $ARGV[1] or die;
+    while (<$index>) { my @f = split; print "$f[2] ", md5_hex(substr($bytes, $f[1], $f[2])), "\n" if $f[0] eq "frame" }
+  ' "$4" "$5")
+  [[ -n "$want" && "$want" == "$got" ]] || fail "$1: raw frames differ from the track's packets"
+}
+
+compare_decoded() {  # label original stream extracted type codec
+  if [[ $6 == pcm_* ]]; then
+    [[ $(ff -i "$2" -map "0:$3" -f md5 -) == $(ff -i "$4" -f md5 -) ]] || fail "$1: decoded PCM differs"
+    return
+  fi
+  local want got
+  want=$(frames -i "$2" -map "0:$3")
+  got=$(frames -i "$4")
+  [[ -n "$want" ]] || { fail "$1: ffmpeg decodes nothing from the original"; return; }
+  [[ "$want" == "$got" ]] && return
+  local last_want last_got
+  last_want=$(tail -n1 <<<"$want")
+  last_got=$(tail -n1 <<<"$got")
+  if [[ $5 == audio && $(head -n-1 <<<"$want") == $(head -n-1 <<<"$got") && ${last_want%% *} -lt ${last_got%% *} ]]; then
+    local bytes
+    bytes=$(samples -i "$2" -map "0:$3" | wc -c)
+    [[ $(samples -i "$2" -map "0:$3" | md5sum) == $(samples -i "$4" | head -c "$bytes" | md5sum) ]] && return
+  fi
+  fail "$1: decoded frames differ ($(wc -l <<<"$want") original, $(wc -l <<<"$got") extracted)"
+}
+
+checked=0
+for original in "$fixtures"/*.mkv; do
+  name=$(basename "$original" .mkv)
+  out=$work/$name
+  listing=$("${kelvane[@]}" extract -q "$original" -o "$out" 2>"$work/stderr")
+  code=$?
+  if ! grep -qx 'doc_type matroska' "$fixtures/$name.expected"; then
+    # The plug-in plays DocType matroska only.
+    [[ $code == 1 && -z "$listing" ]] || fail "$name: a refused file answers $code"
+    continue
+  fi
+  [[ $code == 0 ]] || { fail "$name: exit code $code: $(cat "$work/stderr")"; continue; }
+  # ffmpeg numbers the streams in track-entry order.
+  mapfile -t numbers < <(awk '/^track / { sub("number=", "", $2); print $2 }' "$fixtures/$name.expected")
+  mapfile -t streams < <(ffprobe -v error -show_entries stream=codec_type,codec_name -of csv=p=0 "$original")
+  while read -r _ track codec_id path _ index _; do
+    [[ -n "$track" ]] || continue
+    path=${path%,}
+    stream=-1
+    for i in "${!numbers[@]}"; do [[ ${numbers[$i]} == "$track" ]] && stream=$i; done
+    label="$name track $track ${codec_id%:}"
+    IFS=, read -r codec type <<<"${streams[$stream]:-}"
+    if [[ $path == *.raw ]]; then
+      compare_raw "$label" "$original" "$stream" "$path" "${index%,}"
+    else
+      compare_decoded "$label" "$original" "$stream" "$path" "$type" "$codec"
+    fi
+    checked=$((checked + 1))
+  done <<<"$listing"
+done
+((checked >= 40)) || fail "only $checked tracks were extracted and compared"
+
+# Selection and errors: exit code, then what standard error must say.
+file=$fixtures/multi_audio.mkv
+"${kelvane[@]}" extract -q "$file" -t 4,2 -o "$work/some" >/dev/null 2>&1 || fail "-t 4,2: exit code $?"
+[[ $(ls "$work/some") == $'track2.mp3\ntrack4.aac' ]] || fail "-t 4,2 wrote: $(ls "$work/some" | tr '\n' ' ')"
+while IFS='|' read -r want message args; do
+  read -ra words <<<"$args"
+  err=$("${kelvane[@]}" extract "${words[@]}" 2>&1 >/dev/null)
+  code=$?
+  [[ $code == "$want" && $err == *"$message"* ]] || fail "extract $args: exit $code, said: $err"
+done <<EOF2
+2|offers no track 9 (offered: 1 2 3 4)|$file -t 9 -o $work/none
+2|try 'kelvane extract --help'|$file
+2|unknown option '--bogus'|--bogus $file -o $work/none
+1|cannot open $work/missing.mkv|$work/missing.mkv -o $work/none
+1|the plug-in refused it|$fixtures/index.txt -o $work/none
+EOF2
+"${kelvane[@]}" extract --help | grep -q '^  kelvane extract movie.mkv' || fail "--help shows no example"
+
+if ((failures)); then
+  echo "$failures failures"
+  exit 1
+fi
+echo "kelvane extract: $checked extracted tracks decode like the originals"

@@ -1,0 +1,43 @@
+#!/usr/bin/env bash
+# Drives `kelvane extract` as a person at a terminal does, in a
+# pseudo-terminal made by script(1): the progress bar (bytes, frames, rate,
+# time left) must appear there, and must not when standard error is a pipe
+# or a file, or with --quiet.
+#   check_progress_tty.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
+set -uo pipefail
+source_dir=$1
+shift
+kelvane=("$@")
+file=$source_dir/tests/fixtures/long_cues.mkv
+work=$(mktemp -d)
+trap 'rm -rf "$work"' EXIT
+
+failures=0
+fail() { echo "FAIL $*"; failures=$((failures + 1)); }
+command -v script >/dev/null || { echo "FAIL script(1) from util-linux is missing"; exit 1; }
+
+# The final state of the bar, as the terminal shows it once the run is over.
+bar='extract \[#{24}\] 100%  [0-9.]+ [KMG]?i?B  [0-9]+ frames  [0-9.]+ [KMG]?i?B/s  0:00 left'
+
+in_terminal() {  # output directory, extra options; prints what the terminal received
+  script -qfec "$(printf '%q ' "${kelvane[@]}" extract "$file" -o "$work/$1" "${@:2}")" /dev/null
+}
+
+seen=$(in_terminal tty)
+[[ $seen =~ $bar ]] || fail "no progress bar in a terminal; it showed: $(tr '\r' '\n' <<<"$seen" | head -3)"
+[[ $seen == *"track 1 V_MPEG4/ISO/AVC"* ]] || fail "the terminal did not show the list of files"
+[[ -s $work/tty/track1.h264 ]] || fail "nothing was extracted in the terminal"
+
+seen=$(in_terminal quiet --quiet)
+[[ $seen == *frames* && ! $seen =~ $bar ]] || fail "--quiet still drew a progress bar"
+
+"${kelvane[@]}" extract "$file" -o "$work/pipe" 2>&1 >/dev/null | cat >"$work/piped"
+[[ ! -s $work/piped ]] || fail "progress on a piped standard error: $(head -c 200 "$work/piped")"
+"${kelvane[@]}" extract "$file" -o "$work/file" >/dev/null 2>"$work/stderr"
+[[ ! -s $work/stderr ]] || fail "progress in a file: $(head -c 200 "$work/stderr")"
+
+if ((failures)); then
+  echo "$failures failures"
+  exit 1
+fi
+echo "kelvane extract draws its progress bar in a terminal only"
