@@ -5,7 +5,10 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdio>
+#include <cstring>
 #include <string>
+#include <type_traits>
 #include <vector>
 
 #include "core/header/element_handlers.h"
@@ -27,24 +30,56 @@ std::string text(const char* s) { return s ? s : "-"; }
 template <typename T>
 std::string n(T value) { return std::to_string(value); }
 
+// Fields that differ from the record's defaults, as "name value", or "defaults".
+struct Fields {
+  std::string out;
+  template <typename T>
+  Fields& add(const char* name, T value, std::type_identity_t<T> fallback) {
+    if (value != fallback) out += (out.empty() ? "" : " ") + std::string(name) + " " + format(value);
+    return *this;
+  }
+  static std::string format(const char* s) { return s; }
+  static std::string format(char* s) { return s; }
+  static std::string format(const std::string& s) { return s; }
+  static std::string format(double v) {
+    char buffer[32];
+    std::snprintf(buffer, sizeof buffer, "%.15g", v);
+    return buffer;
+  }
+  template <typename T>
+  static std::string format(T v) { return std::to_string(v); }
+  std::string done() const { return out.empty() ? "defaults" : out; }
+};
+
 std::string info_of(const mkv_file_info& i) {
-  return "scale " + n(i.timecode_scale) + " duration " + n(i.duration) + " date " + n(i.date_utc) + " uid " +
-         n(i.segment_uid[0]) + ".." + n(i.segment_uid[15]) + " title " + text(i.title) + " file " +
-         text(i.segment_filename) + ((i.parse_flags & kMetInfo) ? "" : " unmet");
+  char* none = nullptr;
+  return Fields{}
+      .add("scale", i.timecode_scale, uint64_t{1000000})
+      .add("duration", i.duration, 0.0)
+      .add("date", i.date_utc, int64_t{0})
+      .add("uid", n(i.segment_uid[0]) + ".." + n(i.segment_uid[15]), std::string("0..0"))
+      .add("title", i.title, none)
+      .add("file", i.segment_filename, none)
+      .add("unmet", !(i.parse_flags & kMetInfo), false)
+      .done();
 }
 
-// The first track: number, channels, width, names, encodings as order/scope/settings.
+// The first track: number, channels, width, names, sizes, flags and the
+// encodings as order/scope/settings size (k: a key ID).
 std::string track_of(const mkv_file_info& i) {
   if (i.track_count == 0) return "none";
   const mkv_track_info& t = i.tracks[0];
-  std::string out = "#" + n(t.track_number) + " channels " + n(t.channels) + " width " + n(t.pixel_width) + " name " +
-                    text(t.name) + " codec " + n(t.codec_id ? std::string(t.codec_id).size() : 0) + " private " +
-                    n(t.codec_private_size) + " enc " + n(t.encrypted) + " comp " + n(t.compressed);
+  char* none = nullptr;
+  Fields f;
+  f.add("number", t.track_number, uint64_t{0}).add("channels", t.channels, uint64_t{1}).add("width", t.pixel_width, uint64_t{0});
+  f.add("name", t.name, none).add("codec", t.codec_id ? std::strlen(t.codec_id) : 0, size_t{0});
+  f.add("private", t.codec_private_size, uint32_t{0}).add("enc", t.encrypted, decltype(t.encrypted){0});
+  f.add("comp", t.compressed, decltype(t.compressed){0});
   for (uint32_t e = 0; e < t.content_encoding_count; ++e) {
     const mkv_content_encoding& c = t.content_encodings[e];
-    out += " " + n(c.order) + "/" + n(c.scope) + "/" + n(c.comp_settings_size) + (c.enc_key_id ? "k" : "");
+    f.out += " " + n(c.order) + "/" + n(c.scope) + "/" + n(c.comp_settings_size) + (c.enc_key_id ? "k" : "");
   }
-  return out;
+  return f.done();
 }
 
 // List 0 as id@position in list order; the count and the flag.
@@ -142,7 +177,6 @@ Bytes encodings(uint64_t first, uint64_t last) {
   return element(kContentEncodings, out);
 }
 
-const std::string kNoInfo = "scale 1000000 duration 0.000000 date 0 uid 0..0 title - file -";
 const char* const kReadError = "Error Reading at line *";
 
 TEST(HeaderHandlersTest, StoreWhatTheElementHoldsAndFailAsSpecified) {
@@ -157,17 +191,17 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsAndFailAsSpecified) {
     const char* message = nullptr;  // logged at notice level (a trailing '*' matches any rest); Tags: else nothing
   } cases[] = {
       // Info: values as encoded; a wrong size fails the element.
-      {"Info: nothing", kInfoH, {}, kStatusOk, kNoInfo},
-      {"Info: TimecodeScale of length 0", kInfoH, element(kTimecodeScale, {}), kStatusOk, "scale 0 duration 0.000000 date 0 uid 0..0 title - file -"},
-      {"Info: TimecodeScale 22675", kInfoH, uinteger(kTimecodeScale, 22675), kStatusOk, "scale 22675 duration 0.000000 date 0 uid 0..0 title - file -"},
-      {"Info: Duration as single", kInfoH, element(kDuration, {0x45, 0xFA, 0x00, 0x00}), kStatusOk, "scale 1000000 duration 8000.000000 date 0 uid 0..0 title - file -"},
-      {"Info: Duration as double", kInfoH, f64(kDuration, 1234.5678), kStatusOk, "scale 1000000 duration 1234.567800 date 0 uid 0..0 title - file -"},
-      {"Info: DateUTC of one byte 0xFF", kInfoH, element(kDateUtc, {0xFF}), kStatusOk, "scale 1000000 duration 0.000000 date -1 uid 0..0 title - file -"},
-      {"Info: DateUTC of eight bytes", kInfoH, sinteger(kDateUtc, -1234567890123, 8), kStatusOk, "scale 1000000 duration 0.000000 date -1234567890123 uid 0..0 title - file -"},
-      {"Info: DateUTC positive", kInfoH, sinteger(kDateUtc, 0x7F00, 2), kStatusOk, "scale 1000000 duration 0.000000 date 32512 uid 0..0 title - file -"},
+      {"Info: nothing", kInfoH, {}, kStatusOk, "defaults"},
+      {"Info: TimecodeScale of length 0", kInfoH, element(kTimecodeScale, {}), kStatusOk, "scale 0"},
+      {"Info: TimecodeScale 22675", kInfoH, uinteger(kTimecodeScale, 22675), kStatusOk, "scale 22675"},
+      {"Info: Duration as single", kInfoH, element(kDuration, {0x45, 0xFA, 0x00, 0x00}), kStatusOk, "duration 8000"},
+      {"Info: Duration as double", kInfoH, f64(kDuration, 1234.5678), kStatusOk, "duration 1234.5678"},
+      {"Info: DateUTC of one byte 0xFF", kInfoH, element(kDateUtc, {0xFF}), kStatusOk, "date -1"},
+      {"Info: DateUTC of eight bytes", kInfoH, sinteger(kDateUtc, -1234567890123, 8), kStatusOk, "date -1234567890123"},
+      {"Info: DateUTC positive", kInfoH, sinteger(kDateUtc, 0x7F00, 2), kStatusOk, "date 32512"},
       {"Info: UID, filename and a later Title", kInfoH,
        cat({bin(kSegmentUid, {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 16}), str(kTitle, "A"), str(kSegmentFilename, "f.mkv"), str(kTitle, "B")}),
-       kStatusOk, "scale 1000000 duration 0.000000 date 0 uid 1..16 title B file f.mkv"},
+       kStatusOk, "uid 1..16 title B file f.mkv"},
       {"Info: UID of 15 bytes", kInfoH, bin(kSegmentUid, filler(15)), kStatusMalformed, ""},
       {"Info: Duration of 2 bytes", kInfoH, element(kDuration, {0x45, 0xFA}), kStatusMalformed, ""},
       {"Info: TimecodeScale of 9 bytes", kInfoH, element(kTimecodeScale, filler(9, 1)), kStatusMalformed, ""},
@@ -184,23 +218,17 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsAndFailAsSpecified) {
       {"Track: codec ID cut short", kTrackH, cat({held(), cut(kCodecId, 20, 3)}), kStatusReadFailed, "none", 64, true, kReadError},
       {"Track: encoding payload cut short", kTrackH, cat({held(), cut(kContentSigKeyId, 9, 1)}), kStatusReadFailed, "none", 64, true, kReadError},
       {"Track: ID byte 0x0F ends the entry", kTrackH, cat({uinteger(kTrackNumber, 5), Bytes{0x0F, 0x81, 0x00}, uinteger(kChannels, 6)}), kStatusOk,
-       "#5 channels 1 width 0 name - codec 0 private 0 enc 0 comp 0"},
+       "number 5"},
       {"Track: size byte 0x00 ends the entry", kTrackH, cat({uinteger(kTrackNumber, 5), Bytes{0x9F, 0x00}, uinteger(kChannels, 6)}), kStatusOk,
-       "#5 channels 1 width 0 name - codec 0 private 0 enc 0 comp 0"},
-      {"Track: file ends inside a size", kTrackH, cat({uinteger(kTrackNumber, 5), Bytes{0x9F, 0x40}}), kStatusOk,
-       "#5 channels 1 width 0 name - codec 0 private 0 enc 0 comp 0", 10},
-      {"Track: entry ends before the next child", kTrackH, cat({uinteger(kTrackNumber, 5), uinteger(kChannels, 6)}), kStatusOk,
-       "#5 channels 1 width 0 name - codec 0 private 0 enc 0 comp 0", -3},
-      {"Track: Name at the limit", kTrackH, str(kName, std::string(8192, 'n')), kStatusOk,
-       "#0 channels 1 width 0 name " + std::string(8192, 'n') + " codec 0 private 0 enc 0 comp 0"},
+       "number 5"},
+      {"Track: file ends inside a size", kTrackH, cat({uinteger(kTrackNumber, 5), Bytes{0x9F, 0x40}}), kStatusOk, "number 5", 10},
+      {"Track: entry ends before the next child", kTrackH, cat({uinteger(kTrackNumber, 5), uinteger(kChannels, 6)}), kStatusOk, "number 5", -3},
+      {"Track: Name at the limit", kTrackH, str(kName, std::string(8192, 'n')), kStatusOk, "name " + std::string(8192, 'n')},
       {"Track: Name past the limit", kTrackH, str(kName, std::string(8193, 'n')), kStatusNoMemory, "none"},
-      {"Track: Name past the limit, no limits", kTrackH, str(kName, std::string(8193, 'n')), kStatusOk,
-       "#0 channels 1 width 0 name " + std::string(8193, 'n') + " codec 0 private 0 enc 0 comp 0", 0, false},
-      {"Track: CodecID one below the limit", kTrackH, str(kCodecId, std::string(8191, 'V')), kStatusOk,
-       "#0 channels 1 width 0 name - codec 8191 private 0 enc 0 comp 0"},
+      {"Track: Name past the limit, no limits", kTrackH, str(kName, std::string(8193, 'n')), kStatusOk, "name " + std::string(8193, 'n'), 0, false},
+      {"Track: CodecID one below the limit", kTrackH, str(kCodecId, std::string(8191, 'V')), kStatusOk, "codec 8191"},
       {"Track: CodecID at the limit", kTrackH, str(kCodecId, std::string(8192, 'V')), kStatusNoMemory, "none"},
-      {"Track: CodecPrivate at the bound", kTrackH, bin(kCodecPrivate, filler(32768, 3)), kStatusOk,
-       "#0 channels 1 width 0 name - codec 0 private 32768 enc 0 comp 0"},
+      {"Track: CodecPrivate at the bound", kTrackH, bin(kCodecPrivate, filler(32768, 3)), kStatusOk, "private 32768"},
       {"Track: CodecPrivate past the bound, no limits", kTrackH, bin(kCodecPrivate, filler(32769, 3)), kStatusNoMemory, "none", 0, false},
       {"Track: ContentCompSettings past the bound", kTrackH, cat({master(kContentEncoding, {}), bin(kContentCompSettings, filler(32769))}),
        kStatusNoMemory, "none"},
@@ -211,7 +239,7 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsAndFailAsSpecified) {
        cat({uinteger(kContentEncodingOrder, 7), bin(kContentEncKeyId, {1}), master_sized(kVideo, 1, {uinteger(kPixelWidth, 640)}),
             master(kContentEncodings, {master(kContentEncoding, {uinteger(kContentEncodingScope, 2), master(kContentEncryption, {})})}),
             encodings(10, 15)}),
-       kStatusOk, "#0 channels 1 width 640 name - codec 0 private 0 enc 1 comp 1 0/2/0 10/1/1 11/1/1 12/1/1 15/1/1"},
+       kStatusOk, "width 640 enc 1 comp 1 0/2/0 10/1/1 11/1/1 12/1/1 15/1/1"},
 
       // SeekHead: entries sorted by position keeping file order of ties; a
       // SeekHead without a Seek is not counted; a damaged one is dropped and
@@ -227,14 +255,12 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsAndFailAsSpecified) {
       {"Seek: unknown children and a Void", kSeekH, cat({bin(kVoid, filler(3)), master(kSeek, {bin(0x4321, filler(2)), seek(kInfo, 6)})}),
        kStatusOk, "0@0 1549A966@6 heads 1 met"},
       {"Seek: empty", kSeekH, {}, kStatusOk, "heads 0"},
-      {"Seek: Seek children without their Seek", kSeekH, cat({element(kSeekId, id_bytes(kCues)), uinteger(kSeekPosition, 9)}),
-       kStatusOk, "heads 0"},
+      {"Seek: Seek children without their Seek", kSeekH, cat({element(kSeekId, id_bytes(kCues)), uinteger(kSeekPosition, 9)}), kStatusOk, "heads 0"},
       {"Seek: malformed child ID", kSeekH, cat({seek(kInfo, 1), Bytes{0x00, 0x81, 0x00}, seek(kCues, 2)}), kStatusOk, "heads 0"},
       {"Seek: malformed child size", kSeekH, cat({seek(kInfo, 1), Bytes{0xEC, 0x00}, seek(kCues, 2)}), kStatusOk, "heads 0"},
       {"Seek: stored ID of five bytes", kSeekH, cat({seek(kInfo, 1), master(kSeek, {element(kSeekId, Bytes{0x08, 1, 2, 3, 4})})}),
        kStatusOk, "heads 0"},
-      {"Seek: stored ID starting with 0x00", kSeekH, cat({seek(kInfo, 1), master(kSeek, {element(kSeekId, Bytes{0x00})})}),
-       kStatusOk, "heads 0"},
+      {"Seek: stored ID starting with 0x00", kSeekH, cat({seek(kInfo, 1), master(kSeek, {element(kSeekId, Bytes{0x00})})}), kStatusOk, "heads 0"},
       {"Seek: SeekPosition of 9 bytes", kSeekH,
        cat({seek(kInfo, 1), master(kSeek, {element(kSeekId, id_bytes(kCues)), element(kSeekPosition, filler(9))})}), kStatusMalformed, "heads 0"},
       {"Seek: SeekID of 9 bytes", kSeekH, cat({seek(kInfo, 1), master(kSeek, {element(kSeekId, filler(9, 0x81))})}), kStatusMalformed, "heads 0"},
