@@ -50,8 +50,8 @@ const std::string kExtractHelp = std::string(
     "  -t, --track TRACK  extract this track (repeatable, or TRACK,TRACK...);\n"
     "                     default: every track the plug-in offers\n"
     "  -o, --output DIR   the directory to write to (made, with its parents, when missing)\n"
-    "  -q, --quiet        no progress bar\n" +
-    kPluginOptionHelp +
+    "  -q, --quiet        no progress bar\n"
+    "  --plugin PATH      the plug-in to load (default: kelvane.so beside this program)\n"
     "  -h, --help         this text\n"
     "\n"
     "exit codes: 0 every file written; 1 the file cannot be read, the plug-in refused it,\n"

@@ -61,7 +61,8 @@ void ChannelExtractor::Deliver() {
   if (!carried_.empty()) pieces_.insert(pieces_.begin(), iovec{carried_.data(), carried_.size()});
   FrameView frame{pieces_.data(), pieces_.size(), 0, frame_time_us_};
   for (const iovec& piece : pieces_) frame.size += piece.iov_len;
-  if (Begun() && !failed_) Check(writer_->Frame(frame));
+  Begin();
+  if (!failed_) Check(writer_->Frame(frame));
   ++frames_;
   bytes_ += frame.size;
   if (progress_) progress_->Add(frame.size, 1);
@@ -69,12 +70,10 @@ void ChannelExtractor::Deliver() {
   carried_.clear();
 }
 
-bool ChannelExtractor::Begun() {
-  if (!begun_) {
-    begun_ = true;
-    Check(writer_->Begin(config_));
-  }
-  return begun_;
+void ChannelExtractor::Begin() {
+  if (begun_) return;
+  begun_ = true;
+  Check(writer_->Begin(config_));
 }
 
 void ChannelExtractor::Check(bool ok) {
@@ -88,7 +87,7 @@ bool ChannelExtractor::Finish() {
     failed_ = true;
     error_ = "the stream ended inside a frame";
   }
-  Begun();
+  Begin();
   bool closed = writer_->Finish();
   if (!failed_ && !closed) Check(false);
   return !failed_;

@@ -36,7 +36,7 @@ class ChannelExtractor {
   void Property(uint32_t type, uint64_t value);
   void Piece(uint8_t* address, uint32_t size);
   void Deliver();
-  bool Begun();
+  void Begin();  // the writer gets the configuration packets once, before the first frame
   void Check(bool ok);
 
   std::unique_ptr<FrameWriter> writer_;
