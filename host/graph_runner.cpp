@@ -57,17 +57,13 @@ class Sink {
       : run_(run), options_(options), config_pool_(config_pool), prefix_pool_(prefix_pool) {}
 
   void Consume(MmfMra* mra) {
-    uint32_t kind = 0;
-    for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
-      if (kind == kMmfElementProperty) {
-        uint32_t type = 0, low = 0;
-        uint16_t high = 0;
-        if (MmfGetMraPropertyElement(mra, i, &type, &low, &high) == 0) Property(type, MmfPropertyValue(low, high));
-      } else if (kind == kMmfElementBuffer) {
-        MmfPoolBuffer* handle = nullptr;
-        uint8_t* address = nullptr;
-        uint32_t size = 0;
-        if (MmfGetMraBufferElement(mra, i, &handle, &address, &size) == 0) Buffer(handle, address, size);
+    const MraElement* elements = MraElements(mra);
+    for (uint32_t i = 0; i < mra->ElementCount; ++i) {
+      const MraElement& element = elements[i];
+      if (element.kind == kMmfElementProperty) {
+        Property(element.type, MmfPropertyValue(element.low, element.high));
+      } else if (element.kind == kMmfElementBuffer) {
+        Buffer(element.handle, element.address, element.size);
       }
     }
   }

@@ -13,15 +13,7 @@
 
 namespace {
 
-struct Element {
-  uint32_t kind;  // kMmfElement...
-  uint32_t type;  // property type
-  uint32_t low;
-  uint16_t high;
-  MmfPoolBuffer* handle;  // buffer element: holds one reference
-  uint8_t* address;
-  uint32_t size;
-};
+using Element = host::MraElement;
 
 struct MraPoolState;
 
@@ -95,6 +87,8 @@ MmfMraPool* MakeMraPool(uint32_t count, uint32_t capacity) {
   }
   return reinterpret_cast<MmfMraPool*>(state);
 }
+
+const MraElement* MraElements(MmfMra* mra) { return Host(mra)->elements; }
 
 uint32_t MraPoolFreeCount(MmfMraPool* pool) {
   std::lock_guard lock(State(pool)->mutex);

@@ -1,8 +1,10 @@
 // Memory pools: fixed buffers with reference counts behind the framework's
 // operation table.
 
+#include <atomic>
 #include <condition_variable>
 #include <cstring>
+#include <memory>
 #include <mutex>
 #include <type_traits>
 #include <vector>
@@ -14,9 +16,12 @@ namespace {
 struct PoolState;
 
 // The framework record comes first so that a buffer handle is the record's address.
+// References change without the pool's lock (every frame element of every
+// channel takes and drops one); the lock guards the free list, so only the
+// drop that frees a buffer takes it.
 struct HostBuffer {
   MmfPoolBuffer record;
-  uint32_t references;
+  std::atomic<uint32_t> references;
   uint32_t mapped;
 };
 static_assert(std::is_standard_layout_v<HostBuffer>);
@@ -25,8 +30,10 @@ struct PoolState {
   std::mutex mutex;
   std::condition_variable returned;
   uint32_t size = 0;
-  std::vector<HostBuffer> buffers;
-  std::vector<uint8_t> bytes;
+  std::unique_ptr<HostBuffer[]> buffers;
+  uint32_t count = 0;
+  // Left unfilled: a page costs memory only once a buffer that uses it is filled.
+  std::unique_ptr<uint8_t[]> bytes;
   std::vector<HostBuffer*> free;
   uint32_t in_use = 0;
   bool closed = false;  // the owner has gone; delete with the last buffer
@@ -40,7 +47,7 @@ MmfPoolBuffer* TakeLocked(PoolState* state) {
   if (state->free.empty()) return nullptr;
   HostBuffer* buffer = state->free.back();
   state->free.pop_back();
-  buffer->references = 1;
+  buffer->references.store(1, std::memory_order_relaxed);
   buffer->mapped = 0;
   ++state->in_use;
   return &buffer->record;
@@ -48,7 +55,7 @@ MmfPoolBuffer* TakeLocked(PoolState* state) {
 
 uint32_t OpBufferSize(MmfMemoryPool* pool) { return pool ? State(pool)->size : 0; }
 uint32_t OpBufferCount(MmfMemoryPool* pool) {
-  return pool ? static_cast<uint32_t>(State(pool)->buffers.size()) : 0;
+  return pool ? State(pool)->count : 0;
 }
 uint32_t OpFreeCount(MmfMemoryPool* pool) {
   if (!pool) return 0;
@@ -102,13 +109,16 @@ namespace host {
 MemoryPool::MemoryPool(uint32_t size, uint32_t count) {
   auto* state = new PoolState;
   state->size = size;
-  state->bytes.resize(static_cast<size_t>(size) * count);
-  state->buffers.resize(count);
+  state->bytes.reset(new uint8_t[static_cast<size_t>(size) * count]);
+  state->buffers.reset(new HostBuffer[count]);
+  state->count = count;
   for (uint32_t i = 0; i < count; ++i) {
     HostBuffer& buffer = state->buffers[i];
     buffer.record.Pool = reinterpret_cast<MmfMemoryPool*>(state);
-    buffer.record.Data = state->bytes.data() + static_cast<size_t>(size) * i;
+    buffer.record.Data = state->bytes.get() + static_cast<size_t>(size) * i;
     buffer.record.Size = size;
+    buffer.references.store(0, std::memory_order_relaxed);
+    buffer.mapped = 0;
     state->free.push_back(&buffer);
   }
   handle_ = reinterpret_cast<MmfMemoryPool*>(state);
@@ -137,24 +147,23 @@ MmfPoolBuffer* MemoryPool::AcquireWaiting(std::chrono::milliseconds timeout) {
 uint32_t MemoryPool::FreeCount() const { return OpFreeCount(handle_); }
 
 uint32_t BufferReferences(const MmfPoolBuffer* buffer) {
-  PoolState* state = State(buffer->Pool);
-  std::lock_guard lock(state->mutex);
-  return reinterpret_cast<const HostBuffer*>(buffer)->references;
+  return reinterpret_cast<const HostBuffer*>(buffer)->references.load(std::memory_order_acquire);
 }
 
-void ReferenceBuffer(MmfPoolBuffer* buffer) {
-  std::lock_guard lock(State(buffer->Pool)->mutex);
-  ++Host(buffer)->references;
-}
+void ReferenceBuffer(MmfPoolBuffer* buffer) { Host(buffer)->references.fetch_add(1, std::memory_order_relaxed); }
 
 void DropBufferReference(MmfPoolBuffer* buffer) {
   PoolState* state = State(buffer->Pool);
+  HostBuffer* host_buffer = Host(buffer);
+  uint32_t references = host_buffer->references.load(std::memory_order_relaxed);
+  do {
+    if (references == 0) return;  // already back in the pool
+  } while (!host_buffer->references.compare_exchange_weak(references, references - 1, std::memory_order_acq_rel,
+                                                          std::memory_order_relaxed));
+  if (references != 1) return;
   bool delete_pool = false;
   {
     std::lock_guard lock(state->mutex);
-    HostBuffer* host_buffer = Host(buffer);
-    if (host_buffer->references == 0) return;  // already back in the pool
-    if (--host_buffer->references != 0) return;
     host_buffer->mapped = 0;
     state->free.push_back(host_buffer);
     --state->in_use;

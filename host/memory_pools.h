@@ -47,4 +47,20 @@ void DropBufferReference(MmfPoolBuffer* buffer);
 MmfMraPool* MakeMraPool(uint32_t count, uint32_t capacity);
 uint32_t MraPoolFreeCount(MmfMraPool* pool);
 
+// One element of a media buffer as the host stores it.
+struct MraElement {
+  uint32_t kind;  // kMmfElement...
+  uint32_t type;  // property type
+  uint32_t low;
+  uint16_t high;
+  MmfPoolBuffer* handle;  // buffer element: holds one reference
+  uint8_t* address;
+  uint32_t size;
+};
+
+// The ElementCount elements of a media buffer of a host pool, read in place:
+// the host's own sinks walk every element of every output buffer, and the
+// framework's per-element getters would cost them a call and checks each.
+const MraElement* MraElements(MmfMra* mra);
+
 }  // namespace host
