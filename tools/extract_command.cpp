@@ -29,6 +29,7 @@
 namespace {
 
 constexpr char kCommand[] = "extract";
+constexpr unsigned long kMaxBufferSize = 64ul << 20;
 
 const std::string kExtractHelp = std::string(
     "usage: kelvane extract FILE [-t TRACK]... -o DIR\n"
@@ -51,6 +52,8 @@ const std::string kExtractHelp = std::string(
     "                     default: every track the plug-in offers\n"
     "  -o, --output DIR   the directory to write to (made, with its parents, when missing)\n"
     "  -q, --quiet        no progress bar\n"
+    "  --buffer-size BYTES  bytes per input buffer (default 32768); small ones split\n"
+    "                     frames across buffers, which must not change the files\n"
     "  --plugin PATH      the plug-in to load (default: kelvane.so beside this program)\n"
     "  -h, --help         this text\n"
     "\n"
@@ -67,6 +70,7 @@ struct Options {
   std::vector<uint64_t> tracks;
   std::string plugin = host::PluginBesideExecutable();
   bool quiet = false;
+  uint32_t buffer_size = host::RunnerOptions{}.input_buffer_size;
 };
 
 bool ParseTracks(const char* text, std::vector<uint64_t>* tracks) {
@@ -103,6 +107,12 @@ int ParseOptions(int argc, char** argv, Options* options) {
       const char* path = value(arg);
       if (!path) return kExitUsage;
       options->plugin = path;
+    } else if (!std::strcmp(arg, "--buffer-size")) {
+      const char* text = value(arg);
+      unsigned long size = 0;
+      if (!text) return kExitUsage;
+      if (!ParseNumber(text, kMaxBufferSize, &size) || size == 0) return UsageError(kCommand, "bad buffer size '%s'", text);
+      options->buffer_size = static_cast<uint32_t>(size);
     } else if (!std::strcmp(arg, "-q") || !std::strcmp(arg, "--quiet")) {
       options->quiet = true;
     } else if (arg[0] == '-' && arg[1]) {
@@ -236,6 +246,7 @@ int RunExtract(int argc, char** argv) {
   RunState state;
   host::RunnerOptions run;
   run.checksum = false;
+  run.input_buffer_size = options.buffer_size;
   for (const ChannelFacts& facts : channels) {
     auto extraction = std::make_unique<Extraction>();
     extraction->facts = facts;
