@@ -44,19 +44,20 @@ FrameView ViewOf(const Bytes& bytes, iovec* piece) {
 }  // namespace
 
 bool OggWriter::Begin(const std::vector<Bytes>& config) {
-  if (config.size() != 3) return Fail("the Vorbis track lacks its three headers");
-  if (!blocks_.Init(config[0], config[2])) return Fail("the Vorbis headers cannot be read");
+  std::vector<Bytes> headers = config.size() == 1 ? SplitXiphLacing(config[0]) : config;
+  if (headers.size() != 3) return Fail("the track lacks its three codec headers");
+  if (!granules_->Init(headers)) return Fail("the codec headers cannot be read");
   for (size_t i = 0; i < 3; ++i) {
     iovec piece;
-    if (!Packet(ViewOf(config[i], &piece), 0, i == 0 ? kFirstPage : 0)) return false;
+    if (!Packet(ViewOf(headers[i], &piece), 0, i == 0 ? kFirstPage : 0)) return false;
   }
   return true;
 }
 
 bool OggWriter::Frame(const FrameView& frame) {
   uint8_t first = 0;
-  if (!CopyFrameBytes(frame, 0, 1, &first)) return Fail("an empty Vorbis packet");
-  granule_ += blocks_.Samples(first);
+  (void)CopyFrameBytes(frame, 0, 1, &first);
+  granule_ = granules_->After(first, frame.size);
   return Packet(frame, granule_, 0);
 }
 

@@ -1,16 +1,19 @@
 #pragma once
-// Vorbis in Ogg (.ogg): the three headers of the decoder configuration, the
+// Vorbis or Theora in Ogg (.ogg, .ogv): the three headers of the decoder
+// configuration (split by the plug-in, or still Xiph-laced), the
 // identification header alone on the first page and each other packet on a
 // page of its own (more pages for packets longer than one page carries), with
-// granule positions counted from the Vorbis block sizes; an empty last page
-// marks the end of the stream.
+// the codec's granule positions; an empty last page marks the end of the stream.
 
 #include "tools/extract/frame_writer.h"
-#include "tools/extract/vorbis_blocks.h"
+#include <memory>
+
+#include "tools/extract/ogg_granules.h"
 
 class OggWriter : public FrameWriter {
  public:
-  OggWriter(OutputFile* out, uint32_t serial) : FrameWriter(out), serial_(serial) {}
+  OggWriter(OutputFile* out, uint32_t serial, std::unique_ptr<OggGranules> granules)
+      : FrameWriter(out), serial_(serial), granules_(std::move(granules)) {}
   bool Begin(const std::vector<Bytes>& config) override;
   bool Frame(const FrameView& frame) override;
   bool Finish() override;
@@ -24,6 +27,6 @@ class OggWriter : public FrameWriter {
   uint32_t serial_;
   uint32_t sequence_ = 0;
   int64_t granule_ = 0;
-  VorbisBlocks blocks_;
+  std::unique_ptr<OggGranules> granules_;
   std::vector<iovec> list_;
 };

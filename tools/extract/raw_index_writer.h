@@ -1,5 +1,5 @@
 #pragma once
-// Codecs without a stream format of their own (Theora, MS MPEG-4 V3, SVQ3,
+// Codecs without a stream format of their own (MS MPEG-4 V3, SVQ3,
 // VfW-wrapped video...): NAME.raw holds the decoder-configuration packets and
 // then the frames back to back, and NAME.index says where each one is, one
 // text line each:

@@ -39,7 +39,7 @@ const char kWriterFormatsHelp[] =
     "  AVC                       .h264  Annex B: start codes, SPS and PPS from the avcC first\n"
     "  AAC                       .aac   ADTS headers from the AudioSpecificConfig\n"
     "  FLAC                      .flac  native FLAC: fLaC, STREAMINFO and the other metadata blocks\n"
-    "  Vorbis                    .ogg   Ogg with the three headers and granule positions\n"
+    "  Vorbis, Theora            .ogg .ogv  Ogg with the three headers and granule positions\n"
     "  PCM                       .wav   WAV, big-endian samples turned little endian\n"
     "  MPEG audio, AC-3, DTS     .mp3 .mp2 .mp1 .ac3 .dts  elementary streams\n"
     "  MPEG-1/2, MPEG-4 Part 2   .m1v .m2v .m4v  elementary streams, sequence/VOL headers first\n"
@@ -60,7 +60,9 @@ ChosenWriter ChooseWriter(const ChannelFacts& facts, const std::string& director
   } else if (code == Code("FLAC")) {
     make("flac", std::make_unique<FlacWriter>(out));
   } else if (code == Code("VRBS")) {
-    make("ogg", std::make_unique<OggWriter>(out, static_cast<uint32_t>(facts.track)));
+    make("ogg", std::make_unique<OggWriter>(out, static_cast<uint32_t>(facts.track), std::make_unique<VorbisGranules>()));
+  } else if (code == Code("THEO")) {
+    make("ogv", std::make_unique<OggWriter>(out, static_cast<uint32_t>(facts.track), std::make_unique<TheoraGranules>()));
   } else if (code == Code("RAWA")) {
     make("wav", std::make_unique<WavWriter>(out, facts));
   } else if (IsMpeg4Part2(facts)) {
