@@ -31,12 +31,13 @@ namespace {
 constexpr char kCommand[] = "extract";
 constexpr unsigned long kMaxBufferSize = 64ul << 20;
 
-const std::string kExtractHelp = std::string(
-    "usage: kelvane extract FILE [-t TRACK]... -o DIR\n"
-    "\n"
-    "Plays FILE through the plug-in as the framework does and writes each selected track\n"
-    "to DIR/trackN.EXT (N: the Matroska track number, as 'kelvane info' and 'kelvane\n"
-    "packets' print it), in a format that common players and decoders open:\n") +
+const std::string kExtractHelp =
+    std::string(
+        "usage: kelvane extract FILE [-t TRACK]... -o DIR\n"
+        "\n"
+        "Plays FILE through the plug-in as the framework does and writes each selected track\n"
+        "to DIR/trackN.EXT (N: the Matroska track number, as 'kelvane info' and 'kelvane\n"
+        "packets' print it), in a format that common players and decoders open:\n") +
     kWriterFormatsHelp +
     "Header-stripped tracks come out with their stripped bytes put back and laced blocks\n"
     "as their single frames. A raw track's NAME.index has one text line per packet:\n"
@@ -111,7 +112,9 @@ int ParseOptions(int argc, char** argv, Options* options) {
       const char* text = value(arg);
       unsigned long size = 0;
       if (!text) return kExitUsage;
-      if (!ParseNumber(text, kMaxBufferSize, &size) || size == 0) return UsageError(kCommand, "bad buffer size '%s'", text);
+      if (!ParseNumber(text, kMaxBufferSize, &size) || size == 0) {
+        return UsageError(kCommand, "bad buffer size '%s'", text);
+      }
       options->buffer_size = static_cast<uint32_t>(size);
     } else if (!std::strcmp(arg, "-q") || !std::strcmp(arg, "--quiet")) {
       options->quiet = true;
@@ -251,7 +254,9 @@ int RunExtract(int argc, char** argv) {
     auto extraction = std::make_unique<Extraction>();
     extraction->facts = facts;
     extraction->chosen = ChooseWriter(facts, options.directory, &extraction->file);
-    if (!extraction->file.Open(extraction->chosen.path)) return Failure(kCommand, "%s", extraction->file.error().c_str());
+    if (!extraction->file.Open(extraction->chosen.path)) {
+      return Failure(kCommand, "%s", extraction->file.error().c_str());
+    }
     extraction->extractor = std::make_unique<ChannelExtractor>(std::move(extraction->chosen.writer), &progress);
     run.channels.push_back(facts.channel);
     state.extractions.push_back(std::move(extraction));

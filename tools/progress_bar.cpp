@@ -82,7 +82,8 @@ void ProgressBar::Draw(bool done) {
   double fraction = done ? 1.0 : total_ ? std::min(1.0, static_cast<double>(bytes) / static_cast<double>(total_)) : 0;
   const double rate = elapsed > 0 ? static_cast<double>(bytes) / elapsed : 0;
   std::string bar(kBarWidth, '-');
-  for (int i = 0; i < static_cast<int>(fraction * kBarWidth + 0.5) && i < kBarWidth; ++i) bar[static_cast<size_t>(i)] = '#';
+  for (int i = 0; i < static_cast<int>(fraction * kBarWidth + 0.5) && i < kBarWidth; ++i)
+    bar[static_cast<size_t>(i)] = '#';
   std::string left = "--:--";
   if (done) {
     left = "0:00";

@@ -56,8 +56,10 @@ uint32_t FrequencyIndex(BitReader& bits) {
 bool AdtsWriter::Begin(const std::vector<Bytes>& config) {
   if (config.empty() || config[0].size() < 2) {
     const std::string& id = facts_.codec_id;
-    profile_ = id.find("MAIN") != std::string::npos ? 0 : id.find("SSR") != std::string::npos ? 2
-             : id.find("LTP") != std::string::npos ? 3 : 1;
+    profile_ = id.find("MAIN") != std::string::npos  ? 0
+               : id.find("SSR") != std::string::npos ? 2
+               : id.find("LTP") != std::string::npos ? 3
+                                                     : 1;
     frequency_index_ = NearestIndex(facts_.sample_rate);
     channel_config_ = facts_.channels;
   } else {
@@ -89,7 +91,7 @@ bool AdtsWriter::Frame(const FrameView& frame) {
       static_cast<uint8_t>((channel_config_ & 3) << 6 | length >> 11),
       static_cast<uint8_t>(length >> 3),
       static_cast<uint8_t>((length & 7) << 5 | 0x1F),  // buffer fullness 0x7FF: variable rate
-      0xFC,  // one raw data block
+      0xFC,                                            // one raw data block
   };
   list_.assign(1, iovec{header, kHeaderSize});
   list_.insert(list_.end(), frame.pieces, frame.pieces + frame.count);

@@ -16,7 +16,8 @@ bool FlacWriter::Begin(const std::vector<Bytes>& config) {
   const Bytes& packet = config[0];
   size_t skip = packet.size() >= sizeof kMarker && !std::memcmp(packet.data(), kMarker, sizeof kMarker) ? 4 : 0;
   Bytes blocks(packet.begin() + static_cast<ptrdiff_t>(skip), packet.end());
-  if (blocks.empty() || (blocks[0] & 0x7F) != kStreamInfoType) return Fail("the FLAC metadata does not begin with STREAMINFO");
+  if (blocks.empty() || (blocks[0] & 0x7F) != kStreamInfoType)
+    return Fail("the FLAC metadata does not begin with STREAMINFO");
   // Walk the block headers: a stream whose last block is not flagged has no
   // end of metadata, and one flagged early hides the blocks after it.
   size_t pos = 0;

@@ -22,9 +22,9 @@ struct ChannelFacts {
   std::string codec_id;
   uint32_t fourcc = 0;
   bool video = false;
-  uint32_t channels = 0;     // audio
-  uint32_t sample_rate = 0;  // audio, Hz
-  uint32_t bit_depth = 0;    // audio, from the track; 0 not stated
+  uint32_t channels = 0;        // audio
+  uint32_t sample_rate = 0;     // audio, Hz
+  uint32_t bit_depth = 0;       // audio, from the track; 0 not stated
   uint32_t pcm_byte_order = 0;  // 1 little endian, 2 big endian, 0 not PCM
 };
 

@@ -5,9 +5,9 @@
 // page of its own (more pages for packets longer than one page carries), with
 // the codec's granule positions; an empty last page marks the end of the stream.
 
-#include "tools/extract/frame_writer.h"
 #include <memory>
 
+#include "tools/extract/frame_writer.h"
 #include "tools/extract/ogg_granules.h"
 
 class OggWriter : public FrameWriter {

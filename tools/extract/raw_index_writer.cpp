@@ -16,7 +16,8 @@ bool RawIndexWriter::Begin(const std::vector<Bytes>& config) {
   if (!index_.Open(index_path_)) return Fail(index_.error());
   char line[256];
   std::snprintf(line, sizeof line,
-                "# kelvane frame index of track %" PRIu64 " (%s)\n"
+                "# kelvane frame index of track %" PRIu64
+                " (%s)\n"
                 "# config OFFSET SIZE | frame OFFSET SIZE TIME_US\n",
                 facts_.track, facts_.codec_id.c_str());
   pending_ = line;

@@ -60,9 +60,11 @@ ChosenWriter ChooseWriter(const ChannelFacts& facts, const std::string& director
   } else if (code == Code("FLAC")) {
     make("flac", std::make_unique<FlacWriter>(out));
   } else if (code == Code("VRBS")) {
-    make("ogg", std::make_unique<OggWriter>(out, static_cast<uint32_t>(facts.track), std::make_unique<VorbisGranules>()));
+    make("ogg",
+         std::make_unique<OggWriter>(out, static_cast<uint32_t>(facts.track), std::make_unique<VorbisGranules>()));
   } else if (code == Code("THEO")) {
-    make("ogv", std::make_unique<OggWriter>(out, static_cast<uint32_t>(facts.track), std::make_unique<TheoraGranules>()));
+    make("ogv",
+         std::make_unique<OggWriter>(out, static_cast<uint32_t>(facts.track), std::make_unique<TheoraGranules>()));
   } else if (code == Code("RAWA")) {
     make("wav", std::make_unique<WavWriter>(out, facts));
   } else if (IsMpeg4Part2(facts)) {

@@ -8,7 +8,7 @@
 
 struct ChosenWriter {
   std::unique_ptr<FrameWriter> writer;
-  std::string path;  // the file the writer fills
+  std::string path;        // the file the writer fills
   std::string index_path;  // raw frames only: their index
 };
 
