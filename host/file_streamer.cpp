@@ -137,6 +137,9 @@ int FileStreamer::NextBuffer(MmfMra** buffer) {
     if (result != kMmfOk) return result;
   }
   uint32_t wanted = config_.buffer_size;
+  if (!delivered_ && config_.first_buffer_size != 0 && config_.first_buffer_size < wanted) {
+    wanted = config_.first_buffer_size;
+  }
   if (list_mode_) {
     while (request_left_ == 0) {
       int result = NextRequest();
@@ -147,6 +150,7 @@ int FileStreamer::NextBuffer(MmfMra** buffer) {
   }
   int result = Deliver(position_, wanted, buffer);
   if (result == kMmfEndOfStream) ended_ = true;
+  if (result == kMmfBufferDelivered) delivered_ = true;
   return result;
 }
 

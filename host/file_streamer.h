@@ -22,6 +22,9 @@ namespace host {
 struct StreamerConfig {
   uint32_t buffer_size = 32768;  // bytes per input buffer; also the output format's buffer size
   uint32_t buffer_count = 64;    // pool buffers and media buffers
+  // Bytes of the first buffer only (at most buffer_size; 0: buffer_size), so
+  // that tests can split the input at any byte.
+  uint32_t first_buffer_size = 0;
 };
 
 class FileStreamer {
@@ -70,6 +73,7 @@ class FileStreamer {
   bool marker_pending_ = false;  // the next buffer starts with a time marker
   uint64_t marker_time_ = 0;
   bool ended_ = false;
+  bool delivered_ = false;  // a buffer of file bytes has gone out
   uint64_t bytes_read_ = 0;
 
   const MmfListMakerOps* list_maker_ = nullptr;

@@ -260,7 +260,8 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
   MemoryPool prefix_pool(kPrefixBufferSize, kPrefixBuffers);
   MemoryPool config_pool(options.config_buffer_size, kConfigBuffers);
   FileStreamer streamer(source.get(), StreamerConfig{options.input_buffer_size,
-                                                     InputBufferCount(options.input_buffer_size)});
+                                                     InputBufferCount(options.input_buffer_size),
+                                                     options.first_input_buffer_size});
   SetupOptions setup;
   setup.buffer_size = options.input_buffer_size;
   setup.configure_outputs = false;

@@ -1,7 +1,8 @@
 // Sweeps of small fixtures through a real graph (streamer → kelvane → sinks):
-// every input buffer split, truncations, flipped bits, overwritten block and
-// lace header bytes, and failed allocations. Each case must end (a watchdog
-// aborts a hung run), and the sanitizers of the asan build watch for the rest.
+// every input buffer size, every split point of the smallest, truncations,
+// flipped bits, overwritten block and lace header bytes, and failed
+// allocations. Each case must end (a watchdog aborts a hung run), and the
+// sanitizers of the asan build watch for the rest.
 //
 // KELVANE_SWEEP=quick (the default of a cross build run under an emulator)
 // limits the sweeps to the two smallest fixtures and wider strides.
@@ -245,6 +246,24 @@ TEST_P(SweepTest, EveryInputBufferSizeDeliversTheSameFrames) {
     const std::string what = "input buffers of " + std::to_string(k) + " bytes";
     watchdog_.Arm(std::string(GetParam().name) + ", " + what);
     ExpectSameRun(full_, Play(path, k), what);
+    if (HasFatalFailure()) return;
+  }
+}
+
+// Two buffers, the first ending at every byte after the first Cluster's
+// start: each split point on its own, including those inside element IDs,
+// sizes, block headers and lace tables. The smallest fixtures only.
+TEST_P(SweepTest, EverySplitPointDeliversTheSameFrames) {
+  if (!GetParam().quick) GTEST_SKIP() << "every split point: the two smallest fixtures only";
+  const std::string path = std::string(KELVANE_FIXTURE_DIR) + "/" + GetParam().name + ".mkv";
+  const auto whole = static_cast<uint32_t>(bytes_.size());
+  for (uint32_t first = 1; first < whole; first += static_cast<uint32_t>(Stride(1, 1))) {
+    const std::string what = "a first buffer of " + std::to_string(first) + " bytes";
+    watchdog_.Arm(std::string(GetParam().name) + ", " + what);
+    host::RunnerOptions options;
+    options.input_buffer_size = whole;
+    options.first_input_buffer_size = first;
+    ExpectSameRun(full_, host::RunGraph(HostPlugin(), path, options), what);
     if (HasFatalFailure()) return;
   }
 }
