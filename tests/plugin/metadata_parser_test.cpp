@@ -174,7 +174,8 @@ TEST(ParserMetadataTest, NullArgumentsAnswer22) {
 // Keys match in any letter case; occurrences count per key; a track's picture
 // size is answered only after a video MediaType.
 TEST(ParserQueryMetadataTest, KeysOccurrencesAndPictureSize) {
-  const auto& video = LoadFixture("avc_aac").tracks.at(0);  // a video track, then an audio track
+  const testing_support::FixtureExpectation avc_aac = LoadFixture("avc_aac");  // a video track, then an audio track
+  const auto& video = avc_aac.tracks.at(0);
   ASSERT_EQ(video.type, "video");
   const struct {
     const char* fixture;
