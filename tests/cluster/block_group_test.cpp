@@ -1,5 +1,5 @@
 // BlockGroups: the children around the Block, what is copied, what is passed
-// over unread, and what running out inside a group gives.
+// over unread, what running out inside a group gives, and failed copies.
 
 #include <gtest/gtest.h>
 
@@ -114,17 +114,21 @@ TEST(ParseMkvBlockGroupTest, EveryBufferSizeGivesTheSameBlocksAndKeys) {
   }
 }
 
-TEST(ParseMkvBlockGroupTest, FailedCodecStateCopyIsOutOfMemoryAndLeaksNothing) {
-  Bytes bytes = ClusterOf({master(kBlockGroup, {bin(kCodecState, {1, 2}), Block1()})});
-  int64_t live = host::LiveBlockCount();
-  {
-    Record record;
-    host::FailNthAllocation(1);
-    EXPECT_EQ(cluster_testing::ParseWhole(record, bytes).result, kClusterNoMemory);
-    host::FailNthAllocation(0);
-    EXPECT_EQ(record.c.codec_state, nullptr);
+// The first allocation of each parse fails: the CodecState copy, the frame table.
+TEST(ParseMkvBlockGroupTest, FailedAllocationIsOutOfMemoryAndLeaksNothing) {
+  Bytes laced = xiph_laced_block(1, 0, 0, {filler(300), filler(20), filler(10)});
+  for (const Bytes& bytes : {ClusterOf({master(kBlockGroup, {bin(kCodecState, {1, 2}), Block1()})}), ClusterOf({laced})}) {
+    int64_t live = host::LiveBlockCount();
+    {
+      Record record;
+      host::FailNthAllocation(1);
+      EXPECT_EQ(cluster_testing::ParseWhole(record, bytes).result, kClusterNoMemory);
+      host::FailNthAllocation(0);
+      EXPECT_EQ(record.c.codec_state, nullptr);
+      EXPECT_EQ(record.c.frame_sizes, nullptr);
+    }
+    EXPECT_EQ(host::LiveBlockCount(), live);
   }
-  EXPECT_EQ(host::LiveBlockCount(), live);
 }
 
 }  // namespace

@@ -4,7 +4,6 @@
 
 #include <gtest/gtest.h>
 
-#include "host/heap_control.h"
 #include "tests/cluster/cluster_harness.h"
 
 namespace {
@@ -110,19 +109,5 @@ TEST_P(BlockHeaderTest, CutOrSplitAtEveryByteGivesTheSame) {
 
 INSTANTIATE_TEST_SUITE_P(Blocks, BlockHeaderTest, testing::ValuesIn(kCases),
                          [](const auto& info) { return std::string(info.param.name); });
-
-TEST(BlockHeaderAllocationTest, FailedFrameTableIsOutOfMemoryAndLeaksNothing) {
-  size_t first_frame;
-  Bytes bytes = ClusterWith(kCases[1], &first_frame);
-  int64_t live = host::LiveBlockCount();
-  {
-    Record record;
-    host::FailNthAllocation(1);
-    EXPECT_EQ(cluster_testing::ParseWhole(record, bytes).result, kClusterNoMemory);
-    host::FailNthAllocation(0);
-    EXPECT_EQ(record.c.frame_sizes, nullptr);
-  }
-  EXPECT_EQ(host::LiveBlockCount(), live);
-}
 
 }  // namespace
