@@ -85,7 +85,7 @@ done
 
 echo
 awk -v k="${us[a.kelvane]}" -v ff="${us[a.ffmpeg]}" -v c="${us[a.cat]}" 'BEGIN {
-  printf "a.mkv: kelvane frames/s = %.1f x ffmpeg's (goal >= 15); time = %.2f x cat (goal <= 3)\n", ff / k, k / c }'
+  printf "a.mkv: kelvane frames/s = %.1f x ffmpeg (goal >= 15); time = %.2f x cat (goal <= 3)\n", ff / k, k / c }'
 for f in a_laced a_groups; do
   awk -v f="$f" -v u="${us[$f.kelvane]}" -v n="${frames[$f]}" -v ua="${us[a.kelvane]}" -v na="${frames[a]}" 'BEGIN {
     printf "%s.mkv: per-frame cost = %.2f x a.mkv (goal <= 1.2)\n", f, (u / n) / (ua / na) }'

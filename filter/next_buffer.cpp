@@ -2,6 +2,7 @@
 // input-buffer ring until it is nearly full or the input runs dry.
 
 #include "core/cluster/cluster_status.h"
+#include "core/cluster/unlaced_block.h"
 #include "filter/events.h"
 #include "filter/output_assembly.h"
 #include "filter/output_elements.h"
@@ -156,6 +157,22 @@ Walk ParseBuffer(Call& call) {
       continue;
     }
     destroy_mkvcluster(&state->Cluster);
+    // Most blocks are unlaced with their header whole in inbuff1, and most
+    // belong to other channels: those are passed over by the header alone.
+    uint64_t data_left = 0;
+    switch (take_unlaced_block(&in, &state->Cluster, state->Track->track_number, &data_left)) {
+      case unlaced_block_result::other_track:
+        state->FrameIndex = 0;
+        state->SkipBytes = data_left;
+        ApplySkip(state);
+        continue;
+      case unlaced_block_result::own_track:
+        state->BlockActive = 1;
+        state->FrameIndex = 0;
+        continue;
+      case unlaced_block_result::parse:
+        break;
+    }
     const bool with_next = !(state->ScanMode && InputJumped(state));
     const uint64_t before = in.buff_fileoff + in.buff_pos;
     int parsed = parse_mkvcluster(&in, with_next ? &state->inbuff2 : nullptr, &state->Cluster, &state->SkipBytes);
