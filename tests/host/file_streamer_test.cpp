@@ -171,6 +171,7 @@ TEST_F(FileStreamerTest, BufferAfterASeekStartsWithATimeMarkerAlsoAfterTheEnd) {
   Make(17000, 1000);
   Delivered first;
   ASSERT_EQ(Next(&first), kMmfBufferDelivered);
+  EXPECT_EQ(source_->counters().bytes_read, 1000u);  // read once, straight into the delivered pool buffer
   const uint64_t kTime = 0x123456789ABull;  // needs all 48 bits
   EXPECT_EQ(streamer_->Seek(15500, kTime), 0);
   EXPECT_EQ(Rest(), (std::vector<Delivered>{At(15500, 1000, kTime), At(16500, 500)}));
