@@ -179,7 +179,7 @@ Bytes encodings(uint64_t first, uint64_t last) {
 
 const char* const kReadError = "Error Reading at line *";
 
-TEST(HeaderHandlersTest, StoreWhatTheElementHoldsAndFailAsSpecified) {
+TEST(HeaderHandlersTest, StoreWhatTheElementHoldsOrFailWithTheirStatus) {
   const struct {
     const char* name;
     const Kind& kind;

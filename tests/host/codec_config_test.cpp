@@ -109,8 +109,8 @@ const Bytes kEncoderRecords[] = {kAvc420, kAvc422, kAvc444, kAvcMono, kAvc420Fie
 // A BITMAPINFOHEADER whose width bytes imitate a layer start code (00 00 01 20).
 Bytes bitmap_info() { return patched(patched(patched(patched(Bytes(40, 0), 0, 0x28), 6, 0x01), 7, 0x20), 8, 0x90); }
 
-// The record starts as 11x22 with pixels 33:44: what is not understood or not
-// specified leaves it so.
+// The record starts as 11x22 with pixels 33:44: a configuration not understood
+// leaves it so, and one without a pixel shape keeps those pixels.
 TEST(DecoderConfigTest, ConfigurationsGiveTheirPictureShape) {
   const struct {
     const char* name;
