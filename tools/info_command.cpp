@@ -31,7 +31,7 @@ const char kInfoHelp[] =
     "operation that hands out this model, so unlike probe and packets this command does not\n"
     "go through the loaded plug-in.\n"
     "\n"
-    "FILE may be - for standard input (then Cues and Tags after the Clusters are not read).\n"
+    "FILE may be - for standard input.\n"
     "\n"
     "options:\n"
     "  --json           one JSON document instead of text (docs/json.md, section info)\n"

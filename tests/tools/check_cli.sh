@@ -110,34 +110,45 @@ done
 
 # --json: a strict parse (no NaN or Infinity, no raw control characters), the
 # common header fields, and the file name back exactly as given, with the
-# bytes that are not UTF-8 replaced by U+FFFD.
-check_json() {  # command file
+# bytes that are not UTF-8 replaced by U+FFFD. One reader checks every
+# document: arguments come in threes (command, file, document).
+check_json() {
   python3 -c '
 import json, sys
 def refuse(name): raise ValueError("not JSON: " + name)
-doc = json.load(open(sys.argv[1], "rb"), parse_constant=refuse)
-assert doc["schema_version"] == 1, "schema_version"
-assert doc["command"] == sys.argv[2], "command"
-want = sys.argv[3].encode("utf-8", "surrogateescape").decode("utf-8", "replace")
-assert doc["file"] == want, "file %r, expected %r" % (doc["file"], want)
-assert isinstance(doc.get("channels", doc.get("tracks", doc.get("entries"))), list), "main list"
-' "$work/json" "$1" "$2"
+args, bad = sys.argv[1:], 0
+for command, name, path in zip(args[0::3], args[1::3], args[2::3]):
+    try:
+        doc = json.load(open(path, "rb"), parse_constant=refuse)
+        assert doc["schema_version"] == 1, "schema_version"
+        assert doc["command"] == command, "command"
+        want = name.encode("utf-8", "surrogateescape").decode("utf-8", "replace")
+        assert doc["file"] == want, "file %r, expected %r" % (doc["file"], want)
+        assert isinstance(doc.get("channels", doc.get("tracks", doc.get("entries"))), list), "main list"
+    except Exception as error:
+        print("FAIL %s --json %r: %s" % (command, name, error))
+        bad += 1
+sys.exit(bad > 0)
+' "$@"
 }
 if command -v python3 >/dev/null; then
   odd=$work/$'odd "name" \\ \x01\t\x7f \xff\xc3( caf\xc3\xa9.mkv'
   ln -s "$(cd "$fixtures" && pwd)/tags.mkv" "$odd"
+  documents=()
   for file in "$fixtures"/*.mkv "$odd"; do
     for command in info probe metadata packets; do
       extra=()
       [[ $command == packets ]] && extra=(--no-hash)
-      "${kelvane[@]}" "$command" --json "${extra[@]}" "$file" >"$work/json" 2>/dev/null
+      json=$work/doc${#documents[@]}.json
+      "${kelvane[@]}" "$command" --json "${extra[@]}" "$file" >"$json" 2>/dev/null
       status=$?
       [[ $file == "$odd" && $status != 0 ]] && fail "$command --json on the oddly named file: exit code $status"
       if [[ $status == 0 || ($command == probe && $status == 1) ]]; then
-        err=$(check_json "$command" "$file" 2>&1) || fail "$command --json $(basename "$file"): $(tail -1 <<<"$err")"
+        documents+=("$command" "$file" "$json")
       fi
     done
   done
+  check_json "${documents[@]}" || failures=$((failures + 1))
 else
   fail "python3 is needed to validate the --json output"
 fi
