@@ -74,6 +74,19 @@ int WaitForPool(MkvContext* context) {
   }
 }
 
+namespace {
+
+// Whether a buffer is still held by a slot between the tail and the head.
+bool InRing(const MkvContext* context, const MmfMra* buffer) {
+  if (!buffer) return false;
+  for (int32_t slot = context->RingTail; slot != context->RingHead; slot = RingNext(context, slot)) {
+    if (context->Ring[slot].buffer == buffer) return true;
+  }
+  return false;
+}
+
+}  // namespace
+
 void MoveOnAndFreeBuffer(MkvChannelState* state, MkvFilter* filter) {
   MkvContext* context = filter->Context;
   state->ReadElement = 0;
@@ -82,6 +95,16 @@ void MoveOnAndFreeBuffer(MkvChannelState* state, MkvFilter* filter) {
   if (state->ReadSlot == context->RingHead) {
     AoLog(kAoLogFailure, "kelvane butting up against the head.");
     state->ReadBuffer = state->AheadBuffer;
+    // The ahead view may still name a buffer the other channels have since
+    // given back: reading it again would parse recycled memory and, as its
+    // slot stays at the head, go round this step for ever. With no live
+    // buffer left the channel starts afresh from the ring once it refills.
+    if (!InRing(context, state->AheadBuffer)) {
+      state->ReadBuffer = nullptr;
+      state->AheadBuffer = nullptr;
+      state->ReadHandle = nullptr;
+      state->AheadHandle = nullptr;
+    }
   } else {
     state->ReadSlot = RingNext(context, state->ReadSlot);
     state->ReadBuffer = context->Ring[state->ReadSlot].buffer;
