@@ -36,13 +36,11 @@ void PrintTo(const GroupCase& c, std::ostream* os) { *os << c.name; }
 
 const GroupCase kGroupCases[] = {
     {"OneByteReferenceBlockIsSignExtended", Bytes{0xFB, 0x81, 0xFE}, kClusterBlockReady, -2},
-    {"TwoByteReferenceBlockIsSignExtended", Bytes{0xFB, 0x82, 0xFF, 0x38}, kClusterBlockReady, -200},
     {"EightByteReferenceBlockIsTakenWhole", sinteger(kReferenceBlock, -3, 8), kClusterBlockReady, -3},
     {"ZeroSizeValuesAreZero", cat({bin(kReferenceBlock, {}), bin(kBlockDuration, {})}), kClusterBlockReady},
     {"PriorityAndDurationAreRead", cat({uinteger(kReferencePriority, 2), uinteger(kBlockDuration, 0x123456)}),
      kClusterBlockReady, 0, 2, 0x123456},
     {"NineByteDurationIsRejected", bin(kBlockDuration, filler(9, 1)), kClusterInvalid},
-    {"NineByteReferenceIsRejected", bin(kReferenceBlock, filler(9, 1)), kClusterInvalid},
     {"CodecStateIsCopied", bin(kCodecState, {1, 2, 3}), kClusterBlockReady, 0, 0, 0, {1, 2, 3}},
     {"CodecStateOver32768BytesIsRefused", bin(kCodecState, filler(40000, 7)), kClusterNoMemory},
     {"UnreadPayloadsAreNeverReadAsHeaders",

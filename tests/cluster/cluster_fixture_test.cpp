@@ -1,13 +1,11 @@
-// Every fixture driven through the playback parser in buffers of many sizes
-// and, for the two smallest, split at every byte into two buffers (where a
-// header meets a buffer's end); the block list must equal what mkvinfo
-// reported for the file, and no block may be left allocated.
+// Every fixture driven through the playback parser in buffers of many sizes,
+// down to one byte, so that a read stops and resumes at every byte; the block
+// list must equal what mkvinfo reported for the file, and no block may be
+// left allocated.
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <string>
-#include <utility>
 #include <vector>
 
 #include "host/heap_control.h"
@@ -70,22 +68,5 @@ TEST_P(ClusterFixtureTest, EveryBufferSizeGivesTheMkvinfoBlockList) {
 
 INSTANTIATE_TEST_SUITE_P(Fixtures, ClusterFixtureTest, testing::ValuesIn(testing_support::FixtureNames()),
                          [](const auto& info) { return info.param; });
-
-TEST(ClusterFixtureSplitTest, EverySplitOfTheSmallestFilesGivesTheMkvinfoBlockList) {
-  std::vector<std::pair<size_t, std::string>> by_size;
-  for (const auto& name : testing_support::FixtureNames()) by_size.emplace_back(testing_support::ReadFixtureBytes(name).size(), name);
-  std::sort(by_size.begin(), by_size.end());
-  ASSERT_GE(by_size.size(), 2u);
-  for (size_t n = 0; n < 2; ++n) {
-    const std::string& name = by_size[n].second;
-    auto want = Listed(testing_support::LoadFixture(name).blocks, true);
-    auto file = testing_support::ReadFixtureBytes(name);
-    for (size_t split = 1; split < file.size() - FirstClusterOffset(file.data(), file.size()); ++split) {
-      DriveOptions options;
-      options.buffer_sizes = {split, file.size()};
-      ASSERT_EQ(Driven(file, options), want) << name << " split after " << split << " bytes";
-    }
-  }
-}
 
 }  // namespace

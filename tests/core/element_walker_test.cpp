@@ -8,7 +8,6 @@
 
 #include <string>
 
-#include "core/header/ebml_read.h"
 #include "core/status.h"
 #include "platform/ao_log.h"
 #include "tests/support/ebml_builder.h"
@@ -20,38 +19,6 @@ namespace {
 using namespace ebml;
 using testing_support::HeaderParse;
 using testing_support::LogRecorder;
-
-// IDs keep their marker bits; sizes lose them, and the all-ones "unknown" size
-// is an ordinary number to this reader.
-TEST(EbmlReadTest, IdsAndSizesFromTheirFirstByte) {
-  const struct {
-    bool id;
-    Bytes bytes;
-    int status;
-    uint64_t value;
-  } cases[] = {
-      {true, {0xA3, 0x00}, kStatusOk, 0xA3},
-      {true, {0x2A, 0xD7, 0xB1, 0x00}, kStatusOk, 0x2AD7B1},
-      {true, {0x1A, 0x45, 0xDF, 0xA3}, kStatusOk, 0x1A45DFA3},
-      {true, {0x0F, 0x01, 0x02, 0x03, 0x04, 0x05}, kStatusMalformed, 0},  // five-byte marker
-      {true, {0x00, 0x80}, kStatusMalformed, 0},
-      {true, {0x1A, 0x45, 0xDF}, kStatusReadFailed, 0},
-      {false, {0xFF}, kStatusOk, 0x7F},
-      {false, {0x41, 0x02}, kStatusOk, 0x102},
-      {false, {0x01, 0x00, 0x00, 0x01, 0x00, 0x00, 0x00, 0x00}, kStatusOk, 0x100000000},
-      {false, {0x01, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF}, kStatusOk, 0x00FFFFFFFFFFFFFF},
-      {false, {0x00, 0x81}, kStatusMalformed, 0},
-      {false, {0x01, 0x00, 0x00}, kStatusReadFailed, 0},
-  };
-  for (const auto& c : cases) {
-    HeaderParse source(c.bytes);
-    uint32_t id = 0;
-    uint64_t size = 0;
-    EXPECT_EQ(c.id ? ebml_read_id(&source.stream(), &id) : ebml_read_size(&source.stream(), &size), c.status)
-        << testing::PrintToString(c.bytes);
-    EXPECT_EQ(c.status == kStatusOk ? (c.id ? id : size) : 0, c.value) << testing::PrintToString(c.bytes);
-  }
-}
 
 Bytes info_with_title(std::string_view title) { return master(kInfo, {uinteger(kTimecodeScale, 1000000), str(kTitle, title)}); }
 Bytes entry(uint64_t number, uint64_t type = 2) {
@@ -79,12 +46,6 @@ Bytes seek_heads(int count) {
     return master(kSeekHead, {master(kSeek, {element(kSeekId, id_bytes(kInfo)), uinteger(kSeekPosition, uint64_t(i))})});
   });
 }
-Bytes tags(int count) {
-  return element(kTags, repeated(count, [](int i) {
-    return master(kSimpleTag, {str(kTagName, "T" + std::to_string(i)), str(kTagString, "v")});
-  }));
-}
-
 // What the walk left: tracks (video/audio, the last one's number), seek lists
 // (the last one's first position), cue points, tags (the last name), title.
 std::string summary(const mkv_file_info& i) {
@@ -125,7 +86,6 @@ TEST(ParseMkvfileTest, ResultAndWhatWasReadFollowTheElementsMet) {
       // The Segment is level 1, so the Void inside n nested Chapters is at level n + 2.
       {"50 levels", file({nested_chapters(48, bin(kVoid, filler(1))), info_with_title("t"), one_track()}), kParseSucceeded, kTrackT},
       {"51 levels", file({nested_chapters(49, bin(kVoid, filler(1))), info_with_title("t"), one_track()}), kParseMalformed, ""},
-      {"5000 levels", file({nested_chapters(5000, {}), info_with_title("t"), one_track()}), kParseMalformed, ""},
       {"Void, CRC-32, unknown and unhandled elements are skipped",
        file({bin(kVoid, filler(300)), bin(kCrc32, filler(4, 0xAB)), bin(0x4321, filler(10)),
              master(kAttachments, {bin(0x61A7, filler(700)), bin(kVoid, filler(3))}), master(kChapters, {bin(0x45B9, filler(20))}),
@@ -144,17 +104,13 @@ TEST(ParseMkvfileTest, ResultAndWhatWasReadFollowTheElementsMet) {
        file({info_with_title("t"), master(kTracks, {entry(1), entry(2), master(kTrackEntry, {uinteger(kTrackType, 1), uinteger(kTrackType, 1)}),
                                                     entry(4, 3)})}),
        kParseSucceeded, "tracks 4/2/2 #4 seek heads 0 cues 0 tags 0 title t mux -"},
-      {"100 tracks fit", file({info_with_title("t"), tracks(100)}), kParseSucceeded,
-       "tracks 100/0/0 #100 seek heads 0 cues 0 tags 0 title t mux -"},
       {"the 101st track fails the parse", file({info_with_title("t"), tracks(101)}), kParseNoMemory,
-       "tracks 100/0/0 #100 seek heads 0 cues 0 tags 0 title t mux -"},
+       "tracks 100/0/0 #100 seek heads 0 cues 0 tags 0 title t mux -", "mkv_track_handler:  File contains too many tracks.", kAoLogFailure},
       {"50 seek lists are kept", file({seek_heads(52), info_with_title("t"), one_track()}), kParseSucceeded,
        "tracks 1/0/1 #1 seek heads 50 @49 cues 0 tags 0 title t mux -"},
       {"a second Info starts afresh",
        file({master(kInfo, {uinteger(kTimecodeScale, 500), str(kTitle, "one")}), master(kInfo, {str(kMuxingApp, "two")}), one_track()}),
        kParseSucceeded, "tracks 1/0/1 #1 seek heads 0 cues 0 tags 0 title - mux two"},
-      {"51 tags: the last is dropped", file({info_with_title("t"), one_track(), tags(51)}), kParseSucceeded,
-       "tracks 1/0/1 #1 seek heads 0 cues 0 tags 50 T49 title t mux -"},
   };
   for (const auto& c : cases) {
     LogRecorder log;
@@ -172,9 +128,6 @@ TEST(ParseMkvfileTest, SecondEbmlHeaderIsFlaggedAndLogged) {
   EXPECT_EQ(parse.Parse(), kParseSucceeded);
   EXPECT_TRUE(parse.info().parse_flags & kMetSecondEbmlHeader);
   EXPECT_TRUE(log.Contains(2, "Error parsing EBML Document Element."));
-  HeaderParse too_many(file({info_with_title("t"), tracks(101)}));
-  EXPECT_EQ(too_many.Parse(), kParseNoMemory);
-  EXPECT_TRUE(log.Contains(kAoLogFailure, "mkv_track_handler:  File contains too many tracks."));
 }
 
 TEST(ValidMkvTest, AcceptsExactlyTheMatroskaDocType) {
@@ -187,7 +140,6 @@ TEST(ValidMkvTest, AcceptsExactlyTheMatroskaDocType) {
       {file({}, "Matroska"), kStatusMalformed},
       {file({}, "matrosk"), kStatusMalformed},
       {cat({master(kSegment, {}), ebml_header()}), kStatusMalformed},
-      {cat({Bytes{0x00}, ebml_header()}), kStatusMalformed},
   };
   for (const auto& c : cases) {
     HeaderParse parse(c.bytes);

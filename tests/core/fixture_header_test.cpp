@@ -1,6 +1,7 @@
 // Every real file through the header parse, against what mkvinfo and ffprobe
-// report about it: Info, the track records, cues, tags, the FLAC configuration,
-// the metadata list and the frames of a track stored with header removal.
+// report about it: Info, the track records, cues, tags, the FLAC configuration
+// and the metadata list. (The frames of the track stored with header removal
+// are compared, prefix put back, in the plug-in's playback test.)
 
 #include <gtest/gtest.h>
 
@@ -17,7 +18,6 @@
 #include "core/memory.h"
 #include "core/metadata_list.h"
 #include "core/status.h"
-#include "tests/support/cluster_driver.h"
 #include "tests/support/fixtures.h"
 #include "tests/support/header_parse.h"
 
@@ -214,52 +214,5 @@ TEST_P(FixtureHeaderTest, AgreesWithMkvinfoAndFfprobe) {
 
 INSTANTIATE_TEST_SUITE_P(Fixtures, FixtureHeaderTest, testing::ValuesIn(testing_support::FixtureNames()),
                          [](const auto& info) { return info.param; });
-
-// The Cues and Tags behind the clusters of a real file, reached through its SeekHead.
-TEST(FixtureHeaderIndexTest, IndexBehindTheClustersIsReachedWithoutReadingThem) {
-  FixtureExpectation expected = testing_support::LoadFixture("long_cues");
-  HeaderParse parse(testing_support::ReadFixtureBytes("long_cues"));
-  ASSERT_EQ(parse.Parse(), kParseSucceeded);
-  EXPECT_EQ(parse.info().cue_points.count, 50u);
-  EXPECT_EQ(parse.info().tag_count, expected.tags.size());
-  EXPECT_LT(parse.input().counters().bytes_read, expected.file_size / 10);
-}
-
-// The header-removal fixture: a video track whose frames are stored without the
-// VOP start code that its ContentCompSettings holds. That prefix put in front
-// of each stored frame must give back the frames the file held before the
-// prefix was removed (mkvinfo's sizes and Adler-32 of that file, NAME.frames).
-TEST(HeaderRemovalFixtureTest, ParsedPrefixAndStoredFramesGiveTheFramesBeforeRemoval) {
-  std::vector<uint8_t> file = testing_support::ReadFixtureBytes("header_removal_mpeg4");
-  std::vector<testing_support::ExpectedFullFrame> want = testing_support::LoadFullFrames("header_removal_mpeg4");
-  testing_support::HeaderParse parse(file);
-  ASSERT_EQ(parse.Parse(), kParseSucceeded);
-  ASSERT_EQ(parse.info().track_count, 2u);
-  const mkv_track_info& stripped = parse.info().tracks[0];  // compression and algorithm: compared above
-  ASSERT_EQ(stripped.content_encoding_count, 1u);
-  const mkv_content_encoding& encoding = stripped.content_encodings[0];
-  EXPECT_EQ(std::vector<uint64_t>({encoding.order, encoding.scope, encoding.type}), std::vector<uint64_t>({0, 1, 0}));
-  std::vector<uint8_t> prefix(encoding.comp_settings, encoding.comp_settings + encoding.comp_settings_size);
-  ASSERT_EQ(prefix, (std::vector<uint8_t>{0x00, 0x00, 0x01, 0xB6}));  // mkvinfo's comp_settings
-
-  // Each stored frame of the track, prefixed, as the playback parser finds it.
-  using Frame = std::tuple<uint64_t, int64_t, uint32_t, uint32_t>;
-  std::vector<Frame> got, expected;
-  for (const auto& frame : want) expected.emplace_back(frame.track, frame.ticks, frame.size, frame.adler32);
-  testing_support::DriveOptions options;
-  options.buffer_sizes = {file.size()};
-  options.observe = [&](int result, const mkvcluster& c, bool) {
-    if (result != kClusterBlockReady || c.track_number != stripped.track_number) return;
-    std::vector<uint8_t> full = prefix;
-    full.insert(full.end(), file.begin() + static_cast<std::ptrdiff_t>(c.block_end - c.block_data_left),
-                file.begin() + static_cast<std::ptrdiff_t>(c.block_end));
-    got.emplace_back(c.track_number, static_cast<int64_t>(c.cluster_timecode) + c.block_timecode,
-                     static_cast<uint32_t>(full.size()), testing_support::Adler32(full.data(), full.size()));
-  };
-  uint64_t start = testing_support::FirstClusterOffset(file.data(), file.size());
-  ASSERT_TRUE(testing_support::DriveClusters(file.data(), file.size(), start, options).complete);
-  ASSERT_GE(got.size(), 10u);
-  EXPECT_EQ(got, expected);
-}
 
 }  // namespace

@@ -8,6 +8,7 @@
 #include <cstdio>
 #include <cstring>
 #include <string>
+#include <tuple>
 #include <type_traits>
 #include <vector>
 
@@ -193,27 +194,19 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsOrFailWithTheirStatus) {
       // Info: values as encoded; a wrong size fails the element.
       {"Info: nothing", kInfoH, {}, kStatusOk, "defaults"},
       {"Info: TimecodeScale of length 0", kInfoH, element(kTimecodeScale, {}), kStatusOk, "scale 0"},
-      {"Info: TimecodeScale 22675", kInfoH, uinteger(kTimecodeScale, 22675), kStatusOk, "scale 22675"},
       {"Info: Duration as single", kInfoH, element(kDuration, {0x45, 0xFA, 0x00, 0x00}), kStatusOk, "duration 8000"},
-      {"Info: Duration as double", kInfoH, f64(kDuration, 1234.5678), kStatusOk, "duration 1234.5678"},
       {"Info: DateUTC of one byte 0xFF", kInfoH, element(kDateUtc, {0xFF}), kStatusOk, "date -1"},
       {"Info: DateUTC of eight bytes", kInfoH, sinteger(kDateUtc, -1234567890123, 8), kStatusOk, "date -1234567890123"},
-      {"Info: DateUTC positive", kInfoH, sinteger(kDateUtc, 0x7F00, 2), kStatusOk, "date 32512"},
       {"Info: UID, filename and a later Title", kInfoH,
        cat({bin(kSegmentUid, {1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 16}), str(kTitle, "A"), str(kSegmentFilename, "f.mkv"), str(kTitle, "B")}),
        kStatusOk, "uid 1..16 title B file f.mkv"},
       {"Info: UID of 15 bytes", kInfoH, bin(kSegmentUid, filler(15)), kStatusMalformed, ""},
       {"Info: Duration of 2 bytes", kInfoH, element(kDuration, {0x45, 0xFA}), kStatusMalformed, ""},
-      {"Info: TimecodeScale of 9 bytes", kInfoH, element(kTimecodeScale, filler(9, 1)), kStatusMalformed, ""},
       {"Info: DateUTC of 9 bytes", kInfoH, element(kDateUtc, filler(9, 1)), kStatusMalformed, ""},
-      {"Info: Title above the limit", kInfoH, str(kTitle, std::string(8193, 't')), kStatusNoMemory, ""},
 
       // TrackEntry: a bad or cut child fails the entry and frees it; an early end keeps what was read.
       {"Track: integer of 9 bytes", kTrackH, cat({held(), element(kTrackNumber, filler(9, 1))}), kStatusMalformed, "none", 64, true, kReadError},
-      {"Track: flag of 9 bytes", kTrackH, cat({held(), element(kFlagDefault, filler(9, 1))}), kStatusMalformed, "none", 64, true, kReadError},
       {"Track: float of 2 bytes", kTrackH, cat({held(), element(kTrackTimecodeScale, {0x3F, 0x00})}), kStatusMalformed, "none", 64, true, kReadError},
-      {"Track: integer cut short", kTrackH, cat({held(), cut(kPixelWidth, 4, 2)}), kStatusReadFailed, "none", 64, true, kReadError},
-      {"Track: float cut short", kTrackH, cat({held(), cut(kSamplingFrequency, 8, 5)}), kStatusReadFailed, "none", 64, true, kReadError},
       {"Track: string cut short", kTrackH, cat({held(), cut(kCodecName, 20, 3)}), kStatusReadFailed, "none", 64, true, kReadError},
       {"Track: codec ID cut short", kTrackH, cat({held(), cut(kCodecId, 20, 3)}), kStatusReadFailed, "none", 64, true, kReadError},
       {"Track: encoding payload cut short", kTrackH, cat({held(), cut(kContentSigKeyId, 9, 1)}), kStatusReadFailed, "none", 64, true, kReadError},
@@ -221,17 +214,13 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsOrFailWithTheirStatus) {
        "number 5"},
       {"Track: size byte 0x00 ends the entry", kTrackH, cat({uinteger(kTrackNumber, 5), Bytes{0x9F, 0x00}, uinteger(kChannels, 6)}), kStatusOk,
        "number 5"},
-      {"Track: file ends inside a size", kTrackH, cat({uinteger(kTrackNumber, 5), Bytes{0x9F, 0x40}}), kStatusOk, "number 5", 10},
       {"Track: entry ends before the next child", kTrackH, cat({uinteger(kTrackNumber, 5), uinteger(kChannels, 6)}), kStatusOk, "number 5", -3},
       {"Track: Name at the limit", kTrackH, str(kName, std::string(8192, 'n')), kStatusOk, "name " + std::string(8192, 'n')},
       {"Track: Name past the limit", kTrackH, str(kName, std::string(8193, 'n')), kStatusNoMemory, "none"},
-      {"Track: Name past the limit, no limits", kTrackH, str(kName, std::string(8193, 'n')), kStatusOk, "name " + std::string(8193, 'n'), 0, false},
       {"Track: CodecID one below the limit", kTrackH, str(kCodecId, std::string(8191, 'V')), kStatusOk, "codec 8191"},
       {"Track: CodecID at the limit", kTrackH, str(kCodecId, std::string(8192, 'V')), kStatusNoMemory, "none"},
       {"Track: CodecPrivate at the bound", kTrackH, bin(kCodecPrivate, filler(32768, 3)), kStatusOk, "private 32768"},
       {"Track: CodecPrivate past the bound, no limits", kTrackH, bin(kCodecPrivate, filler(32769, 3)), kStatusNoMemory, "none", 0, false},
-      {"Track: ContentCompSettings past the bound", kTrackH, cat({master(kContentEncoding, {}), bin(kContentCompSettings, filler(32769))}),
-       kStatusNoMemory, "none"},
       // Masters are read as the entry's own children: the Video master claims
       // one byte, an encoding child before any encoding is dropped, and the
       // sixth encoding updates the fifth.
@@ -255,15 +244,11 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsOrFailWithTheirStatus) {
       {"Seek: unknown children and a Void", kSeekH, cat({bin(kVoid, filler(3)), master(kSeek, {bin(0x4321, filler(2)), seek(kInfo, 6)})}),
        kStatusOk, "0@0 1549A966@6 heads 1 met"},
       {"Seek: empty", kSeekH, {}, kStatusOk, "heads 0"},
-      {"Seek: Seek children without their Seek", kSeekH, cat({element(kSeekId, id_bytes(kCues)), uinteger(kSeekPosition, 9)}), kStatusOk, "heads 0"},
       {"Seek: malformed child ID", kSeekH, cat({seek(kInfo, 1), Bytes{0x00, 0x81, 0x00}, seek(kCues, 2)}), kStatusOk, "heads 0"},
-      {"Seek: malformed child size", kSeekH, cat({seek(kInfo, 1), Bytes{0xEC, 0x00}, seek(kCues, 2)}), kStatusOk, "heads 0"},
       {"Seek: stored ID of five bytes", kSeekH, cat({seek(kInfo, 1), master(kSeek, {element(kSeekId, Bytes{0x08, 1, 2, 3, 4})})}),
        kStatusOk, "heads 0"},
-      {"Seek: stored ID starting with 0x00", kSeekH, cat({seek(kInfo, 1), master(kSeek, {element(kSeekId, Bytes{0x00})})}), kStatusOk, "heads 0"},
       {"Seek: SeekPosition of 9 bytes", kSeekH,
        cat({seek(kInfo, 1), master(kSeek, {element(kSeekId, id_bytes(kCues)), element(kSeekPosition, filler(9))})}), kStatusMalformed, "heads 0"},
-      {"Seek: SeekID of 9 bytes", kSeekH, cat({seek(kInfo, 1), master(kSeek, {element(kSeekId, filler(9, 0x81))})}), kStatusMalformed, "heads 0"},
       {"Seek: short SeekPosition", kSeekH,
        cat({seek(kInfo, 1), id_bytes(kSeek), size_bytes(7), id_bytes(kSeekPosition), size_bytes(4), Bytes{1, 2}}), kStatusReadFailed, "heads 0"},
 
@@ -271,7 +256,6 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsOrFailWithTheirStatus) {
       // last, so a stray CueTrack lands there; children before their master
       // have no record to fill.
       {"Cues: CueBlockNumber", kCueH, point(7, position(2, 99, uinteger(kCueBlockNumber, 12))), kStatusOk, "7:2/99/12/0[] met"},
-      {"Cues: CueBlockNumber of length 0", kCueH, point(7, position(2, 99, element(kCueBlockNumber, {}))), kStatusOk, "7:2/99/0/0[] met"},
       {"Cues: audio and video positions", kCueH, point(5, cat({position(1, 10), position(2, 10, uinteger(kCueCodecState, 3))})),
        kStatusOk, "5:1/10/1/0[];2/10/1/3[] met"},
       {"Cues: references", kCueH, point(9, position(1, 20, cat({ref(4), master(kCueReference, {uinteger(kCueRefTime, 6), uinteger(0x97, 1)})}))),
@@ -285,13 +269,10 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsOrFailWithTheirStatus) {
       {"Cues: current position survives a new CuePoint", kCueH,
        cat({point(1, position(1, 2)), element(kCuePoint, {}), uinteger(kCueTrack, 9)}), kStatusOk, "1:9/2/1/0[]|0: met"},
       {"Cues: empty", kCueH, {}, kStatusOk, ""},
-      {"Cues: only unknown children", kCueH, cat({bin(kVoid, filler(4)), uinteger(kCueTime, 3)}), kStatusOk, ""},
       {"Cues: first CueTime of 9 bytes", kCueH, element(kCuePoint, element(kCueTime, filler(9))), kStatusMalformed, "0: met"},
-      {"Cues: malformed header before any point", kCueH, cat({Bytes{0x00, 0x81}, point(1, position(1, 2))}), kStatusMalformed, ""},
       {"Cues: malformed header after a point", kCueH, cat({point(1, position(1, 2)), Bytes{0xBB, 0x00}}), kStatusMalformed, "1:1/2/1/0[] met"},
       {"Cues: value cut by the end of the file", kCueH, cat({id_bytes(kCuePoint), size_bytes(5), id_bytes(kCueTime), size_bytes(4), Bytes{1}}),
        kStatusReadFailed, "0: met", 16},
-      {"Cues: header cut by the end of the file", kCueH, cat({point(1, position(1, 2)), Bytes{0x53}}), kStatusReadFailed, "1:1/2/1/0[] met", 16},
 
       // Tags: each SimpleTag fills the next entry; the first name and string stand.
       {"Tags: nested SimpleTag gets its own entry and stays current", kTagH,
@@ -304,9 +285,6 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsOrFailWithTheirStatus) {
        "1 -=four/bi/2"},
       {"Tags: values before any SimpleTag are skipped", kTagH, cat({str(kTagName, "X"), str(kTagString, "Y"), simple_tag("T", "v")}),
        kStatusOk, "1 T=v/-/1"},
-      {"Tags: empty name and string", kTagH, master(kSimpleTag, {str(kTagName, ""), str(kTagString, ""), uinteger(kTagLanguage, 0)}),
-       kStatusOk, "1 =/-/0"},
-      {"Tags: name of 8192", kTagH, master(kSimpleTag, {str(kTagName, std::string(8192, 'n'))}), kStatusOk, "1 " + std::string(8192, 'n') + "=-/-/0"},
       {"Tags: name of 8193", kTagH, master(kSimpleTag, {str(kTagName, std::string(8193, 'n'))}), kStatusNoMemory, "", 0, true,
        "Error allocating tag name of size 8193"},
       {"Tags: name of 8193 without limits", kTagH, master(kSimpleTag, {str(kTagName, std::string(8193, 'n'))}), kStatusOk,
@@ -319,13 +297,8 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsOrFailWithTheirStatus) {
        "Error allocating tag binary of size 32769"},
       {"Tags: string claiming 2^32 bytes", kTagH, cat({id_bytes(kSimpleTag), size_bytes(20), id_bytes(kTagString), size_bytes(1ull << 32)}),
        kStatusNoMemory, "", 0, false, "Error allocating tag string of size 4294967296"},
-      {"Tags: name cut by the end of the file", kTagH, cat({id_bytes(kSimpleTag), size_bytes(40), id_bytes(kTagName), size_bytes(10), Bytes{'a', 'b', 'c'}}),
-       kStatusReadFailed, "", 7},
       {"Tags: string cut by the end of the file", kTagH, cat({id_bytes(kSimpleTag), size_bytes(40), id_bytes(kTagString), size_bytes(10), Bytes{'a', 'b', 'c'}}),
        kStatusReadFailed, "", 7},
-      {"Tags: binary cut by the end of the file", kTagH, cat({id_bytes(kSimpleTag), size_bytes(40), id_bytes(kTagBinary), size_bytes(10), Bytes{'a', 'b', 'c'}}),
-       kStatusReadFailed, "", 7},
-      {"Tags: fifty are kept", kTagH, many_tags(50), kStatusOk, "50 T0=v0/-/2 T1=v1/-/2 T49=v49/-/3"},
       {"Tags: the fifty-first is logged and dropped", kTagH, many_tags(51), kStatusOk, "50 T0=v0/-/2 T1=v1/-/2 T49=v49/-/3", 0, true,
        "kelvane:  Too many tags.  Some metadata may be missing."},
   };
@@ -362,38 +335,25 @@ TEST(HeaderHandlersTest, StoreWhatTheElementHoldsOrFailWithTheirStatus) {
   }
 }
 
-// The fields that neither the table above nor the real fixtures exercise.
-TEST(HeaderHandlersTest, RareTrackChildrenLandInTheirFields) {
-  Bytes children = cat({uinteger(kFlagLacing, 2), element(kFlagEnabled, {}), uinteger(kFlagForced, 3), uinteger(kCodecDecodeAll, 1),
-                        uinteger(kMinCache, 3), uinteger(kMaxCache, 4), uinteger(kMaxBlockAdditionId, 5), uinteger(kAttachmentLink, 6),
-                        uinteger(kTrackOverlay, 7), element(kTrackTimecodeScale, {0x3F, 0x00, 0x00, 0x00}), str(kName, "first"),
-                        str(kName, "Commentary"), str(kCodecName, "Vorbis"),
-                        master(kVideo, {uinteger(kFlagInterlaced, 1), uinteger(kStereoMode, 8), uinteger(kPixelCropBottom, 9),
-                                        uinteger(kPixelCropTop, 10), uinteger(kPixelCropLeft, 11), uinteger(kPixelCropRight, 12),
-                                        uinteger(kAspectRatioType, 2), uinteger(kColourSpace, 0x49343230, 4), uinteger(kColourSpace, 0x5959, 2)}),
-                        master(kAudio, {f64(kOutputSamplingFrequency, 96000.0)}), element(0x55B0, uinteger(kTrackNumber, 99)),
-                        uinteger(kTrackNumber, 2)});
+// How a TrackEntry's children are read where it is not "the value as
+// encoded": flags keep their lowest bit, a ColourSpace other than four bytes
+// is skipped, a later Name replaces the first, and an unknown master is not
+// descended into.
+TEST(HeaderHandlersTest, TrackChildrenReadByTheirOwnRules) {
+  Bytes children = cat({uinteger(kFlagLacing, 2), uinteger(kFlagForced, 3), element(kTrackTimecodeScale, {0x3F, 0x00, 0x00, 0x00}),
+                        str(kName, "first"), str(kName, "Commentary"),
+                        master(kVideo, {uinteger(kColourSpace, 0x49343230, 4), uinteger(kColourSpace, 0x5959, 2)}),
+                        element(0x55B0, uinteger(kTrackNumber, 99)), uinteger(kTrackNumber, 2)});
   HeaderParse parse(children);
   ASSERT_EQ(RunHandler(parse, kTrackH, children), kStatusOk);
   const mkv_track_info& t = parse.info().tracks[0];
-  EXPECT_EQ(t.flag_lacing, 0);  // only the lowest bit counts
-  EXPECT_EQ(t.flag_enabled, 0);
-  EXPECT_EQ(t.flag_forced, 1);
-  EXPECT_EQ(t.codec_decode_all, 1);
-  EXPECT_EQ(t.flag_interlaced, 1);
-  EXPECT_EQ(std::vector<uint64_t>({t.min_cache, t.max_cache, t.max_block_addition_id, t.attachment_link, t.track_overlay, t.stereo_mode,
-                                   t.pixel_crop_bottom, t.pixel_crop_top, t.pixel_crop_left, t.pixel_crop_right, t.aspect_ratio_type}),
-            std::vector<uint64_t>({3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 2}));
-  EXPECT_EQ(t.colour_space, 0x49343230u);  // the 2-byte ColourSpace is skipped
-  EXPECT_EQ(t.track_timecode_scale, 0.5);
-  EXPECT_EQ(t.output_sampling_frequency, 96000.0);
-  EXPECT_STREQ(t.name, "Commentary");
-  EXPECT_STREQ(t.codec_name, "Vorbis");
-  EXPECT_EQ(t.track_number, 2u);  // not the 99 inside the unknown 0x55B0
+  EXPECT_EQ(std::make_tuple(t.flag_lacing, t.flag_forced, t.colour_space, t.track_timecode_scale, std::string(t.name), t.track_number),
+            std::make_tuple(uint8_t{0}, uint8_t{1}, uint64_t{0x49343230}, 0.5, std::string("Commentary"), uint64_t{2}));
 }
 
 // Each allocation fails in turn: the element fails with no memory and leaves
-// nothing behind, the seek lists with their exact notices.
+// nothing behind, the seek lists with their exact notices. (Cues and Tags
+// fail every allocation within a whole header parse in the index test.)
 TEST(HeaderHandlersTest, EveryFailedAllocationIsAnsweredAndLeaksNothing) {
   const struct {
     const Kind& kind;
@@ -407,8 +367,6 @@ TEST(HeaderHandlersTest, EveryFailedAllocationIsAnsweredAndLeaksNothing) {
                      master(kContentEncoding, {bin(kContentCompSettings, {5})}), str(kName, "renamed")}), {}},
       {kSeekH, cat({seek(kInfo, 1), seek(kTracks, 2)}),
        {nullptr, nullptr, "Can't allocate new seek entry.", "Can't allocate new queue entry."}},
-      {kCueH, point(1, cat({position(1, 10, ref(4)), position(2, 10)})), {}},
-      {kTagH, cat({simple_tag("A", "a"), master(kSimpleTag, {bin(kTagBinary, {1})})}), {}},
   };
   for (const auto& c : cases) {
     for (uint64_t failing = 1; failing < 40; ++failing) {
