@@ -13,6 +13,7 @@
 
 #include "core/cluster/cluster_status.h"
 #include "core/cluster/mkv_cluster.h"
+#include "tests/support/adler32.h"
 
 namespace testing_support {
 
@@ -42,7 +43,6 @@ struct DriveOptions {
 
 struct DriveOutcome {
   std::vector<DrivenBlock> blocks;
-  uint64_t calls = 0;
   bool failed = false;    // a result that was neither a block, a skip nor "ran out with the buffers empty"
   int failure = 0;        // that result
   bool complete = false;  // every byte was consumed and no read or frame was left half done
@@ -58,17 +58,6 @@ DriveOutcome DriveClusters(const uint8_t* file, size_t size, uint64_t start, con
 
 namespace cluster_driver_detail {
 
-struct Adler {
-  uint32_t a = 1, b = 0;
-  void update(const uint8_t* data, size_t n) {
-    for (size_t i = 0; i < n; ++i) {
-      a = (a + data[i]) % 65521;
-      b = (b + a) % 65521;
-    }
-  }
-  uint32_t value() const { return b << 16 | a; }
-};
-
 inline bool read_vint(const uint8_t* file, size_t size, uint64_t* pos, uint64_t* value, bool keep_marker) {
   if (*pos >= size || file[*pos] == 0) return false;
   uint8_t first = file[*pos];
@@ -82,10 +71,6 @@ inline bool read_vint(const uint8_t* file, size_t size, uint64_t* pos, uint64_t*
   return true;
 }
 
-inline mkvinbuff view_at(const uint8_t* file, uint64_t offset, size_t n) {
-  return mkvinbuff{file + offset, static_cast<uint32_t>(n), 0, static_cast<uint32_t>(n), offset};
-}
-
 // The caller's side of the loop: skip bytes, frames in progress, buffers.
 class Driver {
  public:
@@ -94,16 +79,13 @@ class Driver {
   ~Driver() { destroy_mkvcluster(cluster_.get()); }
 
   DriveOutcome run() {
-    in1_ = next_view();
-    has_in2_ = next_offset_ < size_;
-    if (has_in2_) in2_ = next_view();
-    for (;;) {
-      parse_buffer();
-      if (outcome_.failed || !has_in2_) break;
+    in2_ = next_view();
+    do {
       in1_ = in2_;
       has_in2_ = next_offset_ < size_;
       if (has_in2_) in2_ = next_view();
-    }
+      parse_buffer();
+    } while (!outcome_.failed && has_in2_);
     if (group_tail_pending_) finish_group_tail();
     outcome_.complete = !outcome_.failed && in1_.buff_left == 0 && skip_left_ == 0 && !block_ &&
                         !mkvcluster_inside_element(cluster_.get());
@@ -117,7 +99,7 @@ class Driver {
     if (n == 0 && last_view_empty_) n = 1;  // empty buffers come, but not forever
     if (n > size_ - next_offset_) n = size_ - next_offset_;
     last_view_empty_ = n == 0;
-    mkvinbuff view = view_at(file_, next_offset_, n);
+    mkvinbuff view{file_ + next_offset_, static_cast<uint32_t>(n), 0, static_cast<uint32_t>(n), next_offset_};
     next_offset_ += n;
     return view;
   }
@@ -150,7 +132,6 @@ class Driver {
   }
 
   int observed(int result, bool group_tail = false) {
-    ++outcome_.calls;
     if (options_.observe) options_.observe(result, *cluster_, group_tail);
     return result;
   }
@@ -209,7 +190,7 @@ class Driver {
     frame_left_ = 0;
     consumed_ = 0;
     data_left_ = c.block_data_left;
-    adler_ = Adler{};
+    adler_ = Adler32Sum{};
   }
 
   // Frames of the current block from inbuff1; a frame cut by the buffer's end
@@ -222,12 +203,12 @@ class Driver {
       auto size = static_cast<int32_t>(static_cast<uint32_t>(block.frame_sizes[frame_index_]));
       if (frame_left_ == 0) {
         if (size < 1) {
-          block.adler32.push_back(Adler{}.value());
+          block.adler32.push_back(Adler32Sum{}.value());
           ++frame_index_;
           continue;
         }
         frame_left_ = static_cast<uint32_t>(size);
-        adler_ = Adler{};
+        adler_ = Adler32Sum{};
       }
       if (in1_.buff_left == 0) return;
       uint32_t n = frame_left_ < in1_.buff_left ? frame_left_ : in1_.buff_left;
@@ -262,7 +243,7 @@ class Driver {
   uint32_t frame_left_ = 0;    // bytes of frame frame_index_ still to consume; 0 between frames
   int64_t consumed_ = 0;       // frame bytes of the block consumed so far
   int64_t data_left_ = 0;      // the block's block_data_left
-  Adler adler_;
+  Adler32Sum adler_;
   bool group_tail_pending_ = false;  // the last Block's group has children still to read
   size_t group_block_ = 0;           // index of that Block in outcome_.blocks
   DriveOutcome outcome_;
@@ -286,7 +267,7 @@ inline uint64_t FirstClusterOffset(const uint8_t* file, size_t size) {
 }
 
 inline DriveOutcome DriveClusters(const uint8_t* file, size_t size, uint64_t start, const DriveOptions& options) {
-  if (start >= size) return DriveOutcome{{}, 0, false, 0, true};
+  if (start >= size) return DriveOutcome{{}, false, 0, true};
   return cluster_driver_detail::Driver(file, size, start, options).run();
 }
 

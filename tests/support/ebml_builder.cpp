@@ -1,16 +1,17 @@
 #include "tests/support/ebml_builder.h"
 
 #include <bit>
-#include <cstring>
 
 namespace ebml {
 
-Bytes id_bytes(uint32_t id) {
-  Bytes out;
-  int width = id > 0xFFFFFF ? 4 : id > 0xFFFF ? 3 : id > 0xFF ? 2 : 1;
-  for (int i = width - 1; i >= 0; --i) out.push_back(static_cast<uint8_t>(id >> (8 * i)));
+// The low `width` bytes of `value`, most significant first.
+static Bytes big_endian(uint64_t value, int width) {
+  Bytes out(static_cast<size_t>(width));
+  for (int i = width - 1; i >= 0; --i, value >>= 8) out[static_cast<size_t>(i)] = static_cast<uint8_t>(value);
   return out;
 }
+
+Bytes id_bytes(uint32_t id) { return big_endian(id, id > 0xFFFFFF ? 4 : id > 0xFFFF ? 3 : id > 0xFF ? 2 : 1); }
 
 Bytes size_bytes(uint64_t size, int width) {
   if (width == 0) {
@@ -18,12 +19,7 @@ Bytes size_bytes(uint64_t size, int width) {
     // All ones in the value bits would read as "unknown": go one byte wider.
     while (width < 8 && size >= (uint64_t{1} << (7 * width)) - 1) ++width;
   }
-  Bytes out(static_cast<size_t>(width));
-  uint64_t value = size;
-  for (int i = width - 1; i >= 0; --i) {
-    out[static_cast<size_t>(i)] = static_cast<uint8_t>(value);
-    value >>= 8;
-  }
+  Bytes out = big_endian(size, width);
   out[0] |= static_cast<uint8_t>(0x80 >> (width - 1));
   return out;
 }
@@ -53,35 +49,14 @@ Bytes uinteger(uint32_t id, uint64_t value, int width) {
     width = 1;
     while (width < 8 && (value >> (8 * width)) != 0) ++width;
   }
-  Bytes payload(static_cast<size_t>(width));
-  for (int i = width - 1; i >= 0; --i) {
-    payload[static_cast<size_t>(i)] = static_cast<uint8_t>(value);
-    value >>= 8;
-  }
-  return element(id, payload);
+  return element(id, big_endian(value, width));
 }
 
-Bytes sinteger(uint32_t id, int64_t value, int width) {
-  Bytes payload(static_cast<size_t>(width));
-  auto bits = static_cast<uint64_t>(value);
-  for (int i = width - 1; i >= 0; --i) {
-    payload[static_cast<size_t>(i)] = static_cast<uint8_t>(bits);
-    bits >>= 8;
-  }
-  return element(id, payload);
-}
+Bytes sinteger(uint32_t id, int64_t value, int width) { return element(id, big_endian(static_cast<uint64_t>(value), width)); }
 
 Bytes str(uint32_t id, std::string_view text) { return element(id, Bytes(text.begin(), text.end())); }
 
-Bytes f64(uint32_t id, double value) {
-  auto bits = std::bit_cast<uint64_t>(value);
-  Bytes payload(8);
-  for (int i = 7; i >= 0; --i) {
-    payload[static_cast<size_t>(i)] = static_cast<uint8_t>(bits);
-    bits >>= 8;
-  }
-  return element(id, payload);
-}
+Bytes f64(uint32_t id, double value) { return element(id, big_endian(std::bit_cast<uint64_t>(value), 8)); }
 
 Bytes bin(uint32_t id, const Bytes& payload) { return element(id, payload); }
 

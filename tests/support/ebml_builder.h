@@ -23,14 +23,10 @@ enum : uint32_t {
   kCluster = 0x1F43B675, kTimecode = 0xE7, kSimpleBlock = 0xA3, kBlockGroup = 0xA0, kBlock = 0xA1, kBlockDuration = 0x9B,
   kReferenceBlock = 0xFB,
   kTracks = 0x1654AE6B, kTrackEntry = 0xAE, kTrackNumber = 0xD7, kTrackUid = 0x73C5, kTrackType = 0x83, kCodecId = 0x86,
-  kCodecPrivate = 0x63A2, kDefaultDuration = 0x23E383, kFlagEnabled = 0xB9, kFlagDefault = 0x88, kFlagForced = 0x55AA,
-  kFlagLacing = 0x9C, kMinCache = 0x6DE7, kMaxCache = 0x6DF8, kTrackTimecodeScale = 0x23314F, kMaxBlockAdditionId = 0x55EE,
-  kName = 0x536E, kLanguage = 0x22B59C, kCodecName = 0x258688, kAttachmentLink = 0x7446, kCodecDecodeAll = 0xAA,
-  kTrackOverlay = 0x6FAB,
-  kVideo = 0xE0, kPixelWidth = 0xB0, kPixelHeight = 0xBA, kFlagInterlaced = 0x9A, kStereoMode = 0x53B8,
-  kPixelCropBottom = 0x54AA, kPixelCropTop = 0x54BB, kPixelCropLeft = 0x54CC, kPixelCropRight = 0x54DD,
-  kAspectRatioType = 0x54B3, kColourSpace = 0x2EB524,
-  kAudio = 0xE1, kSamplingFrequency = 0xB5, kOutputSamplingFrequency = 0x78B5, kChannels = 0x9F,
+  kCodecPrivate = 0x63A2, kDefaultDuration = 0x23E383, kFlagForced = 0x55AA, kFlagLacing = 0x9C,
+  kTrackTimecodeScale = 0x23314F, kName = 0x536E, kLanguage = 0x22B59C, kCodecName = 0x258688,
+  kVideo = 0xE0, kPixelWidth = 0xB0, kPixelHeight = 0xBA, kColourSpace = 0x2EB524,
+  kAudio = 0xE1, kSamplingFrequency = 0xB5, kChannels = 0x9F,
   kContentEncodings = 0x6D80, kContentEncoding = 0x6240, kContentEncodingOrder = 0x5031, kContentEncodingScope = 0x5032,
   kContentEncodingType = 0x5033, kContentCompression = 0x5034, kContentCompAlgo = 0x4254, kContentCompSettings = 0x4255,
   kContentEncryption = 0x5035, kContentEncAlgo = 0x47E1, kContentEncKeyId = 0x47E2, kContentSignature = 0x47E3,
@@ -39,7 +35,6 @@ enum : uint32_t {
   kCueClusterPosition = 0xF1, kCueBlockNumber = 0x5378, kCueCodecState = 0xEA, kCueReference = 0xDB, kCueRefTime = 0x96,
   kCueRelativePosition = 0xF0,
   kTags = 0x1254C367, kTag = 0x7373, kSimpleTag = 0x67C8, kTagName = 0x45A3, kTagString = 0x4487, kTagBinary = 0x4485,
-  kTagLanguage = 0x447A,
 };
 
 // The EBML unknown-size value, as an 8-byte size field writes it.

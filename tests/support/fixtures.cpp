@@ -214,22 +214,4 @@ std::vector<uint8_t> ReadFixtureBytes(const std::string& name) {
   return std::vector<uint8_t>(bytes.begin(), bytes.end());
 }
 
-uint32_t Adler32(const uint8_t* data, size_t size) {
-  constexpr uint32_t kModulus = 65521;
-  // 5552 is the longest run whose sums cannot overflow 32 bits before the reduction.
-  constexpr size_t kRun = 5552;
-  uint32_t a = 1, b = 0;
-  while (size > 0) {
-    size_t n = size < kRun ? size : kRun;
-    size -= n;
-    while (n-- > 0) {
-      a += *data++;
-      b += a;
-    }
-    a %= kModulus;
-    b %= kModulus;
-  }
-  return (b << 16) | a;
-}
-
 }  // namespace testing_support

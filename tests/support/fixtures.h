@@ -11,6 +11,8 @@
 #include <utility>
 #include <vector>
 
+#include "tests/support/adler32.h"
+
 namespace testing_support {
 
 // One TrackEntry. Keys absent from the file's line keep their zero defaults;
@@ -85,9 +87,5 @@ std::vector<ExpectedFullFrame> LoadFullFrames(const std::string& name);
 
 // The whole NAME.mkv; empty (with ADD_FAILURE) when it cannot be read.
 std::vector<uint8_t> ReadFixtureBytes(const std::string& name);
-
-// Adler-32 (RFC 1950), the frame checksum that mkvinfo -c prints and the
-// .blocks files record.
-uint32_t Adler32(const uint8_t* data, size_t size);
 
 }  // namespace testing_support

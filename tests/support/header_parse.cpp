@@ -14,8 +14,7 @@ HeaderParse::HeaderParse(ebml::Bytes bytes, HeaderParseOptions options)
   limits_.input_seekable = options.seekable ? 1 : 0;
   if (options.with_limits) info_->parse_limits = &limits_;
   info_->metadata = options.metadata;
-  stream_ready_ = mkvvstream_init(&stream_, input_->record(), options.buffer_size, 1, kFillWithRead,
-                                  options.seekable ? 1 : 0) == 0;
+  stream_ready_ = mkvvstream_init(&stream_, input_->record(), 480, 1, kFillWithRead, options.seekable ? 1 : 0) == 0;
 }
 
 HeaderParse::~HeaderParse() {

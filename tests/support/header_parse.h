@@ -1,6 +1,7 @@
 #pragma once
-// Runs the header parse over bytes in memory, the way the filter's creators do,
-// and keeps everything alive for the test to inspect.
+// Runs the header parse over bytes in memory, the way the filter's creators do
+// (480-byte stream buffer, read-through), and keeps everything alive for the
+// test to inspect.
 
 #include <memory>
 
@@ -12,7 +13,6 @@
 namespace testing_support {
 
 struct HeaderParseOptions {
-  int64_t buffer_size = 480;
   bool seekable = true;
   bool with_limits = true;  // the creators' limits: 8192-byte strings
   mkv_metadata_list* metadata = nullptr;  // handed in as the creators do; owned by the test
@@ -32,7 +32,6 @@ class HeaderParse {
   mkv_file_info& info() { return *info_; }
   mkvvstream& stream() { return stream_; }
   host::InputStream& input() { return *input_; }
-  bool stream_ready() const { return stream_ready_; }
 
  private:
   ebml::Bytes bytes_;
