@@ -325,7 +325,8 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
     std::vector<std::thread> sinks;
     for (size_t i = 0; i < acquired.size(); ++i) {
       uint32_t delay = i < options.sink_delay_us.size() ? options.sink_delay_us[i] : 0;
-      sinks.emplace_back(SinkThread, output, acquired[i], &out.channels[i], std::cref(options), delay,
+      // By pointer: a Thumb function's address is odd, and a reference bound to it reads as misaligned.
+      sinks.emplace_back(&SinkThread, output, acquired[i], &out.channels[i], std::cref(options), delay,
                          config_pool.handle(), prefix_pool.handle(), playback.get());
     }
     std::thread controller;
