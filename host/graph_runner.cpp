@@ -21,8 +21,12 @@ constexpr uint32_t kPrefixBufferSize = 4096;
 constexpr uint32_t kPrefixBuffers = 16;
 constexpr uint32_t kConfigBuffers = 8;
 // Input buffers referenced at once: the ring's 39 plus what output media
-// buffers still point into; small buffers need many.
-constexpr uint32_t kInputPoolBytes = 16u << 20;
+// buffers still point into; small buffers need many, and an output media
+// buffer still being filled with large frames from large input buffers points
+// into hundreds. Too few would leave the streamer waiting for a buffer under
+// the plug-in's ring lock while the channel holding them waits for that lock.
+// A pool buffer costs memory only once it is filled, so the pool is generous.
+constexpr uint32_t kInputPoolBytes = 256u << 20;
 constexpr uint32_t kMinInputBuffers = 48;
 constexpr uint32_t kMaxInputBuffers = 2048;
 constexpr int kMaxShortInputRetries = 1000;
@@ -157,8 +161,24 @@ class Sink {
   Adler32 adler_;
 };
 
+// A channel that fails stops the graph, as a player does when one of its
+// decoders' inputs breaks: the other channels may be waiting for ring room
+// that only the failed channel's reads would free, and Stop wakes them.
+constexpr int kControlStopped = 16;  // the control state a channel answers once the graph is stopped
+
+struct GraphStopper {
+  const MmfMediaControlOps* control;
+  MmfFilterHandle* handle;
+  void StopAfter(int result) const {
+    if (result != kMmfEndOfStream && result != kControlStopped && result != kMmfBufferDelivered) {
+      (void)control->Stop(handle);
+    }
+  }
+};
+
 void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun* run, const RunnerOptions& options,
-                uint32_t delay_us, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool, PlaybackControl* playback) {
+                uint32_t delay_us, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool, PlaybackControl* playback,
+                GraphStopper stopper) {
   Sink sink(run, options, config_pool, prefix_pool);
   auto restart = [&] {
     if (playback->Flushed()) sink.Restart();
@@ -176,6 +196,7 @@ void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun
         restart();
         continue;
       }
+      stopper.StopAfter(result);
       break;
     }
     short_inputs = 0;
@@ -327,7 +348,7 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
       uint32_t delay = i < options.sink_delay_us.size() ? options.sink_delay_us[i] : 0;
       // By pointer: a Thumb function's address is odd, and a reference bound to it reads as misaligned.
       sinks.emplace_back(&SinkThread, output, acquired[i], &out.channels[i], std::cref(options), delay,
-                         config_pool.handle(), prefix_pool.handle(), playback.get());
+                         config_pool.handle(), prefix_pool.handle(), playback.get(), GraphStopper{control, handle});
     }
     std::thread controller;
     if (playback) {
