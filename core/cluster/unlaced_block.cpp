@@ -1,6 +1,8 @@
 #include "core/cluster/unlaced_block.h"
 
+#include <algorithm>
 #include <bit>
+#include <cstring>
 
 #include "core/cluster/cluster_ids.h"
 #include "core/cluster/element_header.h"
@@ -15,14 +17,16 @@ constexpr uint64_t kLargestExactSize = 0x7FFFFFFF;
 // track number, timecode and flags. Closer to the end of inbuff1 the parser reads it.
 constexpr uint32_t kLongestHeader = 1 + 8 + 1 + 8 + 8 + 3;
 
-// A size or track number at `at` (marker removed): its length, or 0 when invalid.
-inline uint32_t read_vint(const uint8_t* at, uint64_t* value) {
-  const uint8_t first = *at;
-  if (first == 0) return 0;
-  const auto length = static_cast<uint32_t>(std::countl_zero(first) + 1);
-  uint64_t v = first & (0xFFu >> length);
-  for (uint32_t i = 1; i < length; ++i) v = v << 8 | at[i];
-  *value = v;
+// A size or track number at `at` (marker removed): its length, or 0 when
+// invalid. Reads the 8 bytes from `at` whatever the length: the callers have
+// kLongestHeader bytes in front of them.
+[[gnu::always_inline]] inline uint32_t read_vint(const uint8_t* at, uint64_t* value) {
+  uint64_t word;
+  std::memcpy(&word, at, sizeof word);
+  if constexpr (std::endian::native == std::endian::little) word = __builtin_bswap64(word);
+  if ((word >> 56) == 0) return 0;
+  const auto length = static_cast<uint32_t>(std::countl_zero(word) + 1);
+  *value = (word << length) >> length >> (64 - 8 * length);
   return length;
 }
 
@@ -60,24 +64,30 @@ bool finish_group_values(mkvinbuff* inbuff1, mkvcluster* cluster) {
   }
 }
 
-// One header at inbuff1's read position, or false with nothing consumed.
-// Other tracks' headers are taken whatever the allocator says; the own
-// track's needs its one-entry table.
-bool take_one(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track, bool* own, int32_t* data_left) {
-  mkv_cluster_resume& resume = cluster->resume;
-  if (resume.step != mkv_resume_step::none) return false;
-  if (cluster->in_blockgroup && !finish_group_values(inbuff1, cluster)) return false;
-  if (inbuff1->buff_left < kLongestHeader) return false;
-  const uint8_t* const start = inbuff1->buff + inbuff1->buff_pos;
+// An unlaced block header decoded in place (nothing stored yet).
+struct block_header_view {
+  uint8_t id;
+  uint64_t size;             // the (Simple)Block's size
+  uint64_t group_size;       // the BlockGroup's size, for a BlockGroup
+  uint64_t track;
+  uint32_t track_length;
+  uint32_t group_offset;     // bytes from the element ID to the BlockGroup payload
+  uint32_t block_offset;     // bytes from the element ID to the block payload
+  uint32_t header_length;    // bytes from the element ID to the first frame byte
+  const uint8_t* fields;     // timecode and flags
+};
+
+// Decodes the header at `start` (at least kLongestHeader bytes readable);
+// false when it is not an unlaced block the shortcut may take.
+[[gnu::always_inline]] inline bool decode_header(const uint8_t* start, block_header_view* h) {
   const uint8_t id = start[0];
   if (id != cluster_id::kSimpleBlock && id != cluster_id::kBlockGroup) return false;
-  const uint64_t position = inbuff1->buff_fileoff + inbuff1->buff_pos;
-  if (position >= cluster->cluster_end) return false;
   const uint8_t* at = start + 1;
   uint64_t size = 0, group_size = 0, track = 0;
   uint32_t length = read_vint(at, &size);
   if (!length) return false;
   at += length;
+  const auto group_offset = static_cast<uint32_t>(at - start);
   if (id == cluster_id::kBlockGroup) {
     // The group's first child must be its Block.
     group_size = size;
@@ -87,24 +97,34 @@ bool take_one(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track, bool*
   const uint32_t track_length = read_vint(at, &track);
   if (!track_length) return false;
   const uint8_t* const fields = at + track_length;
-  const uint8_t flags = fields[2];
-  if ((flags & kLacingBits) != 0 || size > kLargestExactSize || size < 3 + uint64_t{track_length}) return false;
+  if ((fields[2] & kLacingBits) != 0 || size > kLargestExactSize || size < 3 + uint64_t{track_length}) return false;
+  h->id = id;
+  h->size = size;
+  h->group_size = group_size;
+  h->track = track;
+  h->track_length = track_length;
+  h->group_offset = group_offset;
+  h->block_offset = static_cast<uint32_t>(at - start);
+  h->header_length = static_cast<uint32_t>(fields + 3 - start);
+  h->fields = fields;
+  return true;
+}
 
-  const uint64_t block_start = position + static_cast<uint64_t>(at - start);
-  const auto data = static_cast<int32_t>(size - 3 - track_length);
-  int64_t* sizes = nullptr;
-  if (track == own_track) {
-    // The parser's table of one frame; without it the parser tries again and reports the failure.
-    sizes = static_cast<int64_t*>(mem_alloc_zeroed(sizeof(int64_t)));
-    if (!sizes) return false;
-    sizes[0] = data;
-  }
-  if (id == cluster_id::kBlockGroup) {
-    const uint64_t group_start = position + 1 + static_cast<uint64_t>(std::countl_zero(start[1]) + 1);
+inline int32_t data_size(const block_header_view& h) { return static_cast<int32_t>(h.size - 3 - h.track_length); }
+
+// The record as the parser leaves it after the header `h` read at file
+// offset `position`, with `sizes` as its frame table.
+[[gnu::always_inline]] inline void store_header(mkvcluster* cluster, const block_header_view& h, uint64_t position,
+                                                int64_t* sizes) {
+  mkv_cluster_resume& resume = cluster->resume;
+  const int32_t data = data_size(h);
+  const uint64_t block_start = position + h.block_offset;
+  if (h.id == cluster_id::kBlockGroup) {
+    const uint64_t group_start = position + h.group_offset;
     cluster->in_blockgroup = 1;
-    cluster->blockgroup_size = group_size;
+    cluster->blockgroup_size = h.group_size;
     cluster->blockgroup_start = group_start;
-    cluster->blockgroup_end = element_end(group_start, group_size);
+    cluster->blockgroup_end = element_end(group_start, h.group_size);
     cluster->block_duration = 0;
     cluster->reference_priority = 0;
     cluster->reference_block = 0;
@@ -116,22 +136,92 @@ bool take_one(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track, bool*
   cluster->frame_sizes = sizes;
   cluster->frame_count = 1;
   cluster->block_start = block_start;
-  cluster->block_end = element_end(block_start, size);
-  cluster->track_number = track;
-  cluster->block_timecode = static_cast<int16_t>(static_cast<uint16_t>(fields[0] << 8 | fields[1]));
-  cluster->block_flags = flags;
+  cluster->block_end = element_end(block_start, h.size);
+  cluster->track_number = h.track;
+  cluster->block_timecode = static_cast<int16_t>(static_cast<uint16_t>(h.fields[0] << 8 | h.fields[1]));
+  cluster->block_flags = h.fields[2];
   cluster->block_data_left = data;
   resume.header_part = 0;
   resume.number = {};
   resume.data_left = data;
   resume.lace_count = 1;
   resume.lace_sizes[0] = data;
+}
 
-  const auto consumed = static_cast<uint32_t>(fields + 3 - start);
-  inbuff1->buff_pos += consumed;
-  inbuff1->buff_left -= consumed;
+// One header at inbuff1's read position, or false with nothing consumed.
+// Other tracks' headers are taken whatever the allocator says; the own
+// track's needs its one-entry table.
+bool take_one(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track, bool* own, int32_t* data_left) {
+  if (cluster->resume.step != mkv_resume_step::none) return false;
+  if (cluster->in_blockgroup && !finish_group_values(inbuff1, cluster)) return false;
+  if (inbuff1->buff_left < kLongestHeader) return false;
+  const uint8_t* const start = inbuff1->buff + inbuff1->buff_pos;
+  const uint64_t position = inbuff1->buff_fileoff + inbuff1->buff_pos;
+  if (position >= cluster->cluster_end) return false;
+  block_header_view h;
+  if (!decode_header(start, &h)) return false;
+  const int32_t data = data_size(h);
+  int64_t* sizes = nullptr;
+  if (h.track == own_track) {
+    // The parser's table of one frame; without it the parser tries again and reports the failure.
+    sizes = static_cast<int64_t*>(mem_alloc_zeroed(sizeof(int64_t)));
+    if (!sizes) return false;
+    sizes[0] = data;
+  }
+  store_header(cluster, h, position, sizes);
+  inbuff1->buff_pos += h.header_length;
+  inbuff1->buff_left -= h.header_length;
   *own = sizes != nullptr;
   *data_left = data;
+  return true;
+}
+
+// Other tracks' SimpleBlocks lying whole in inbuff1 with a one-byte track
+// number (as good as all of them), passed over by their headers alone: each
+// would leave the record as the next overwrites it, so only the last one's
+// header is kept, in *last with its file offset, for the record. True when
+// any was passed over. The checks are decode_header's; a block's header and
+// data together are its ID, size field and size.
+bool pass_other_simple_blocks(mkvinbuff* inbuff1, const mkvcluster* cluster, uint64_t own_track,
+                              block_header_view* last, uint64_t* last_position) {
+  if (cluster->resume.step != mkv_resume_step::none || cluster->in_blockgroup) return false;
+  if (inbuff1->buff_left < kLongestHeader) return false;
+  const uint8_t* const buff = inbuff1->buff;
+  const uint32_t first_pos = inbuff1->buff_pos;
+  const uint32_t total = first_pos + inbuff1->buff_left;
+  const uint64_t fileoff = inbuff1->buff_fileoff;
+  // Headers start before both the last kLongestHeader bytes and the Cluster's end.
+  const uint64_t cluster_left = cluster->cluster_end > fileoff ? cluster->cluster_end - fileoff : 0;
+  const auto stop = static_cast<uint32_t>(std::min<uint64_t>(total - kLongestHeader + 1, cluster_left));
+  // The own track's number as a one-byte field, or 0, which no such field is.
+  const uint8_t own_field = own_track < 0x80 ? static_cast<uint8_t>(0x80 | own_track) : 0;
+  uint32_t pos = first_pos, last_pos = 0, last_length = 0;
+  uint64_t last_size = 0;
+  while (pos < stop) {
+    const uint8_t* const at = buff + pos;
+    if (at[0] != cluster_id::kSimpleBlock) break;
+    uint64_t size = 0;
+    const uint32_t length = read_vint(at + 1, &size);
+    const uint8_t track = at[1 + length];
+    // A size from 4 (track, timecode, flags) to kLargestExactSize, in one comparison.
+    if (!length || track < 0x80 || track == own_field || (at[1 + length + 3] & kLacingBits) != 0 ||
+        size - 4 > kLargestExactSize - 4) {
+      break;
+    }
+    const uint64_t whole = 1 + length + size;
+    if (whole > total - pos) break;
+    last_pos = pos;
+    last_length = length;
+    last_size = size;
+    pos += static_cast<uint32_t>(whole);
+  }
+  if (pos == first_pos) return false;
+  const uint8_t* const at = buff + last_pos;
+  *last = block_header_view{cluster_id::kSimpleBlock, last_size, 0, at[1 + last_length] & 0x7Fu, 1, 0,
+                            1 + last_length, 1 + last_length + 1 + 3, at + 1 + last_length + 1};
+  *last_position = fileoff + last_pos;
+  inbuff1->buff_pos = pos;
+  inbuff1->buff_left = total - pos;
   return true;
 }
 
@@ -140,14 +230,24 @@ bool take_one(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track, bool*
 // Other tracks' blocks whose data lies whole in inbuff1 are passed over here
 // one after another, as the caller would skip each; the run ends with the
 // first block that is the channel's own, is cut by the end of inbuff1, or
-// needs the parser.
+// needs the parser. The record is written for the last block taken only: a
+// header taken after a run of passed SimpleBlocks writes every field their
+// record would (and take_one reads none that it would change).
 unlaced_block_result take_unlaced_block(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track,
                                         uint64_t* data_left) {
   auto result = unlaced_block_result::parse;
   *data_left = 0;
   bool own = false;
   int32_t data = 0;
-  while (take_one(inbuff1, cluster, own_track, &own, &data)) {
+  block_header_view passed;
+  uint64_t passed_position = 0;
+  for (;;) {
+    const bool any = pass_other_simple_blocks(inbuff1, cluster, own_track, &passed, &passed_position);
+    if (any) result = unlaced_block_result::other_track;
+    if (!take_one(inbuff1, cluster, own_track, &own, &data)) {
+      if (any) store_header(cluster, passed, passed_position, nullptr);
+      break;
+    }
     if (own) return unlaced_block_result::own_track;
     result = unlaced_block_result::other_track;
     if (static_cast<uint32_t>(data) > inbuff1->buff_left) {
