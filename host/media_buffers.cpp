@@ -3,6 +3,8 @@
 // or the element is replaced.
 
 #include <condition_variable>
+#include <cstdlib>
+#include <memory>
 #include <mutex>
 #include <type_traits>
 #include <vector>
@@ -14,8 +16,13 @@
 namespace {
 
 using Element = host::MraElement;
+static_assert(std::is_trivial_v<Element>, "elements start as calloc's zero bytes");
 
 struct MraPoolState;
+
+struct FreeDeleter {
+  void operator()(void* block) const { std::free(block); }
+};
 
 // The framework record comes first so that a media buffer is the record's address.
 struct HostMra {
@@ -30,7 +37,8 @@ struct MraPoolState {
   std::mutex mutex;
   std::condition_variable returned;
   std::vector<HostMra> mras;
-  std::vector<Element> elements;
+  // Zeroed by calloc: a large pool costs no time or memory until its buffers fill.
+  std::unique_ptr<Element[], FreeDeleter> elements;
   std::vector<HostMra*> free;
   uint32_t in_use = 0;
   bool closed = false;  // freed by its owner; deleted with the last media buffer
@@ -73,9 +81,12 @@ namespace host {
 
 MmfMraPool* MakeMraPool(uint32_t count, uint32_t capacity) {
   if (count == 0 || capacity == 0) return nullptr;
+  const size_t element_count = static_cast<size_t>(count) * capacity;
+  auto* elements = static_cast<Element*>(std::calloc(element_count, sizeof(Element)));
+  if (!elements) return nullptr;
   auto* state = new MraPoolState;
+  state->elements.reset(elements);
   state->mras.resize(count);
-  state->elements.resize(static_cast<size_t>(count) * capacity);
   for (uint32_t i = 0; i < count; ++i) {
     HostMra& mra = state->mras[i];
     mra.record.Capacity = capacity;
