@@ -2,31 +2,58 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <cstring>
 
 #include "host/input_streams.h"
 
 namespace host {
 namespace {
 
+// The header parse asks for a few hundred bytes at a time: each read() below
+// takes at least this much, and small reads are served from it. Reads at least
+// half this size go straight to the file while nothing is held, so playback's
+// input buffers are not copied twice.
+constexpr uint64_t kReadAhead = 64 * 1024;
+
 class FileInputStream final : public InputStream {
  public:
   FileInputStream(const std::string& path, int fd, bool seekable, bool owns)
-      : InputStream(path, seekable), fd_(fd), owns_(owns) {}
+      : InputStream(path, seekable), fd_(fd), owns_(owns), offset_known_(owns) {}
   ~FileInputStream() override {
     if (owns_) close(fd_);
   }
 
  protected:
   int64_t SourceRead(void* buffer, uint64_t count) override {
-    for (;;) {
-      ssize_t got = read(fd_, buffer, count);
-      if (got >= 0) return got;
-      if (errno != EINTR) return -1;
+    if (held_ == end_) {
+      if (count >= kReadAhead / 2) return ReadFile(buffer, count);
+      if (!ahead_) ahead_ = std::make_unique<uint8_t[]>(kReadAhead);
+      int64_t got = ReadFile(ahead_.get(), kReadAhead);
+      if (got <= 0) return got;
+      held_ = 0;
+      end_ = static_cast<uint64_t>(got);
     }
+    const uint64_t taken = std::min(count, end_ - held_);
+    std::memcpy(buffer, ahead_.get() + held_, static_cast<size_t>(taken));
+    held_ += taken;
+    return static_cast<int64_t>(taken);
   }
   bool SourceSeek(uint64_t offset) override {
-    return lseek(fd_, static_cast<off_t>(offset), SEEK_SET) == static_cast<off_t>(offset);
+    // A seek within what is held moves in memory: the header parse jumps about a few KB at a time.
+    if (offset_known_ && offset <= file_offset_ && file_offset_ - offset <= end_) {
+      held_ = end_ - (file_offset_ - offset);
+      return true;
+    }
+    held_ = end_ = 0;
+    if (lseek(fd_, static_cast<off_t>(offset), SEEK_SET) != static_cast<off_t>(offset)) {
+      offset_known_ = false;
+      return false;
+    }
+    file_offset_ = offset;
+    offset_known_ = true;
+    return true;
   }
   uint64_t SourceLength() override {
     struct stat st;
@@ -34,8 +61,24 @@ class FileInputStream final : public InputStream {
   }
 
  private:
+  int64_t ReadFile(void* buffer, uint64_t count) {
+    for (;;) {
+      ssize_t got = read(fd_, buffer, count);
+      if (got >= 0) {
+        file_offset_ += static_cast<uint64_t>(got);
+        return got;
+      }
+      if (errno != EINTR) return -1;
+    }
+  }
+
   int fd_;
   bool owns_;
+  bool offset_known_;          // file_offset_ is the descriptor's offset (not so for an inherited one)
+  uint64_t file_offset_ = 0;   // the descriptor's offset: that of ahead_[end_]
+  std::unique_ptr<uint8_t[]> ahead_;
+  uint64_t held_ = 0;          // next byte of ahead_ to deliver
+  uint64_t end_ = 0;           // bytes in ahead_
 };
 
 }  // namespace

@@ -58,6 +58,11 @@ TEST(HostInputStreamTest, PeekReadSeekAndLengthFollowTheKind) {
       EXPECT_EQ(ops->Read(handle, read.data(), read.size()), seekable ? 4999 : 8999);
       EXPECT_EQ(ops->Read(handle, read.data(), read.size()), 0);
       EXPECT_EQ(ops->Peek(handle, read.data(), 10), 0);
+      if (seekable) {  // back into bytes already read
+        EXPECT_EQ(ops->Seek(handle, 3, 0), 3);
+        ASSERT_EQ(ops->Read(handle, read.data(), 2), 2);
+        EXPECT_EQ(Slice(read, 0, 2), Slice(bytes, 3, 2));
+      }
     }
   }
   std::remove(path);
