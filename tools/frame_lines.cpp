@@ -88,7 +88,10 @@ void FrameLines::Add(int32_t index, const host::RunFrame& frame) {
   Channel& channel = channels_[static_cast<size_t>(index)];
   if (channel.used + kLongestLine > channel.capacity) Spill(channel);
   char* out = channel.block.get() + channel.used;
-  std::memcpy(out, channel.prefix, channel.prefix_length);
+  // The whole prefix array, a fixed size the compiler copies inline; the line
+  // goes on over its unused end.
+  static_assert(sizeof channel.prefix <= kLongestLine);
+  std::memcpy(out, channel.prefix, sizeof channel.prefix);
   out = Decimal(out + channel.prefix_length, frame.time_us);
   *out++ = ' ';
   out = Decimal(out, frame.size);
