@@ -120,5 +120,5 @@ fi
 # Rating of a.mkv in-process: bytes read and time.
 if [[ -x $rating_bench ]]; then
   KELVANE_PLUGIN=$(dirname "$kelvane")/kelvane.so KELVANE_RATING_FILE=$data/a.mkv "$rating_bench" \
-    --benchmark_min_time=0.2 2>/dev/null | grep -E "^Rat"
+    --benchmark_min_time=0.2 2>/dev/null | grep -E "^BM_Rating"
 fi
