@@ -172,6 +172,34 @@ uint64_t LastTime(MmfMra* mra) {
 
 // One channel pulled on the calling thread, the commands done between pulls:
 // the same input always takes the same path.
+// The commands both modes send the same way: seeks, pauses and scans through
+// the playback controller. False for the ones each mode does its own way.
+bool ApplyControlCommand(host::PlaybackControl& playback, const Command& command) {
+  switch (command.kind) {
+    case Command::kSeek:
+      Check(SpecifiedSeek(playback.Seek(command.time_us)), "seek");
+      break;
+    case Command::kPause:
+      Check(SpecifiedControl(playback.Pause()), "pause");
+      break;
+    case Command::kResume:
+      Check(SpecifiedControl(playback.Resume()), "resume");
+      break;
+    case Command::kScanForward:
+      Check(SpecifiedScan(playback.ScanForward(command.speed)), "scan forward");
+      break;
+    case Command::kScanBackward:
+      Check(SpecifiedScan(playback.ScanBackward(command.speed)), "scan backward");
+      break;
+    case Command::kScanEnd:
+      Check(SpecifiedScan(playback.ScanEnd()), "scan end");
+      break;
+    default:
+      return false;
+  }
+  return true;
+}
+
 void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
   auto rating_stream = host::MakeMemoryStream(file, size, true, "fuzz");
   auto source = host::MakeMemoryStream(file, size, true, "fuzz");
@@ -235,25 +263,8 @@ void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
       }
     };
     for (const Command& command : header.commands) {
+      if (ApplyControlCommand(playback, command)) continue;
       switch (command.kind) {
-        case Command::kSeek:
-          Check(SpecifiedSeek(playback.Seek(command.time_us)), "seek");
-          break;
-        case Command::kPause:
-          Check(SpecifiedControl(playback.Pause()), "pause");
-          break;
-        case Command::kResume:
-          Check(SpecifiedControl(playback.Resume()), "resume");
-          break;
-        case Command::kScanForward:
-          Check(SpecifiedScan(playback.ScanForward(command.speed)), "scan forward");
-          break;
-        case Command::kScanBackward:
-          Check(SpecifiedScan(playback.ScanBackward(command.speed)), "scan backward");
-          break;
-        case Command::kScanEnd:
-          Check(SpecifiedScan(playback.ScanEnd()), "scan end");
-          break;
         case Command::kFlush:
           Check(flush->Flush(handle) == kMmfOk, "flush");
           break;
@@ -262,6 +273,8 @@ void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
           break;
         case Command::kWait:
           pull(command.amount);
+          break;
+        default:
           break;
       }
     }
@@ -302,27 +315,11 @@ void PlayThreaded(const uint8_t* file, size_t size, const Header& header) {
     options.channels.push_back(static_cast<int32_t>(k));
     options.sink_delay_us.push_back(static_cast<uint32_t>(k) * 50);
   }
-  std::vector<int> answers;
   if (!header.commands.empty()) {
     options.script = [&](host::PlaybackControl& playback) {
       for (const Command& command : header.commands) {
+        if (ApplyControlCommand(playback, command)) continue;
         switch (command.kind) {
-          case Command::kSeek:
-            Check(SpecifiedSeek(playback.Seek(command.time_us)), "seek");
-            break;
-          case Command::kPause:
-            Check(SpecifiedControl(playback.Pause()), "pause");
-            break;
-          case Command::kResume:
-            Check(SpecifiedControl(playback.Resume()), "resume");
-            break;
-          case Command::kScanForward:
-            Check(SpecifiedScan(playback.ScanForward(command.speed)), "scan forward");
-            break;
-          case Command::kScanBackward:
-            Check(SpecifiedScan(playback.ScanBackward(command.speed)), "scan backward");
-            break;
-          case Command::kScanEnd:
           case Command::kFlush:  // a flush happens only inside a sequence on a running graph
             Check(SpecifiedScan(playback.ScanEnd()), "scan end");
             break;
@@ -332,6 +329,8 @@ void PlayThreaded(const uint8_t* file, size_t size, const Header& header) {
           case Command::kStop:
             Check(SpecifiedControl(playback.Stop()), "stop");
             return;  // stopped sinks end; no sequence may follow
+          default:
+            break;
         }
       }
     };
