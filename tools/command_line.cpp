@@ -77,3 +77,10 @@ std::unique_ptr<host::Plugin> LoadPlugin(const char* command, const std::string&
   if (!plugin) Failure(command, "cannot load the plug-in %s: %s", path.c_str(), error.c_str());
   return plugin;
 }
+
+int TakeFile(const char* command, const char* arg, const char** file) {
+  if (arg[0] == '-' && arg[1]) return UsageError(command, "unknown option '%s'", arg);
+  if (*file) return UsageError(command, "one FILE only ('%s' and '%s' given)", *file, arg);
+  *file = arg;
+  return kExitOk;
+}

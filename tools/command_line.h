@@ -34,6 +34,10 @@ constexpr int kAcceptedRating = 80;
 // "FILE: the plug-in refused it: rating N (a Matroska file it can play rates 80)".
 int RefusedFile(const char* command, const char* path, int rating);
 
+// Takes `arg` as the command's one FILE ("-" for standard input), or reports
+// an unknown option or a second FILE; answers kExitOk or kExitUsage.
+int TakeFile(const char* command, const char* arg, const char** file);
+
 // Parses a non-negative decimal number no greater than `maximum`; false for anything else.
 bool ParseNumber(const char* text, unsigned long maximum, unsigned long* value);
 

@@ -118,12 +118,8 @@ int ParseOptions(int argc, char** argv, Options* options) {
       options->buffer_size = static_cast<uint32_t>(size);
     } else if (!std::strcmp(arg, "-q") || !std::strcmp(arg, "--quiet")) {
       options->quiet = true;
-    } else if (arg[0] == '-' && arg[1]) {
-      return UsageError(kCommand, "unknown option '%s'", arg);
-    } else if (options->file) {
-      return UsageError(kCommand, "one FILE only ('%s' and '%s')", options->file, arg);
-    } else {
-      options->file = arg;
+    } else if (int code = TakeFile(kCommand, arg, &options->file); code != kExitOk) {
+      return code;
     }
   }
   if (!options->file) return UsageError(kCommand, "no FILE given");

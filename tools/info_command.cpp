@@ -341,12 +341,8 @@ int RunInfo(int argc, char** argv) {
     if (IsHelpOption(arg)) return PrintHelp(kInfoHelp);
     if (!std::strcmp(arg, "--json")) {
       json = true;
-    } else if (arg[0] == '-' && arg[1]) {
-      return UsageError("info", "unknown option '%s'", arg);
-    } else if (file) {
-      return UsageError("info", "one FILE only ('%s' and '%s' given)", file, arg);
-    } else {
-      file = arg;
+    } else if (int code = TakeFile("info", arg, &file); code != kExitOk) {
+      return code;
     }
   }
   if (!file) return UsageError("info", "no FILE given");

@@ -157,12 +157,8 @@ int RunMetadata(int argc, char** argv) {
       json = true;
     } else if (!std::strcmp(arg, "-")) {
       return UsageError("metadata", "FILE cannot be standard input: the plug-in seeks back to its start");
-    } else if (arg[0] == '-') {
-      return UsageError("metadata", "unknown option '%s'", arg);
-    } else if (file) {
-      return UsageError("metadata", "one FILE only ('%s' and '%s' given)", file, arg);
-    } else {
-      file = arg;
+    } else if (int code = TakeFile("metadata", arg, &file); code != kExitOk) {
+      return code;
     }
   }
   if (!file) return UsageError("metadata", "no FILE given");

@@ -132,12 +132,8 @@ int ParseOptions(int argc, char** argv, Options* options) {
       options->plugin_path = argv[++i];
     } else if (!std::strcmp(arg, "-")) {
       return UsageError("packets", "FILE cannot be standard input: playback reads the file twice");
-    } else if (arg[0] == '-') {
-      return UsageError("packets", "unknown option '%s'", arg);
-    } else if (options->file) {
-      return UsageError("packets", "one FILE only ('%s' and '%s' given)", options->file, arg);
-    } else {
-      options->file = arg;
+    } else if (int code = TakeFile("packets", arg, &options->file); code != kExitOk) {
+      return code;
     }
   }
   if (!options->file) return UsageError("packets", "no FILE given");

@@ -208,12 +208,8 @@ int RunProbe(int argc, char** argv) {
       plugin_path = argv[++i];
     } else if (!std::strcmp(arg, "--json")) {
       json = true;
-    } else if (arg[0] == '-' && arg[1]) {
-      return UsageError("probe", "unknown option '%s'", arg);
-    } else if (file) {
-      return UsageError("probe", "one FILE only ('%s' and '%s' given)", file, arg);
-    } else {
-      file = arg;
+    } else if (int code = TakeFile("probe", arg, &file); code != kExitOk) {
+      return code;
     }
   }
   if (!file) return UsageError("probe", "no FILE given");
