@@ -12,19 +12,9 @@
 #include "filter/mkv_filter.h"
 #include "host/graph_setup.h"
 #include "host/input_streams.h"
-#include "host/plugin_loader.h"
+#include "tests/support/plugin_under_test.h"
 
 namespace plugin_test {
-
-inline const host::Plugin& HostPlugin() {
-  static const std::unique_ptr<host::Plugin> plugin = [] {
-    std::string error;
-    auto loaded = host::Plugin::Load(KELVANE_PLUGIN_PATH, &error);
-    if (!loaded) ADD_FAILURE() << error;
-    return loaded;
-  }();
-  return *plugin;
-}
 
 inline std::string FixtureFile(const std::string& name) {
   return std::string(KELVANE_FIXTURE_DIR) + "/" + name + ".mkv";

@@ -23,10 +23,10 @@
 #include "host/graph_runner.h"
 #include "host/heap_control.h"
 #include "host/log_control.h"
-#include "host/plugin_loader.h"
 #include "tests/support/block_builder.h"
 #include "tests/support/ebml_builder.h"
 #include "tests/support/header_parse.h"
+#include "tests/support/plugin_under_test.h"
 
 namespace {
 
@@ -36,14 +36,8 @@ constexpr uint64_t k2To32 = uint64_t{1} << 32;
 constexpr uint32_t kSomeUnknownId = 0x4FAB;  // a two-byte ID Matroska does not define
 
 const host::Plugin& HostPlugin() {
-  static const std::unique_ptr<host::Plugin> plugin = [] {
-    host::SetLogThreshold(0);  // the damaged files' complaints are expected
-    std::string error;
-    auto loaded = host::Plugin::Load(KELVANE_PLUGIN_PATH, &error);
-    if (!loaded) ADD_FAILURE() << error;
-    return loaded;
-  }();
-  return *plugin;
+  host::SetLogThreshold(0);  // the damaged files' complaints are expected
+  return plugin_test::HostPlugin();
 }
 
 // ---- The undamaged file: one MP3 track, two Clusters, three frames, Cues, Tags.

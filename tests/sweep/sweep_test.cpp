@@ -27,20 +27,14 @@
 #include "host/graph_runner.h"
 #include "host/heap_control.h"
 #include "host/log_control.h"
-#include "host/plugin_loader.h"
 #include "tests/support/fixtures.h"
+#include "tests/support/plugin_under_test.h"
 
 namespace {
 
 const host::Plugin& HostPlugin() {
-  static const std::unique_ptr<host::Plugin> plugin = [] {
-    host::SetLogThreshold(0);  // the damaged files' complaints are expected
-    std::string error;
-    auto loaded = host::Plugin::Load(KELVANE_PLUGIN_PATH, &error);
-    if (!loaded) ADD_FAILURE() << error;
-    return loaded;
-  }();
-  return *plugin;
+  host::SetLogThreshold(0);  // the damaged files' complaints are expected
+  return plugin_test::HostPlugin();
 }
 
 bool Quick() {
