@@ -4,14 +4,7 @@
 # parsed by a strict JSON reader, including a file name full of quotes,
 # backslashes, control characters and bytes that are not UTF-8.
 #   check_cli.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
-set -uo pipefail
-source_dir=$1
-shift
-kelvane=("$@")
-fixtures=$source_dir/tests/fixtures
-
-failures=0
-fail() { echo "FAIL $*"; failures=$((failures + 1)); }
+source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 
 work=$(mktemp -d)
 trap 'rm -rf "$work"' EXIT

@@ -14,16 +14,10 @@
 # places it, with ffmpeg's packets of the track (-c copy). ffmpeg is required:
 # without it the check fails.
 #   check_extract.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
-set -uo pipefail
-source_dir=$1
-shift
-kelvane=("$@")
-fixtures=$source_dir/tests/fixtures
+source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 work=$(mktemp -d)
 trap 'rm -rf "$work"' EXIT
 
-failures=0
-fail() { echo "FAIL $*"; failures=$((failures + 1)); }
 command -v ffmpeg >/dev/null || { echo "FAIL ffmpeg is missing (scripts/install-deps.sh test installs it)"; exit 1; }
 
 ff() { ffmpeg -nostdin -v error "$@"; }

@@ -3,12 +3,8 @@
 # what it prints with the values mkvinfo reported for the same files
 # (NAME.expected, written when the files were made).
 #   check_info.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
-set -uo pipefail
-source_dir=$1
-shift
-kelvane=("$@")
+source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 
-failures=0
 checked=0
 expect() {  # file, label, expected, actual
   if [[ "$3" != "$4" ]]; then

@@ -2,13 +2,8 @@
 # Runs `kelvane metadata` (which loads kelvane.so) on fixtures and compares
 # the entries it prints with the tags and tracks recorded in NAME.expected.
 #   check_metadata.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
-set -uo pipefail
-source_dir=$1
-shift
-kelvane=("$@")
-fixtures=$source_dir/tests/fixtures
+source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 
-failures=0
 expect() {  # what, expected, actual
   if [[ "$2" != "$3" ]]; then
     echo "FAIL $1: expected '$2', kelvane metadata printed '$3'"

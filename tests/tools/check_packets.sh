@@ -3,14 +3,7 @@
 # compares the frames it prints with NAME.blocks: per track, in file order,
 # time = ticks × (timecode_scale / 1000) microseconds, size and Adler-32.
 #   check_packets.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
-set -uo pipefail
-source_dir=$1
-shift
-kelvane=("$@")
-fixtures=$source_dir/tests/fixtures
-
-failures=0
-fail() { echo "FAIL $*"; failures=$((failures + 1)); }
+source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 
 # track time size adler, grouped by track in file order, for the tracks in $2.
 expected() {  # name tracks

@@ -5,14 +5,7 @@
 # forward delivers only the first TrickTime after cue points; a file without
 # Cues refuses a seek to 5 s; malformed values are usage errors.
 #   check_packets_control.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
-set -uo pipefail
-source_dir=$1
-shift
-kelvane=("$@")
-fixtures=$source_dir/tests/fixtures
-
-failures=0
-fail() { echo "FAIL $*"; failures=$((failures + 1)); }
+source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 
 # long_cues: TimecodeScale 1 ms, every cue point names track 1.
 cue_times=$(awk '{ print $1 * 1000 }' "$fixtures/long_cues.cues" | sort -un)

@@ -4,13 +4,8 @@
 # recorded in NAME.expected; then probes a fixture through a pipe, which must
 # rate the same through an input that cannot seek.
 #   check_probe.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
-set -uo pipefail
-source_dir=$1
-shift
-kelvane=("$@")
-fixtures=$source_dir/tests/fixtures
+source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 
-failures=0
 expect() {  # what, expected, actual
   if [[ "$2" != "$3" ]]; then
     echo "FAIL $1: expected '$2', kelvane probe printed '$3'"

@@ -4,16 +4,11 @@
 # time left) must appear there, and must not when standard error is a pipe
 # or a file, or with --quiet.
 #   check_progress_tty.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
-set -uo pipefail
-source_dir=$1
-shift
-kelvane=("$@")
+source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 file=$source_dir/tests/fixtures/long_cues.mkv
 work=$(mktemp -d)
 trap 'rm -rf "$work"' EXIT
 
-failures=0
-fail() { echo "FAIL $*"; failures=$((failures + 1)); }
 command -v script >/dev/null || { echo "FAIL script(1) from util-linux is missing"; exit 1; }
 
 # The final state of the bar, as the terminal shows it once the run is over.
