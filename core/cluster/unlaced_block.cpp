@@ -19,8 +19,18 @@ constexpr uint32_t kLongestHeader = 1 + 8 + 1 + 8 + 8 + 3;
 
 // A size or track number at `at` (marker removed): its length, or 0 when
 // invalid. Reads the 8 bytes from `at` whatever the length: the callers have
-// kLongestHeader bytes in front of them.
+// kLongestHeader bytes in front of them. Nearly every field is one or two
+// bytes long, and those are read without the variable shifts of the rest.
 [[gnu::always_inline]] inline uint32_t read_vint(const uint8_t* at, uint64_t* value) {
+  const uint8_t first = at[0];
+  if (first & 0x80) {
+    *value = first & 0x7Fu;
+    return 1;
+  }
+  if (first & 0x40) {
+    *value = (first & 0x3Fu) << 8 | at[1];
+    return 2;
+  }
   uint64_t word;
   std::memcpy(&word, at, sizeof word);
   if constexpr (std::endian::native == std::endian::little) word = __builtin_bswap64(word);
@@ -176,14 +186,53 @@ bool take_one(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track, bool*
   return true;
 }
 
+// ID, two-byte size and one-byte track number of the SimpleBlock at `at`,
+// big-endian in one word; masked with kCommonMask it equals kCommonHeader.
+// Most blocks are from 127 bytes to 16 KiB and of one of the first 127 tracks.
+constexpr uint32_t kCommonMask = 0xFFC00080u;
+constexpr uint32_t kCommonHeader = uint32_t{cluster_id::kSimpleBlock} << 24 | 0x00400080u;
+
+[[gnu::always_inline]] inline uint32_t header_word(const uint8_t* at) {
+  uint32_t word;
+  std::memcpy(&word, at, sizeof word);
+  if constexpr (std::endian::native == std::endian::little) word = __builtin_bswap32(word);
+  return word;
+}
+
+// An unlaced SimpleBlock of the common kind, of at least 4 bytes (track, timecode, flags).
+[[gnu::always_inline]] inline bool is_common_block(const uint8_t* at, uint32_t word) {
+  return (word & kCommonMask) == kCommonHeader && (at[6] & kLacingBits) == 0 && (word >> 8 & 0x3FFFu) >= 4;
+}
+
+// Other tracks' blocks of the common kind from `pos`, each whole before
+// `total`, starting before `stop`: returns where the run ends; *last_pos is
+// the start of the last block passed (unchanged when none was). Kept apart
+// from its caller so that its few values stay in registers.
+inline uint32_t pass_common_run(const uint8_t* buff, uint32_t pos, uint32_t stop, uint32_t total,
+                                           uint32_t own_field, uint32_t* last_pos) {
+  uint32_t last = *last_pos;
+  while (pos < stop) {
+    const uint8_t* const at = buff + pos;
+    const uint32_t word = header_word(at);
+    const uint32_t size = word >> 8 & 0x3FFFu;
+    if (!is_common_block(at, word) || (word & 0xFFu) == own_field || size + 3 > total - pos) break;
+    last = pos;
+    pos += size + 3;
+  }
+  *last_pos = last;
+  return pos;
+}
+
 // Other tracks' SimpleBlocks lying whole in inbuff1 with a one-byte track
 // number (as good as all of them), passed over by their headers alone: each
 // would leave the record as the next overwrites it, so only the last one's
 // header is kept, in *last with its file offset, for the record. True when
-// any was passed over. The checks are decode_header's; a block's header and
-// data together are its ID, size field and size.
+// any was passed over. A run that ends at one of the channel's own blocks of
+// the common kind leaves it in *own_block, at the new read position. The
+// checks are decode_header's; a block's header and data together are its ID,
+// size field and size.
 bool pass_other_simple_blocks(mkvinbuff* inbuff1, const mkvcluster* cluster, uint64_t own_track,
-                              block_header_view* last, uint64_t* last_position) {
+                              block_header_view* last, uint64_t* last_position, const uint8_t** own_block) {
   if (cluster->resume.step != mkv_resume_step::none || cluster->in_blockgroup) return false;
   if (inbuff1->buff_left < kLongestHeader) return false;
   const uint8_t* const buff = inbuff1->buff;
@@ -195,10 +244,17 @@ bool pass_other_simple_blocks(mkvinbuff* inbuff1, const mkvcluster* cluster, uin
   const auto stop = static_cast<uint32_t>(std::min<uint64_t>(total - kLongestHeader + 1, cluster_left));
   // The own track's number as a one-byte field, or 0, which no such field is.
   const uint8_t own_field = own_track < 0x80 ? static_cast<uint8_t>(0x80 | own_track) : 0;
-  uint32_t pos = first_pos, last_pos = 0, last_length = 0;
-  uint64_t last_size = 0;
+  uint32_t pos = first_pos, last_pos = 0;
   while (pos < stop) {
+    pos = pass_common_run(buff, pos, stop, total, own_field, &last_pos);
+    if (pos >= stop) break;
     const uint8_t* const at = buff + pos;
+    const uint32_t word = header_word(at);
+    if (is_common_block(at, word)) {
+      if ((word & 0xFFu) == own_field) *own_block = at;
+      break;  // the channel's own, or cut by the end of inbuff1
+    }
+    // Any other unlaced SimpleBlock of another track, one at a time.
     if (at[0] != cluster_id::kSimpleBlock) break;
     uint64_t size = 0;
     const uint32_t length = read_vint(at + 1, &size);
@@ -211,17 +267,32 @@ bool pass_other_simple_blocks(mkvinbuff* inbuff1, const mkvcluster* cluster, uin
     const uint64_t whole = 1 + length + size;
     if (whole > total - pos) break;
     last_pos = pos;
-    last_length = length;
-    last_size = size;
     pos += static_cast<uint32_t>(whole);
   }
   if (pos == first_pos) return false;
   const uint8_t* const at = buff + last_pos;
+  uint64_t last_size = 0;
+  const uint32_t last_length = read_vint(at + 1, &last_size);
   *last = block_header_view{cluster_id::kSimpleBlock, last_size, 0, at[1 + last_length] & 0x7Fu, 1, 0,
                             1 + last_length, 1 + last_length + 1 + 3, at + 1 + last_length + 1};
   *last_position = fileoff + last_pos;
   inbuff1->buff_pos = pos;
   inbuff1->buff_left = total - pos;
+  return true;
+}
+
+// The channel's own SimpleBlock at inbuff1's read position, with a two-byte
+// size and a one-byte track number, as the pass over other blocks found it
+// (unlaced, at least 4 bytes): the record as take_one leaves it.
+bool take_own_simple_block(mkvinbuff* inbuff1, mkvcluster* cluster, const uint8_t* at) {
+  const uint64_t size = (at[1] & 0x3Fu) << 8 | at[2];
+  auto* sizes = static_cast<int64_t*>(mem_alloc_zeroed(sizeof(int64_t)));
+  if (!sizes) return false;
+  const block_header_view h{cluster_id::kSimpleBlock, size, 0, at[3] & 0x7Fu, 1, 0, 3, 7, at + 4};
+  sizes[0] = data_size(h);
+  store_header(cluster, h, inbuff1->buff_fileoff + inbuff1->buff_pos, sizes);
+  inbuff1->buff_pos += h.header_length;
+  inbuff1->buff_left -= h.header_length;
   return true;
 }
 
@@ -242,8 +313,10 @@ unlaced_block_result take_unlaced_block(mkvinbuff* inbuff1, mkvcluster* cluster,
   block_header_view passed;
   uint64_t passed_position = 0;
   for (;;) {
-    const bool any = pass_other_simple_blocks(inbuff1, cluster, own_track, &passed, &passed_position);
+    const uint8_t* own_block = nullptr;
+    const bool any = pass_other_simple_blocks(inbuff1, cluster, own_track, &passed, &passed_position, &own_block);
     if (any) result = unlaced_block_result::other_track;
+    if (own_block && take_own_simple_block(inbuff1, cluster, own_block)) return unlaced_block_result::own_track;
     if (!take_one(inbuff1, cluster, own_track, &own, &data)) {
       if (any) store_header(cluster, passed, passed_position, nullptr);
       break;
