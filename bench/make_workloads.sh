@@ -10,6 +10,8 @@
 #                 lacing (checked below with mkvinfo).
 #   a_groups.mkv  a.mkv remuxed by mkvmerge with BlockGroups only.
 #   a_2min.mkv    the first 2 minutes of a.mkv's recipe, for callgrind.
+#   a_10s.mkv     the first 10 seconds of it: callgrind's count on it is the
+#                 fixed cost (loading, rating, set-up) taken off a_2min's.
 #   a10.mkv       a.mkv appended ten times (mkvmerge +), for peak memory
 #                 against file size; made only with more than 8 GB free.
 #   b.mkv         145 s of 1280x720 intra-only AVC (every frame a key frame of
@@ -38,6 +40,7 @@ make_a() {
 
 make_a 3600 a.mkv
 make_a 120 a_2min.mkv
+make_a 10 a_10s.mkv
 
 if ! made a_laced.mkv; then
   echo "making a_laced.mkv ..."

@@ -40,37 +40,53 @@ constexpr uint32_t kLongestHeader = 1 + 8 + 1 + 8 + 8 + 3;
   return length;
 }
 
+// The longest BlockDuration, ReferencePriority or ReferenceBlock: ID, size, 8 bytes.
+constexpr uint32_t kLongestValue = 1 + 1 + 8;
+
+// Length of the BlockDuration, ReferencePriority or ReferenceBlock at `at`
+// (kLongestValue bytes readable), or 0 for a child of another kind or width.
+[[gnu::always_inline]] inline uint32_t group_value_length(const uint8_t* at) {
+  const uint8_t id = at[0];
+  if (id != cluster_id::kBlockDuration && id != cluster_id::kReferencePriority && id != cluster_id::kReferenceBlock) {
+    return 0;
+  }
+  if ((at[1] & 0x80) == 0 || (at[1] & 0x7F) > 8) return 0;
+  return 2 + (at[1] & 0x7Fu);
+}
+
+// Stores the value at `at`, of a kind group_value_length accepts, as the parser
+// does (ReferenceBlock sign-extended from its width).
+void store_group_value(const uint8_t* at, mkvcluster* cluster) {
+  const uint8_t id = at[0];
+  const uint32_t width = at[1] & 0x7Fu;
+  uint64_t value = 0;
+  for (uint32_t i = 0; i < width; ++i) value = value << 8 | at[2 + i];
+  if (id == cluster_id::kBlockDuration) {
+    cluster->block_duration = value;
+  } else if (id == cluster_id::kReferencePriority) {
+    cluster->reference_priority = value;
+  } else {
+    const unsigned shift = width > 0 && width < 8 ? 64u - 8u * width : 0u;
+    cluster->reference_block = static_cast<int64_t>(value << shift) >> shift;
+  }
+  cluster->resume.id = id;
+}
+
 // BlockDuration, ReferencePriority and ReferenceBlock after a BlockGroup's
-// Block, read in place as the parser reads them (ReferenceBlock sign-extended
-// from its width). True once the read position is past the group; false at a
-// child of another kind or one that does not lie whole in inbuff1, after the
-// values before it: the parser goes on from there.
+// Block, read in place as the parser reads them. True once the read position
+// is past the group; false at a child of another kind or one that does not
+// lie whole in inbuff1, after the values before it: the parser goes on from there.
 bool finish_group_values(mkvinbuff* inbuff1, mkvcluster* cluster) {
-  constexpr uint32_t kLongestValue = 1 + 1 + 8;
   for (;;) {
     const uint64_t position = inbuff1->buff_fileoff + inbuff1->buff_pos;
     if (position >= cluster->blockgroup_end || position >= cluster->cluster_end) return true;
     if (inbuff1->buff_left < kLongestValue) return false;
     const uint8_t* at = inbuff1->buff + inbuff1->buff_pos;
-    const uint8_t id = at[0];
-    if (id != cluster_id::kBlockDuration && id != cluster_id::kReferencePriority && id != cluster_id::kReferenceBlock) {
-      return false;
-    }
-    if ((at[1] & 0x80) == 0 || (at[1] & 0x7F) > 8) return false;
-    const uint32_t width = at[1] & 0x7Fu;
-    uint64_t value = 0;
-    for (uint32_t i = 0; i < width; ++i) value = value << 8 | at[2 + i];
-    if (id == cluster_id::kBlockDuration) {
-      cluster->block_duration = value;
-    } else if (id == cluster_id::kReferencePriority) {
-      cluster->reference_priority = value;
-    } else {
-      const unsigned shift = width > 0 && width < 8 ? 64u - 8u * width : 0u;
-      cluster->reference_block = static_cast<int64_t>(value << shift) >> shift;
-    }
-    cluster->resume.id = id;
-    inbuff1->buff_pos += 2 + width;
-    inbuff1->buff_left -= 2 + width;
+    const uint32_t length = group_value_length(at);
+    if (!length) return false;
+    store_group_value(at, cluster);
+    inbuff1->buff_pos += length;
+    inbuff1->buff_left -= length;
   }
 }
 
@@ -223,17 +239,91 @@ inline uint32_t pass_common_run(const uint8_t* buff, uint32_t pos, uint32_t stop
   return pos;
 }
 
-// Other tracks' SimpleBlocks lying whole in inbuff1 with a one-byte track
-// number (as good as all of them), passed over by their headers alone: each
-// would leave the record as the next overwrites it, so only the last one's
-// header is kept, in *last with its file offset, for the record. True when
-// any was passed over. A run that ends at one of the channel's own blocks of
-// the common kind leaves it in *own_block, at the new read position. The
-// checks are decode_header's; a block's header and data together are its ID,
-// size field and size.
-bool pass_other_simple_blocks(mkvinbuff* inbuff1, const mkvcluster* cluster, uint64_t own_track,
-                              block_header_view* last, uint64_t* last_position, const uint8_t** own_block) {
-  if (cluster->resume.step != mkv_resume_step::none || cluster->in_blockgroup) return false;
+constexpr uint32_t kNoGroup = UINT32_MAX;
+
+// The end (from inbuff1's start) of the BlockGroup at `at`, `pos` bytes into
+// inbuff1, when it can be passed over whole as take_one and
+// finish_group_values would take it: another track's unlaced Block first,
+// then only BlockDuration, ReferencePriority and ReferenceBlock, each with
+// kLongestValue bytes readable, ending exactly at the group's end, all before
+// `total` and the Cluster's end. Else 0.
+uint32_t passable_group_end(const uint8_t* at, uint32_t pos, uint32_t total, uint64_t fileoff, uint64_t cluster_end,
+                            uint64_t own_track) {
+  block_header_view h;
+  if (!decode_header(at, &h) || h.track == own_track) return 0;
+  const uint64_t group_end = uint64_t{pos} + h.group_offset + h.group_size;
+  const uint64_t block_end = uint64_t{pos} + h.block_offset + h.size;
+  if (group_end > total || fileoff + group_end > cluster_end || block_end > group_end) return 0;
+  auto child = static_cast<uint32_t>(block_end);
+  const auto end = static_cast<uint32_t>(group_end);
+  while (child < end) {
+    if (total - child < kLongestValue) return 0;
+    const uint32_t length = group_value_length(at - pos + child);
+    if (!length || length > end - child) return 0;
+    child += length;
+  }
+  return end;
+}
+
+// passable_group_end for the common BlockGroup: two-byte group and Block
+// sizes, a one-byte track number, then the children (most often one
+// ReferenceBlock, or none). 0 when the group is not of that kind or cannot be
+// passed over; kOwnGroup when it is the channel's own.
+constexpr uint32_t kOwnGroup = UINT32_MAX;
+[[gnu::always_inline]] inline uint32_t common_group_end(const uint8_t* at, uint32_t pos, uint32_t total,
+                                                        uint64_t cluster_left, uint32_t own_field) {
+  const uint32_t word = header_word(at);
+  if ((word & 0xFFC000FFu) != (uint32_t{cluster_id::kBlockGroup} << 24 | 0x00400000u | cluster_id::kBlock) ||
+      (at[4] & 0xC0) != 0x40 || (at[6] & 0x80) == 0 || (at[9] & kLacingBits) != 0) {
+    return 0;
+  }
+  const uint32_t block_size = (at[4] & 0x3Fu) << 8 | at[5];
+  if (block_size < 4 || (word >> 8 & 0x3FFFu) == 0) return 0;
+  if (at[6] == own_field) return kOwnGroup;
+  const uint32_t end = pos + 3 + (word >> 8 & 0x3FFFu);
+  uint32_t child = pos + 6 + block_size;
+  if (end > total || end > cluster_left || child > end) return 0;
+  while (child < end) {
+    if (total - child < kLongestValue) return 0;
+    const uint32_t length = group_value_length(at - pos + child);
+    if (!length || length > end - child) return 0;
+    child += length;
+  }
+  return end;
+}
+
+// The record as take_one, skipping the Block's data, and finish_group_values
+// leave it after the group at `at` (file offset `position`) that
+// passable_group_end took.
+void store_passed_group(const uint8_t* at, uint64_t position, mkvcluster* cluster) {
+  block_header_view h{};
+  if (!decode_header(at, &h)) return;  // it did decode when the group was passed
+  store_header(cluster, h, position, nullptr);
+  const uint8_t* child = at + h.block_offset + h.size;
+  const uint8_t* const end = at + h.group_offset + h.group_size;
+  while (child < end) {
+    store_group_value(child, cluster);
+    child += group_value_length(child);
+  }
+}
+
+// Other tracks' blocks lying whole in inbuff1 (SimpleBlocks with a one-byte
+// track number, as good as all of them, and BlockGroups that
+// passable_group_end takes), passed over by their headers alone. Each would
+// leave the record as the next overwrites it, except that a BlockGroup's
+// values stay under the SimpleBlocks after it: the last group's record is
+// written here, and only the last SimpleBlock's header is kept, in *last with
+// its file offset, when *last_is_simple. True when any was passed over. A run
+// that ends at one of the channel's own blocks of the common kind leaves it in
+// *own_block, at the new read position (a BlockGroup whose first bytes are of
+// the common kind counts too). The checks are decode_header's; a block's
+// header and data together are its ID, size field and size.
+bool pass_other_blocks(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track, block_header_view* last,
+                       uint64_t* last_position, bool* last_is_simple, const uint8_t** own_block) {
+  if (cluster->resume.step != mkv_resume_step::none) return false;
+  // Not before the current BlockGroup's values are read (finish_group_values).
+  const uint64_t position = inbuff1->buff_fileoff + inbuff1->buff_pos;
+  if (cluster->in_blockgroup && position < cluster->blockgroup_end && position < cluster->cluster_end) return false;
   if (inbuff1->buff_left < kLongestHeader) return false;
   const uint8_t* const buff = inbuff1->buff;
   const uint32_t first_pos = inbuff1->buff_pos;
@@ -244,7 +334,7 @@ bool pass_other_simple_blocks(mkvinbuff* inbuff1, const mkvcluster* cluster, uin
   const auto stop = static_cast<uint32_t>(std::min<uint64_t>(total - kLongestHeader + 1, cluster_left));
   // The own track's number as a one-byte field, or 0, which no such field is.
   const uint8_t own_field = own_track < 0x80 ? static_cast<uint8_t>(0x80 | own_track) : 0;
-  uint32_t pos = first_pos, last_pos = 0;
+  uint32_t pos = first_pos, last_pos = 0, last_group_pos = kNoGroup;
   while (pos < stop) {
     pos = pass_common_run(buff, pos, stop, total, own_field, &last_pos);
     if (pos >= stop) break;
@@ -253,6 +343,18 @@ bool pass_other_simple_blocks(mkvinbuff* inbuff1, const mkvcluster* cluster, uin
     if (is_common_block(at, word)) {
       if ((word & 0xFFu) == own_field) *own_block = at;
       break;  // the channel's own, or cut by the end of inbuff1
+    }
+    if (at[0] == cluster_id::kBlockGroup) {
+      uint32_t end = common_group_end(at, pos, total, cluster_left, own_field);
+      if (end == kOwnGroup) {
+        *own_block = at;
+        break;
+      }
+      if (!end) end = passable_group_end(at, pos, total, fileoff, cluster->cluster_end, own_track);
+      if (!end) break;
+      last_pos = last_group_pos = pos;
+      pos = end;
+      continue;
     }
     // Any other unlaced SimpleBlock of another track, one at a time.
     if (at[0] != cluster_id::kSimpleBlock) break;
@@ -270,25 +372,34 @@ bool pass_other_simple_blocks(mkvinbuff* inbuff1, const mkvcluster* cluster, uin
     pos += static_cast<uint32_t>(whole);
   }
   if (pos == first_pos) return false;
+  inbuff1->buff_pos = pos;
+  inbuff1->buff_left = total - pos;
+  // The group's values stay in the record under the SimpleBlocks after it.
+  if (last_group_pos != kNoGroup) store_passed_group(buff + last_group_pos, fileoff + last_group_pos, cluster);
+  *last_is_simple = last_pos != last_group_pos;
+  if (!*last_is_simple) return true;
   const uint8_t* const at = buff + last_pos;
   uint64_t last_size = 0;
   const uint32_t last_length = read_vint(at + 1, &last_size);
   *last = block_header_view{cluster_id::kSimpleBlock, last_size, 0, at[1 + last_length] & 0x7Fu, 1, 0,
                             1 + last_length, 1 + last_length + 1 + 3, at + 1 + last_length + 1};
   *last_position = fileoff + last_pos;
-  inbuff1->buff_pos = pos;
-  inbuff1->buff_left = total - pos;
   return true;
 }
 
-// The channel's own SimpleBlock at inbuff1's read position, with a two-byte
-// size and a one-byte track number, as the pass over other blocks found it
-// (unlaced, at least 4 bytes): the record as take_one leaves it.
-bool take_own_simple_block(mkvinbuff* inbuff1, mkvcluster* cluster, const uint8_t* at) {
-  const uint64_t size = (at[1] & 0x3Fu) << 8 | at[2];
+// The channel's own block at inbuff1's read position, as the pass over other
+// blocks found it: a SimpleBlock of the common kind, or a BlockGroup that
+// common_group_end found to be the channel's own. The record as take_one
+// leaves it.
+bool take_own_common_block(mkvinbuff* inbuff1, mkvcluster* cluster, const uint8_t* at) {
   auto* sizes = static_cast<int64_t*>(mem_alloc_zeroed(sizeof(int64_t)));
   if (!sizes) return false;
-  const block_header_view h{cluster_id::kSimpleBlock, size, 0, at[3] & 0x7Fu, 1, 0, 3, 7, at + 4};
+  const block_header_view h =
+      at[0] == cluster_id::kBlockGroup
+          ? block_header_view{cluster_id::kBlockGroup, (at[4] & 0x3Fu) << 8 | at[5], (at[1] & 0x3Fu) << 8 | at[2],
+                              at[6] & 0x7Fu, 1, 3, 6, 10, at + 7}
+          : block_header_view{cluster_id::kSimpleBlock, (at[1] & 0x3Fu) << 8 | at[2], 0, at[3] & 0x7Fu, 1, 0, 3, 7,
+                              at + 4};
   sizes[0] = data_size(h);
   store_header(cluster, h, inbuff1->buff_fileoff + inbuff1->buff_pos, sizes);
   inbuff1->buff_pos += h.header_length;
@@ -313,12 +424,18 @@ unlaced_block_result take_unlaced_block(mkvinbuff* inbuff1, mkvcluster* cluster,
   block_header_view passed;
   uint64_t passed_position = 0;
   for (;;) {
+    if (cluster->resume.step == mkv_resume_step::none && cluster->in_blockgroup &&
+        !finish_group_values(inbuff1, cluster)) {
+      break;
+    }
     const uint8_t* own_block = nullptr;
-    const bool any = pass_other_simple_blocks(inbuff1, cluster, own_track, &passed, &passed_position, &own_block);
+    bool passed_simple = false;
+    const bool any =
+        pass_other_blocks(inbuff1, cluster, own_track, &passed, &passed_position, &passed_simple, &own_block);
     if (any) result = unlaced_block_result::other_track;
-    if (own_block && take_own_simple_block(inbuff1, cluster, own_block)) return unlaced_block_result::own_track;
+    if (own_block && take_own_common_block(inbuff1, cluster, own_block)) return unlaced_block_result::own_track;
     if (!take_one(inbuff1, cluster, own_track, &own, &data)) {
-      if (any) store_header(cluster, passed, passed_position, nullptr);
+      if (passed_simple) store_header(cluster, passed, passed_position, nullptr);
       break;
     }
     if (own) return unlaced_block_result::own_track;
