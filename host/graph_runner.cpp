@@ -55,19 +55,29 @@ class Adler32 {
 };
 
 // One output channel's consumer: whole frames out of output media buffers.
+// It runs for every element of every frame, so the options it needs per frame
+// are copied in, the element bounds that the setter checked are not checked
+// again, and a frame in one element (nearly all of them) takes a path of its
+// own.
 class Sink {
  public:
   Sink(ChannelRun* run, const RunnerOptions& options, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool)
-      : run_(run), options_(options), config_pool_(config_pool), prefix_pool_(prefix_pool) {}
+      : run_(run),
+        config_pool_(config_pool),
+        prefix_pool_(prefix_pool),
+        on_frame_(options.on_frame),
+        user_(options.user),
+        index_(run->index),
+        checksum_(options.checksum),
+        keep_frames_(options.keep_frames) {}
 
   void Consume(MmfMra* mra) {
-    const MraElement* elements = MraElements(mra);
-    for (uint32_t i = 0; i < mra->ElementCount; ++i) {
-      const MraElement& element = elements[i];
-      if (element.kind == kMmfElementProperty) {
-        Property(element.type, MmfPropertyValue(element.low, element.high));
-      } else if (element.kind == kMmfElementBuffer) {
-        Buffer(element.handle, element.address, element.size);
+    const MraElement* element = MraElements(mra);
+    for (const MraElement* end = element + mra->ElementCount; element != end; ++element) {
+      if (element->kind == kMmfElementBuffer) {
+        Buffer(*element);
+      } else if (element->kind == kMmfElementProperty) {
+        Property(*element);
       }
     }
   }
@@ -82,12 +92,12 @@ class Sink {
   }
 
  private:
-  void Property(uint32_t type, uint64_t value) {
-    switch (type) {
+  void Property(const MraElement& element) {
+    switch (element.type) {
       case kMmfPropVideoTime:
       case kMmfPropAudioTime:
       case kMmfPropSubtitleTime:
-        time_ = value;
+        time_ = MmfPropertyValue(element.low, element.high);
         break;
       case kMmfPropTimeMarker:
         ++run_->time_markers;
@@ -97,7 +107,7 @@ class Sink {
         ++run_->skip_marks;
         break;
       case kMmfPropConfigCount:
-        config_left_ = static_cast<uint32_t>(value);
+        config_left_ = static_cast<uint32_t>(MmfPropertyValue(element.low, element.high));
         break;
       case kMmfPropFramePart:
         if (!in_parts_) StartFrame();
@@ -119,39 +129,68 @@ class Sink {
     adler_ = Adler32{};
   }
 
-  bool PointsIntoInput(const MmfPoolBuffer* handle, const uint8_t* address, uint32_t size) const {
-    if (!handle || address < handle->Data || address + size > handle->Data + handle->Size) return false;
-    if (handle->Pool == config_pool_) return false;
-    // The frame prefix is the one piece held by the input pool of the filter.
-    return handle->Pool != prefix_pool_ || (in_parts_ && !last_part_);
+  // Whether a frame element's bytes are the input's own (zero copy). Its
+  // bounds need no test: MmfSetMraBufferElement refused any element outside
+  // its pool buffer, and a null handle. What is left is the pool: never an
+  // output pool buffer, and the filter's input pool only for the frame
+  // prefix, the one piece that is neither a whole frame nor a frame's last.
+  bool ZeroCopy(const MmfPoolBuffer* handle) const {
+    const MmfMemoryPool* pool = handle->Pool;
+    if (pool == config_pool_) return false;
+    return pool != prefix_pool_ || (in_parts_ && !last_part_);
   }
 
-  void Buffer(MmfPoolBuffer* handle, const uint8_t* address, uint32_t size) {
+  void Buffer(const MraElement& element) {
     if (config_left_ > 0) {
       --config_left_;
-      Adler32 adler;
-      if (options_.checksum) adler.Update(address, size);
-      run_->config.push_back(RunFrame{0, size, options_.checksum ? adler.Value() : 0, false});
+      AddConfig(run_, element, checksum_);
       return;
     }
-    if (!PointsIntoInput(handle, address, size)) ++run_->foreign_elements;
-    if (!in_parts_) StartFrame();
-    frame_.size += size;
-    if (options_.checksum) adler_.Update(address, size);
-    if (in_parts_ && !last_part_) return;
-    frame_.adler32 = options_.checksum ? adler_.Value() : 0;
-    ++run_->frame_count;
-    run_->last_time_us = frame_.time_us;
-    if (options_.keep_frames) run_->frames.push_back(frame_);
-    if (options_.on_frame) options_.on_frame(options_.user, run_->index, frame_);
+    if (!ZeroCopy(element.handle)) ++run_->foreign_elements;
+    if (!in_parts_) {
+      // A frame of its own: passed on at once, with nothing to put together.
+      const RunFrame frame{time_, element.size, checksum_ ? Checksum(element) : 0, marked_};
+      marked_ = false;
+      Deliver(frame);
+      return;
+    }
+    frame_.size += element.size;
+    if (checksum_) adler_.Update(element.address, element.size);
+    if (!last_part_) return;
+    frame_.adler32 = checksum_ ? adler_.Value() : 0;
     in_parts_ = false;
     last_part_ = false;
+    const RunFrame frame = frame_;
+    Deliver(frame);
+  }
+
+  static uint32_t Checksum(const MraElement& element) {
+    Adler32 adler;
+    adler.Update(element.address, element.size);
+    return adler.Value();
+  }
+
+  // Out of line: a channel's decoder configurations come once per run. A
+  // static function, so that the sink itself never escapes to a call.
+  [[gnu::noinline]] static void AddConfig(ChannelRun* run, const MraElement& element, bool checksum) {
+    run->config.push_back(RunFrame{0, element.size, checksum ? Checksum(element) : 0, false});
+  }
+
+  void Deliver(const RunFrame& frame) {
+    ++run_->frame_count;
+    run_->last_time_us = frame.time_us;
+    if (keep_frames_) run_->frames.push_back(frame);
+    if (on_frame_) on_frame_(user_, index_, frame);
   }
 
   ChannelRun* run_;
-  const RunnerOptions& options_;
   MmfMemoryPool* config_pool_;
   MmfMemoryPool* prefix_pool_;
+  void (*on_frame_)(void* user, int32_t channel, const RunFrame& frame);
+  void* user_;
+  int32_t index_;
+  bool checksum_;
+  bool keep_frames_;
   uint64_t time_ = 0;
   uint32_t config_left_ = 0;
   bool in_parts_ = false;   // a frame announced by property 7 is being put together

@@ -57,21 +57,32 @@ const Element* Find(MmfMra* mra, uint32_t index) {
   return &Host(mra)->elements[index];
 }
 
-void ClearElement(Element* element) {
-  if (element->kind == kMmfElementBuffer && element->handle) host::DropBufferReference(element->handle);
-  *element = Element{};
+// Gives back the pool buffer reference a buffer element holds (a buffer
+// element always has a handle: the setter refuses a null one). The element's
+// bytes are left as they are: nothing reads an element at or past ElementCount.
+inline void DropReference(const Element& element) {
+  if (element.kind == kMmfElementBuffer) host::DropBufferReference(element.handle);
 }
 
-// The element to set at index: an existing one (cleared) or the next free one.
-int PrepareSet(MmfMra* mra, uint32_t index, Element** element) {
-  if (!mra) return kInvalid;
-  if (index > mra->ElementCount || index >= mra->Capacity) return kOutOfRange;
-  *element = &Host(mra)->elements[index];
-  if (index < mra->ElementCount) {
-    ClearElement(*element);
-  } else {
-    ++mra->ElementCount;
-  }
+// Counts in the element at index when it is the next one and there is room
+// (a filter appends nearly every element it sets); false otherwise.
+inline bool Append(MmfMra* mra, uint32_t index) {
+  const uint32_t count = mra->ElementCount;
+  if (index != count || index >= mra->Capacity) return false;
+  mra->ElementCount = count + 1;
+  return true;
+}
+
+// Sets an existing element to `value`, or answers that index is out of
+// range. Rare (a filter fixing up what it appended), so it stays out of the
+// setters' path. The new reference is taken before the old one goes: an
+// element set again to the same pool buffer must not hand that buffer back.
+[[gnu::noinline]] int Replace(MmfMra* mra, uint32_t index, const Element& value) {
+  if (index >= mra->ElementCount) return kOutOfRange;
+  Element* element = &Host(mra)->elements[index];
+  if (value.kind == kMmfElementBuffer) host::ReferenceBuffer(value.handle);
+  DropReference(*element);
+  *element = value;
   return 0;
 }
 
@@ -151,7 +162,8 @@ extern "C" int MmfAcquireMra(MmfMraPool* pool, MmfMra** mra, uint32_t flags) {
 extern "C" int MmfReleaseMra(MmfMra* mra) {
   if (!mra) return kInvalid;
   HostMra* host_mra = Host(mra);
-  for (uint32_t i = 0; i < mra->ElementCount; ++i) ClearElement(&host_mra->elements[i]);
+  const Element* elements = host_mra->elements;
+  for (uint32_t i = 0, count = mra->ElementCount; i < count; ++i) DropReference(elements[i]);
   mra->ElementCount = 0;
   MraPoolState* state = host_mra->pool;
   bool delete_pool = false;
@@ -196,9 +208,11 @@ extern "C" int MmfGetMraPropertyElement(MmfMra* mra, uint32_t index, uint32_t* t
 }
 
 extern "C" int MmfSetMraPropertyElement(MmfMra* mra, uint32_t index, uint32_t type, uint32_t low, uint16_t high) {
-  Element* element = nullptr;
-  int result = PrepareSet(mra, index, &element);
-  if (result != 0) return result;
+  if (!mra) return kInvalid;
+  if (!Append(mra, index)) {
+    return Replace(mra, index, Element{kMmfElementProperty, type, low, high, nullptr, nullptr, 0});
+  }
+  Element* element = &Host(mra)->elements[index];
   element->kind = kMmfElementProperty;
   element->type = type;
   element->low = low;
@@ -209,14 +223,12 @@ extern "C" int MmfSetMraPropertyElement(MmfMra* mra, uint32_t index, uint32_t ty
 extern "C" int MmfSetMraBufferElement(MmfMra* mra, uint32_t index, MmfPoolBuffer* handle, uint8_t* address,
                                       uint32_t size) {
   if (!mra || !handle || !address) return kInvalid;
-  // The bytes must lie inside the pool buffer that keeps them alive.
-  if (address < handle->Data || address > handle->Data + handle->Size ||
-      size > static_cast<uint32_t>(handle->Data + handle->Size - address)) {
-    return kInvalid;
-  }
-  Element* element = nullptr;
-  int result = PrepareSet(mra, index, &element);
-  if (result != 0) return result;
+  // The bytes must lie inside the pool buffer that keeps them alive: an
+  // address before Data wraps to an offset past Size.
+  const uintptr_t offset = reinterpret_cast<uintptr_t>(address) - reinterpret_cast<uintptr_t>(handle->Data);
+  if (offset > handle->Size || size > handle->Size - offset) return kInvalid;
+  if (!Append(mra, index)) return Replace(mra, index, Element{kMmfElementBuffer, 0, 0, 0, handle, address, size});
+  Element* element = &Host(mra)->elements[index];
   host::ReferenceBuffer(handle);
   element->kind = kMmfElementBuffer;
   element->handle = handle;

@@ -13,39 +13,26 @@
 
 namespace {
 
-struct PoolState;
-
-// The framework record comes first so that a buffer handle is the record's address.
-// References change without the pool's lock (every frame element of every
-// channel takes and drops one); the lock guards the free list, so only the
-// drop that frees a buffer takes it.
-struct HostBuffer {
-  MmfPoolBuffer record;
-  std::atomic<uint32_t> references;
-  uint32_t mapped;
-};
-static_assert(std::is_standard_layout_v<HostBuffer>);
-
 struct PoolState {
   std::mutex mutex;
   std::condition_variable returned;
   uint32_t size = 0;
-  std::unique_ptr<HostBuffer[]> buffers;
+  std::unique_ptr<host::PoolBuffer[]> buffers;
   uint32_t count = 0;
   // Left unfilled: a page costs memory only once a buffer that uses it is filled.
   std::unique_ptr<uint8_t[]> bytes;
-  std::vector<HostBuffer*> free;
+  std::vector<host::PoolBuffer*> free;
   uint32_t in_use = 0;
   bool closed = false;  // the owner has gone; delete with the last buffer
 };
 
 PoolState* State(MmfMemoryPool* pool) { return reinterpret_cast<PoolState*>(pool); }
-HostBuffer* Host(MmfPoolBuffer* buffer) { return reinterpret_cast<HostBuffer*>(buffer); }
+host::PoolBuffer* Host(MmfPoolBuffer* buffer) { return reinterpret_cast<host::PoolBuffer*>(buffer); }
 
 // With the pool's lock held: a free buffer with one reference, or null.
 MmfPoolBuffer* TakeLocked(PoolState* state) {
   if (state->free.empty()) return nullptr;
-  HostBuffer* buffer = state->free.back();
+  host::PoolBuffer* buffer = state->free.back();
   state->free.pop_back();
   buffer->references.store(1, std::memory_order_relaxed);
   buffer->mapped = 0;
@@ -110,10 +97,10 @@ MemoryPool::MemoryPool(uint32_t size, uint32_t count) {
   auto* state = new PoolState;
   state->size = size;
   state->bytes.reset(new uint8_t[static_cast<size_t>(size) * count]);
-  state->buffers.reset(new HostBuffer[count]);
+  state->buffers.reset(new host::PoolBuffer[count]);
   state->count = count;
   for (uint32_t i = 0; i < count; ++i) {
-    HostBuffer& buffer = state->buffers[i];
+    host::PoolBuffer& buffer = state->buffers[i];
     buffer.record.Pool = reinterpret_cast<MmfMemoryPool*>(state);
     buffer.record.Data = state->bytes.get() + static_cast<size_t>(size) * i;
     buffer.record.Size = size;
@@ -146,26 +133,13 @@ MmfPoolBuffer* MemoryPool::AcquireWaiting(std::chrono::milliseconds timeout) {
 
 uint32_t MemoryPool::FreeCount() const { return OpFreeCount(handle_); }
 
-uint32_t BufferReferences(const MmfPoolBuffer* buffer) {
-  return reinterpret_cast<const HostBuffer*>(buffer)->references.load(std::memory_order_acquire);
-}
-
-void ReferenceBuffer(MmfPoolBuffer* buffer) { Host(buffer)->references.fetch_add(1, std::memory_order_relaxed); }
-
-void DropBufferReference(MmfPoolBuffer* buffer) {
-  PoolState* state = State(buffer->Pool);
-  HostBuffer* host_buffer = Host(buffer);
-  uint32_t references = host_buffer->references.load(std::memory_order_relaxed);
-  do {
-    if (references == 0) return;  // already back in the pool
-  } while (!host_buffer->references.compare_exchange_weak(references, references - 1, std::memory_order_acq_rel,
-                                                          std::memory_order_relaxed));
-  if (references != 1) return;
+void ReturnToPool(PoolBuffer* buffer) {
+  PoolState* state = State(buffer->record.Pool);
   bool delete_pool = false;
   {
     std::lock_guard lock(state->mutex);
-    host_buffer->mapped = 0;
-    state->free.push_back(host_buffer);
+    buffer->mapped = 0;
+    state->free.push_back(buffer);
     --state->in_use;
     delete_pool = state->closed && state->in_use == 0;
     state->returned.notify_one();

@@ -6,8 +6,10 @@
 // that refers to the bytes of an input buffer keeps them valid after the
 // input buffer itself was given back. Every operation is thread-safe.
 
+#include <atomic>
 #include <chrono>
 #include <cstdint>
+#include <type_traits>
 
 #include "platform/media_buffer.h"
 #include "platform/memory_pool.h"
@@ -36,11 +38,40 @@ class MemoryPool {
   MmfMemoryPool* handle_;
 };
 
+// A buffer of a host pool. The framework record comes first, so that a
+// buffer handle is the record's address. References change without the
+// pool's lock, inline (every frame element of every channel takes and drops
+// one); the lock guards the free list, so only the drop that frees a buffer
+// takes it.
+struct PoolBuffer {
+  MmfPoolBuffer record;
+  std::atomic<uint32_t> references;
+  uint32_t mapped;
+};
+static_assert(std::is_standard_layout_v<PoolBuffer> && std::atomic<uint32_t>::is_always_lock_free);
+
+// With the last reference gone: the buffer goes back to its pool.
+void ReturnToPool(PoolBuffer* buffer);
+
 // References held on a buffer (0 once it is back in its pool).
-uint32_t BufferReferences(const MmfPoolBuffer* buffer);
+inline uint32_t BufferReferences(const MmfPoolBuffer* buffer) {
+  return reinterpret_cast<const PoolBuffer*>(buffer)->references.load(std::memory_order_acquire);
+}
+
 // One more reference; the holder gives it back with DropBufferReference.
-void ReferenceBuffer(MmfPoolBuffer* buffer);
-void DropBufferReference(MmfPoolBuffer* buffer);
+inline void ReferenceBuffer(MmfPoolBuffer* buffer) {
+  reinterpret_cast<PoolBuffer*>(buffer)->references.fetch_add(1, std::memory_order_relaxed);
+}
+
+inline void DropBufferReference(MmfPoolBuffer* buffer) {
+  auto* pool_buffer = reinterpret_cast<PoolBuffer*>(buffer);
+  uint32_t references = pool_buffer->references.load(std::memory_order_relaxed);
+  do {
+    if (references == 0) return;  // already back in the pool
+  } while (!pool_buffer->references.compare_exchange_weak(references, references - 1, std::memory_order_acq_rel,
+                                                          std::memory_order_relaxed));
+  if (references == 1) ReturnToPool(pool_buffer);
+}
 
 // A pool of `count` media buffers with `capacity` elements each, for the host's
 // own filters; freed with MmfFreeMraPool.

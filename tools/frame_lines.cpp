@@ -1,65 +1,112 @@
 #include "tools/frame_lines.h"
 
-#include <bit>
 #include <cstring>
 
 namespace {
 
 // A block per channel: a few such blocks cost far less than a line per frame of a long file.
 constexpr size_t kBlockBytes = 256 * 1024;
-// The longest line, and the bytes a digit group may write past its end.
+// Room a line may take: its prefix (whose array is copied whole), a time of
+// up to 20 digits, a size of up to 10, a checksum and the separators.
 constexpr size_t kLongestLine = 96;
 
-// Eight decimal digits of `value` (below 10^8) as ASCII, the first digit in
-// the lowest byte: split into 4-digit halves, then pairs, then digits, all
-// lanes at once, with multiply-shift division by 100 and by 10 (exact in
-// these ranges).
-static_assert(std::endian::native == std::endian::little, "digit lanes are stored lowest byte first");
+// The lines are most of what the tool itself costs per frame, so numbers are
+// written two digits at a time from a table, with no loop and no division
+// other than the compiler's multiply-shift by constants.
+struct PairTable {
+  char pairs[256][2];
+};
 
-uint64_t EightDigits(uint32_t value) {
-  uint64_t lanes = (value / 10000) | (static_cast<uint64_t>(value % 10000) << 32);
-  uint64_t tens = ((lanes * 10486) >> 20) & 0x0000007F0000007Full;
-  lanes = tens | ((lanes - tens * 100) << 16);
-  tens = ((lanes * 103) >> 10) & 0x000F000F000F000Full;
-  lanes = tens | ((lanes - tens * 10) << 8);
-  return lanes + 0x3030303030303030ull;
+// "00" to "99".
+constexpr PairTable kDecimalPairs = [] {
+  PairTable table{};
+  for (int k = 0; k < 100; ++k) {
+    table.pairs[k][0] = static_cast<char>('0' + k / 10);
+    table.pairs[k][1] = static_cast<char>('0' + k % 10);
+  }
+  return table;
+}();
+
+// "00" to "ff".
+constexpr PairTable kHexPairs = [] {
+  constexpr char kHex[] = "0123456789abcdef";
+  PairTable table{};
+  for (int k = 0; k < 256; ++k) {
+    table.pairs[k][0] = kHex[k >> 4];
+    table.pairs[k][1] = kHex[k & 0xF];
+  }
+  return table;
+}();
+
+char* Pair(char* out, const PairTable& table, uint32_t value) {
+  std::memcpy(out, table.pairs[value], 2);
+  return out + 2;
 }
 
-// Writes the 8 bytes of `digits` at `out` and keeps `count` of them (the
-// last ones): the lines have room after them for what is written past.
-char* Keep(char* out, uint64_t digits, int count) {
-  digits >>= 8 * (8 - count);
-  std::memcpy(out, &digits, sizeof digits);
-  return out + count;
+// Exactly four digits of a value below 10^4, leading zeros included.
+char* FourDigits(char* out, uint32_t value) {
+  out = Pair(out, kDecimalPairs, value / 100);
+  return Pair(out, kDecimalPairs, value % 100);
 }
 
-// A value below 10^8 without leading zeros.
-char* Small(char* out, uint32_t value) {
-  const uint64_t digits = EightDigits(value);
-  const uint64_t numeric = digits - 0x3030303030303030ull;
-  // Leading zero digits are the low zero bytes; 0 itself keeps one digit.
-  const int zeros = numeric == 0 ? 7 : std::countr_zero(numeric) / 8;
-  return Keep(out, digits, 8 - zeros);
+// Exactly eight digits of a value below 10^8.
+char* EightDigits(char* out, uint32_t value) { return FourDigits(FourDigits(out, value / 10000), value % 10000); }
+
+// A value below 10^4 without leading zeros (0 is "0"). The longer values
+// are tested for first: they are the common ones (frame sizes).
+char* UpToFour(char* out, uint32_t value) {
+  if (value >= 100) {
+    if (value >= 1000) {
+      out = Pair(out, kDecimalPairs, value / 100);
+    } else {
+      *out++ = static_cast<char>('0' + value / 100);
+    }
+    return Pair(out, kDecimalPairs, value % 100);
+  }
+  if (value >= 10) return Pair(out, kDecimalPairs, value);
+  *out = static_cast<char>('0' + value);
+  return out + 1;
 }
 
-// Eight digits at a time: the lines are most of what the tool itself costs per frame.
+// A value below 10^8 without leading zeros; eight digits (times from 10 s
+// to 100 s in microseconds) take the shortest way.
+[[gnu::always_inline]] inline char* UpToEight(char* out, uint32_t value) {
+  if (value < 10000) return UpToFour(out, value);
+  if (value >= 10000000) return EightDigits(out, value);
+  return FourDigits(UpToFour(out, value / 10000), value % 10000);
+}
+
 char* Decimal(char* out, uint64_t value) {
   constexpr uint64_t kEight = 100000000;
-  if (value < kEight) return Small(out, static_cast<uint32_t>(value));
-  out = Decimal(out, value / kEight);
-  return Keep(out, EightDigits(static_cast<uint32_t>(value % kEight)), 8);
+  if (value < kEight) return UpToEight(out, static_cast<uint32_t>(value));
+  const uint64_t low = value % kEight;
+  value /= kEight;
+  if (value < kEight) {
+    out = UpToEight(out, static_cast<uint32_t>(value));
+  } else {
+    // At most 20 digits: 4 above the next 16.
+    out = UpToFour(out, static_cast<uint32_t>(value / kEight));
+    out = EightDigits(out, static_cast<uint32_t>(value % kEight));
+  }
+  return EightDigits(out, static_cast<uint32_t>(low));
+}
+
+// Decimal, with the values below 10^8 (nearly every time and size) written in place.
+[[gnu::always_inline]] inline char* Number(char* out, uint64_t value) {
+  return value < 100000000 ? UpToEight(out, static_cast<uint32_t>(value)) : Decimal(out, value);
 }
 
 char* Hex8(char* out, uint32_t value) {
-  static const char kHex[] = "0123456789abcdef";
-  for (int shift = 28; shift >= 0; shift -= 4) *out++ = kHex[value >> shift & 0xF];
-  return out;
+  out = Pair(out, kHexPairs, value >> 24);
+  out = Pair(out, kHexPairs, value >> 16 & 0xFF);
+  out = Pair(out, kHexPairs, value >> 8 & 0xFF);
+  return Pair(out, kHexPairs, value & 0xFF);
 }
 
 }  // namespace
 
 FrameLines::FrameLines(const std::vector<uint64_t>& tracks, bool hash)
-    : tracks_(tracks), hash_(hash), channels_(tracks.size()) {
+    : tracks_(tracks), hash_(hash), channels_(tracks.size()), channel_count_(channels_.size()) {
   for (size_t k = 0; k < channels_.size(); ++k) {
     Channel& channel = channels_[k];
     channel.block.reset(new char[kBlockBytes]);
@@ -78,24 +125,21 @@ FrameLines::~FrameLines() {
   }
 }
 
-void FrameLines::OnFrame(void* user, int32_t channel, const host::RunFrame& frame) {
-  static_cast<FrameLines*>(user)->Add(channel, frame);
-}
-
 // "CHANNEL TRACK TIME SIZE[ ADLER32]", as the lines of a kept run print.
-void FrameLines::Add(int32_t index, const host::RunFrame& frame) {
-  if (index < 0 || static_cast<size_t>(index) >= channels_.size()) return;  // not an offered channel
-  Channel& channel = channels_[static_cast<size_t>(index)];
-  if (channel.used + kLongestLine > channel.capacity) Spill(channel);
+void FrameLines::OnFrame(void* user, int32_t index, const host::RunFrame& frame) {
+  auto* lines = static_cast<FrameLines*>(user);
+  if (static_cast<uint32_t>(index) >= lines->channel_count_) return;  // not an offered channel (negative ones wrap)
+  Channel& channel = lines->channels_[static_cast<size_t>(index)];
+  if (channel.used + kLongestLine > channel.capacity) lines->Spill(channel);
   char* out = channel.block.get() + channel.used;
   // The whole prefix array, a fixed size the compiler copies inline; the line
   // goes on over its unused end.
   static_assert(sizeof channel.prefix <= kLongestLine);
   std::memcpy(out, channel.prefix, sizeof channel.prefix);
-  out = Decimal(out + channel.prefix_length, frame.time_us);
+  out = Number(out + channel.prefix_length, frame.time_us);
   *out++ = ' ';
-  out = Decimal(out, frame.size);
-  if (hash_) {
+  out = Number(out, frame.size);
+  if (lines->hash_) {
     *out++ = ' ';
     out = Hex8(out, frame.adler32);
   }

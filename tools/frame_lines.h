@@ -37,10 +37,10 @@ class FrameLines {
     bool in_memory = false;  // no temporary file could be made
     bool failed = false;     // writing the temporary file failed: lines were lost
   };
-  void Add(int32_t channel, const host::RunFrame& frame);
   void Spill(Channel& channel);
 
   std::vector<uint64_t> tracks_;
   bool hash_;
   std::vector<Channel> channels_;
+  size_t channel_count_;  // channels_.size(), without a division per frame
 };
