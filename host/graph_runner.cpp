@@ -65,7 +65,7 @@ class Sink {
       : run_(run),
         config_pool_(config_pool),
         prefix_pool_(prefix_pool),
-        on_frame_(options.on_frame),
+        on_frames_(options.on_frames),
         user_(options.user),
         index_(run->index),
         checksum_(options.checksum),
@@ -80,6 +80,7 @@ class Sink {
         Property(*element);
       }
     }
+    PassFrames();
   }
 
   void Finish() { run_->incomplete_frame = in_parts_; }
@@ -176,17 +177,27 @@ class Sink {
     run->config.push_back(RunFrame{0, element.size, checksum ? Checksum(element) : 0, false});
   }
 
+  // Frames are gathered and counted a batch at a time (at least once per
+  // output buffer): the count and the last time are up to date whenever the
+  // sink is between two output buffers.
   void Deliver(const RunFrame& frame) {
-    ++run_->frame_count;
-    run_->last_time_us = frame.time_us;
-    if (keep_frames_) run_->frames.push_back(frame);
-    if (on_frame_) on_frame_(user_, index_, frame);
+    batch_[batched_++] = frame;
+    if (batched_ == kFrameBatch) PassFrames();
+  }
+
+  void PassFrames() {
+    if (batched_ == 0) return;
+    run_->frame_count += batched_;
+    run_->last_time_us = batch_[batched_ - 1].time_us;
+    if (keep_frames_) run_->frames.insert(run_->frames.end(), batch_, batch_ + batched_);
+    if (on_frames_) on_frames_(user_, index_, batch_, batched_);
+    batched_ = 0;
   }
 
   ChannelRun* run_;
   MmfMemoryPool* config_pool_;
   MmfMemoryPool* prefix_pool_;
-  void (*on_frame_)(void* user, int32_t channel, const RunFrame& frame);
+  void (*on_frames_)(void* user, int32_t channel, const RunFrame* frames, size_t count);
   void* user_;
   int32_t index_;
   bool checksum_;
@@ -198,6 +209,8 @@ class Sink {
   bool marked_ = false;     // a time marker came since the last frame started
   RunFrame frame_;
   Adler32 adler_;
+  RunFrame batch_[kFrameBatch];
+  size_t batched_ = 0;
 };
 
 // A channel that fails stops the graph, as a player does when one of its

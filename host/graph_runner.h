@@ -24,6 +24,10 @@ struct RunFrame {
   bool marked = false;   // a time marker (property 3) came since the frame before
 };
 
+// Frames a sink gathers before it passes them to RunnerOptions::on_frames:
+// one call per output buffer rather than one per frame.
+constexpr size_t kFrameBatch = 256;
+
 struct RunnerOptions {
   uint32_t input_buffer_size = 32768;
   uint32_t first_input_buffer_size = 0;  // bytes of the streamer's first buffer; 0: input_buffer_size
@@ -38,10 +42,11 @@ struct RunnerOptions {
   // buffer goes back; the buffer's elements are readable.
   void (*on_buffer)(void* user, int32_t channel, MmfMra* buffer) = nullptr;
   void* user = nullptr;
-  // Called on a sink's thread with each whole frame as it completes (not with
-  // decoder-configuration packets). With keep_frames off, ChannelRun::frames
-  // stays empty, so a long file costs no memory per frame.
-  void (*on_frame)(void* user, int32_t channel, const RunFrame& frame) = nullptr;
+  // Called on a sink's thread with the whole frames (not decoder-configuration
+  // packets) completed in each output buffer it consumed, in order, at most
+  // kFrameBatch at a time and before on_buffer. With keep_frames off,
+  // ChannelRun::frames stays empty, so a long file costs no memory per frame.
+  void (*on_frames)(void* user, int32_t channel, const RunFrame* frames, size_t count) = nullptr;
   bool keep_frames = true;
   // Another upstream filter in place of the file streamer: its output channel
   // and operations. It delivers from the first Cluster on.

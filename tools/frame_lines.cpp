@@ -126,24 +126,37 @@ FrameLines::~FrameLines() {
 }
 
 // "CHANNEL TRACK TIME SIZE[ ADLER32]", as the lines of a kept run print.
-void FrameLines::OnFrame(void* user, int32_t index, const host::RunFrame& frame) {
+void FrameLines::OnFrames(void* user, int32_t index, const host::RunFrame* frames, size_t count) {
   auto* lines = static_cast<FrameLines*>(user);
   if (static_cast<uint32_t>(index) >= lines->channel_count_) return;  // not an offered channel (negative ones wrap)
   Channel& channel = lines->channels_[static_cast<size_t>(index)];
-  if (channel.used + kLongestLine > channel.capacity) lines->Spill(channel);
+  // The whole prefix array, copied at a fixed size the compiler does inline:
+  // each line goes on over its unused end. Held here, apart from the block's
+  // bytes, so that writing a line does not make the compiler read it again.
+  char prefix[sizeof channel.prefix];
+  static_assert(sizeof prefix <= kLongestLine);
+  std::memcpy(prefix, channel.prefix, sizeof prefix);
+  const size_t prefix_length = channel.prefix_length;
+  const bool hash = lines->hash_;
   char* out = channel.block.get() + channel.used;
-  // The whole prefix array, a fixed size the compiler copies inline; the line
-  // goes on over its unused end.
-  static_assert(sizeof channel.prefix <= kLongestLine);
-  std::memcpy(out, channel.prefix, sizeof channel.prefix);
-  out = Number(out + channel.prefix_length, frame.time_us);
-  *out++ = ' ';
-  out = Number(out, frame.size);
-  if (lines->hash_) {
+  const char* last_start = channel.block.get() + (channel.capacity - kLongestLine);  // where a line still fits
+  for (const host::RunFrame* frame = frames; frame != frames + count; ++frame) {
+    if (out > last_start) {
+      channel.used = static_cast<size_t>(out - channel.block.get());
+      lines->Spill(channel);
+      out = channel.block.get() + channel.used;
+      last_start = channel.block.get() + (channel.capacity - kLongestLine);
+    }
+    std::memcpy(out, prefix, sizeof prefix);
+    out = Number(out + prefix_length, frame->time_us);
     *out++ = ' ';
-    out = Hex8(out, frame.adler32);
+    out = Number(out, frame->size);
+    if (hash) {
+      *out++ = ' ';
+      out = Hex8(out, frame->adler32);
+    }
+    *out++ = '\n';
   }
-  *out++ = '\n';
   channel.used = static_cast<size_t>(out - channel.block.get());
 }
 

@@ -20,8 +20,8 @@ class FrameLines {
   FrameLines(const FrameLines&) = delete;
   FrameLines& operator=(const FrameLines&) = delete;
 
-  // host::RunnerOptions::on_frame, with `user` this object.
-  static void OnFrame(void* user, int32_t channel, const host::RunFrame& frame);
+  // host::RunnerOptions::on_frames, with `user` this object.
+  static void OnFrames(void* user, int32_t channel, const host::RunFrame* frames, size_t count);
 
   // Writes channel `channel`'s lines to `out`; false when a temporary file failed.
   bool Write(int32_t channel, FILE* out);

@@ -280,7 +280,7 @@ int RunPackets(int argc, char** argv) {
   std::unique_ptr<FrameLines> lines;
   if (!options.json && options.run.actions.empty() && !tracks.empty()) {
     lines = std::make_unique<FrameLines>(tracks, options.run.checksum);
-    options.run.on_frame = FrameLines::OnFrame;
+    options.run.on_frames = FrameLines::OnFrames;
     options.run.user = lines.get();
     options.run.keep_frames = false;
   }
