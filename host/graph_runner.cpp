@@ -70,6 +70,8 @@ class Sink {
         index_(run->index),
         checksum_(options.checksum),
         keep_frames_(options.keep_frames) {}
+  Sink(const Sink&) = delete;  // it points into itself
+  Sink& operator=(const Sink&) = delete;
 
   void Consume(MmfMra* mra) {
     const MraElement* element = MraElements(mra);
@@ -94,12 +96,13 @@ class Sink {
 
  private:
   void Property(const MraElement& element) {
-    switch (element.type) {
-      case kMmfPropVideoTime:
-      case kMmfPropAudioTime:
-      case kMmfPropSubtitleTime:
-        time_ = MmfPropertyValue(element.low, element.high);
-        break;
+    const uint32_t type = element.type;
+    // A time comes with every frame: tested before the rest, without a jump table.
+    if (type == kMmfPropVideoTime || type == kMmfPropAudioTime || type == kMmfPropSubtitleTime) {
+      time_ = MmfPropertyValue(element.low, element.high);
+      return;
+    }
+    switch (type) {
       case kMmfPropTimeMarker:
         ++run_->time_markers;
         marked_ = true;
@@ -181,17 +184,18 @@ class Sink {
   // output buffer): the count and the last time are up to date whenever the
   // sink is between two output buffers.
   void Deliver(const RunFrame& frame) {
-    batch_[batched_++] = frame;
-    if (batched_ == kFrameBatch) PassFrames();
+    *batch_end_++ = frame;
+    if (batch_end_ == batch_ + kFrameBatch) PassFrames();
   }
 
   void PassFrames() {
-    if (batched_ == 0) return;
-    run_->frame_count += batched_;
-    run_->last_time_us = batch_[batched_ - 1].time_us;
-    if (keep_frames_) run_->frames.insert(run_->frames.end(), batch_, batch_ + batched_);
-    if (on_frames_) on_frames_(user_, index_, batch_, batched_);
-    batched_ = 0;
+    if (batch_end_ == batch_) return;
+    const size_t count = static_cast<size_t>(batch_end_ - batch_);
+    run_->frame_count += count;
+    run_->last_time_us = batch_end_[-1].time_us;
+    if (keep_frames_) run_->frames.insert(run_->frames.end(), batch_, batch_end_);
+    if (on_frames_) on_frames_(user_, index_, batch_, count);
+    batch_end_ = batch_;
   }
 
   ChannelRun* run_;
@@ -210,7 +214,7 @@ class Sink {
   RunFrame frame_;
   Adler32 adler_;
   RunFrame batch_[kFrameBatch];
-  size_t batched_ = 0;
+  RunFrame* batch_end_ = batch_;
 };
 
 // A channel that fails stops the graph, as a player does when one of its

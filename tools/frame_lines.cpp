@@ -93,6 +93,7 @@ char* Decimal(char* out, uint64_t value) {
 
 // Decimal, with the values below 10^8 (nearly every time and size) written in place.
 [[gnu::always_inline]] inline char* Number(char* out, uint64_t value) {
+  if (value < 10000) return UpToFour(out, static_cast<uint32_t>(value));
   return value < 100000000 ? UpToEight(out, static_cast<uint32_t>(value)) : Decimal(out, value);
 }
 
