@@ -49,6 +49,9 @@ char* FourDigits(char* out, uint32_t value) {
   return Pair(out, kDecimalPairs, value % 100);
 }
 
+// Exactly six digits of a value below 10^6.
+char* SixDigits(char* out, uint32_t value) { return FourDigits(Pair(out, kDecimalPairs, value / 10000), value % 10000); }
+
 // Exactly eight digits of a value below 10^8.
 char* EightDigits(char* out, uint32_t value) { return FourDigits(FourDigits(out, value / 10000), value % 10000); }
 
@@ -138,6 +141,13 @@ void FrameLines::OnFrames(void* user, int32_t index, const host::RunFrame* frame
   static_assert(sizeof prefix <= kLongestLine);
   std::memcpy(prefix, channel.prefix, sizeof prefix);
   const size_t prefix_length = channel.prefix_length;
+  // Times run on within a channel, so their whole seconds change about once a
+  // second of them: they are written out then and copied for the lines in
+  // between. The microseconds that follow are always six digits.
+  uint64_t seconds = channel.seconds;
+  char seconds_text[sizeof channel.seconds_text];
+  std::memcpy(seconds_text, channel.seconds_text, sizeof seconds_text);
+  size_t seconds_length = channel.seconds_length;
   const bool hash = lines->hash_;
   char* out = channel.block.get() + channel.used;
   const char* last_start = channel.block.get() + (channel.capacity - kLongestLine);  // where a line still fits
@@ -149,7 +159,20 @@ void FrameLines::OnFrames(void* user, int32_t index, const host::RunFrame* frame
       last_start = channel.block.get() + (channel.capacity - kLongestLine);
     }
     std::memcpy(out, prefix, sizeof prefix);
-    out = Number(out + prefix_length, frame->time_us);
+    out += prefix_length;
+    constexpr uint64_t kMillion = 1000000;
+    const uint64_t time = frame->time_us;
+    if (time < kMillion) {
+      out = Number(out, time);
+    } else {
+      const uint64_t whole = time / kMillion;
+      if (whole != seconds) {
+        seconds = whole;  // at most 14 digits
+        seconds_length = static_cast<size_t>(Decimal(seconds_text, whole) - seconds_text);
+      }
+      std::memcpy(out, seconds_text, sizeof seconds_text);
+      out = SixDigits(out + seconds_length, static_cast<uint32_t>(time - whole * kMillion));
+    }
     *out++ = ' ';
     out = Number(out, frame->size);
     if (hash) {
@@ -159,6 +182,9 @@ void FrameLines::OnFrames(void* user, int32_t index, const host::RunFrame* frame
     *out++ = '\n';
   }
   channel.used = static_cast<size_t>(out - channel.block.get());
+  channel.seconds = seconds;
+  std::memcpy(channel.seconds_text, seconds_text, sizeof seconds_text);
+  channel.seconds_length = seconds_length;
 }
 
 // Without a temporary file the block just grows: the lines are never lost.

@@ -33,6 +33,10 @@ class FrameLines {
     size_t capacity = 0;
     char prefix[48];  // "CHANNEL TRACK "
     size_t prefix_length = 0;
+    // The whole seconds of the last time of 1 s or more, and their digits.
+    uint64_t seconds = 0;
+    char seconds_text[16];
+    size_t seconds_length = 0;
     FILE* spill = nullptr;
     bool in_memory = false;  // no temporary file could be made
     bool failed = false;     // writing the temporary file failed: lines were lost
