@@ -224,9 +224,11 @@ extern "C" int MmfSetMraBufferElement(MmfMra* mra, uint32_t index, MmfPoolBuffer
                                       uint32_t size) {
   if (!mra || !handle || !address) return kInvalid;
   // The bytes must lie inside the pool buffer that keeps them alive: an
-  // address before Data wraps to an offset past Size.
+  // address before Data wraps to an offset whose end lies past Size or past
+  // the top of the address space.
   const uintptr_t offset = reinterpret_cast<uintptr_t>(address) - reinterpret_cast<uintptr_t>(handle->Data);
-  if (offset > handle->Size || size > handle->Size - offset) return kInvalid;
+  uintptr_t end = 0;
+  if (__builtin_add_overflow(offset, size, &end) || end > handle->Size) return kInvalid;
   if (!Append(mra, index)) return Replace(mra, index, Element{kMmfElementBuffer, 0, 0, 0, handle, address, size});
   Element* element = &Host(mra)->elements[index];
   host::ReferenceBuffer(handle);
