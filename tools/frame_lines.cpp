@@ -134,9 +134,11 @@ void FrameLines::OnFrames(void* user, int32_t index, const host::RunFrame* frame
   auto* lines = static_cast<FrameLines*>(user);
   if (static_cast<uint32_t>(index) >= lines->channel_count_) return;  // not an offered channel (negative ones wrap)
   Channel& channel = lines->channels_[static_cast<size_t>(index)];
-  // The whole prefix array, copied at a fixed size the compiler does inline:
-  // each line goes on over its unused end. Held here, apart from the block's
-  // bytes, so that writing a line does not make the compiler read it again.
+  // The prefix array, copied in fixed sizes the compiler does inline (its
+  // first 16 bytes, which hold nearly every prefix, then the rest): each line
+  // goes on over what was copied past the prefix. Held here, apart from the
+  // block's bytes, so that writing a line does not make the compiler read it
+  // again.
   char prefix[sizeof channel.prefix];
   static_assert(sizeof prefix <= kLongestLine);
   std::memcpy(prefix, channel.prefix, sizeof prefix);
@@ -158,7 +160,8 @@ void FrameLines::OnFrames(void* user, int32_t index, const host::RunFrame* frame
       out = channel.block.get() + channel.used;
       last_start = channel.block.get() + (channel.capacity - kLongestLine);
     }
-    std::memcpy(out, prefix, sizeof prefix);
+    std::memcpy(out, prefix, 16);
+    if (prefix_length > 16) std::memcpy(out + 16, prefix + 16, sizeof prefix - 16);
     out += prefix_length;
     constexpr uint64_t kMillion = 1000000;
     const uint64_t time = frame->time_us;
