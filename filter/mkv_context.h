@@ -39,6 +39,7 @@ struct MkvContext {
   int32_t ExtraBufferCount;
 
   mkv_file_info FileInfo;  // read-only once the stream is rated
+  uint64_t MicrosecondsPerTick;  // FileInfo's TimecodeScale / 1000: a block's time costs no division
 
   // Stream set-up.
   uint32_t Rated;

@@ -29,7 +29,7 @@ uint32_t TimestampType(uint64_t track_type) {
 uint64_t BlockTime(const MkvChannelState* state, const MkvContext* context) {
   const mkvcluster& c = state->Cluster;
   uint64_t ticks = c.cluster_timecode + static_cast<uint64_t>(static_cast<int64_t>(c.block_timecode));
-  return ticks * (context->FileInfo.timecode_scale / 1000);
+  return ticks * context->MicrosecondsPerTick;
 }
 
 // The block's last frame went out: bytes after it (a fixed-size lace that does

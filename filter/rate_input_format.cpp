@@ -134,6 +134,7 @@ int RateInputFormat(MkvChannel* input, const MmfMediaFormat* format, uint32_t re
   }
 
   const mkv_file_info& info = context->FileInfo;
+  context->MicrosecondsPerTick = info.timecode_scale / 1000;
   if (info.track_count == 0) return kRatingRefused;
   context->OutputChannelCount = CountSupportedTracks(info);
   if (context->OutputChannelCount == 0) return kRatingRefused;

@@ -29,7 +29,7 @@ class FileInputStream final : public InputStream {
   int64_t SourceRead(void* buffer, uint64_t count) override {
     if (held_ == end_) {
       if (count >= kReadAhead / 2) return ReadFile(buffer, count);
-      if (!ahead_) ahead_ = std::make_unique<uint8_t[]>(kReadAhead);
+      if (!ahead_) ahead_.reset(new uint8_t[kReadAhead]);  // not zero-filled: read() fills what is used
       int64_t got = ReadFile(ahead_.get(), kReadAhead);
       if (got <= 0) return got;
       held_ = 0;

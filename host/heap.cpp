@@ -25,9 +25,29 @@
 
 namespace {
 
-std::atomic<uint64_t> allocation_count{0};
-std::atomic<uint64_t> fail_at{0};  // allocation number that fails; 0 = none
-std::atomic<int64_t> live_blocks{0};
+// Allocations and live blocks are counted per thread, by the thread alone,
+// so that counting costs no locked instruction and no cache line moving
+// between cores; the totals are summed when asked for. A thread that ends
+// adds its counts to the totals of ended threads.
+struct ThreadCounts {
+  std::atomic<uint64_t> allocations;
+  std::atomic<int64_t> live;
+  ThreadCounts* next;  // in the list of running threads' counts
+};
+
+pthread_mutex_t counts_lock = PTHREAD_MUTEX_INITIALIZER;
+ThreadCounts* running_counts = nullptr;  // guarded by counts_lock
+uint64_t ended_allocations = 0;          // guarded by counts_lock
+int64_t ended_live = 0;                  // guarded by counts_lock
+
+// Armed by FailNthAllocation: the allocation that takes the count from 1 to 0 fails.
+std::atomic<bool> failure_armed{false};
+std::atomic<int64_t> failure_countdown{0};
+
+template <typename T>
+inline void AddOwn(std::atomic<T>& counter, T amount) {
+  counter.store(counter.load(std::memory_order_relaxed) + amount, std::memory_order_relaxed);
+}
 
 #if KELVANE_HOST_HEAP_CACHE
 
@@ -46,47 +66,49 @@ struct FreeBlock {
   FreeBlock* next;
 };
 
-// Plain, so that reaching it costs no initialisation check; the first block
-// a thread caches registers a key whose destructor gives the cache back to
-// malloc when the thread ends.
+// Blocks freed on this thread, by size class; `registered` as in ThreadHeap.
 struct ThreadCache {
   FreeBlock* lists[kClasses];
   uint32_t counts[kClasses];
   bool registered;
 };
 
+#else
+
+struct ThreadCache {
+  bool registered;
+};
+
+#endif
+
+// Plain thread data (no initialisation check on each use), registered at the
+// thread's first allocation or free (cache.registered); the key's destructor
+// gives the cache back to malloc and folds the counts into the ended totals
+// when the thread ends.
+struct ThreadHeap {
+  ThreadCounts counts;
+  ThreadCache cache;
+};
+
 // Initial-exec: this library is loaded with the program, so its thread data
 // sits at a fixed offset and is reached without a call.
-[[gnu::tls_model("initial-exec")]] thread_local ThreadCache cache;
+[[gnu::tls_model("initial-exec")]] thread_local ThreadHeap thread_heap;
 
-pthread_key_t cache_key;
-pthread_once_t cache_key_once = PTHREAD_ONCE_INIT;
+#if KELVANE_HOST_HEAP_CACHE
 
-void EmptyCache(void* data) {
-  auto* thread_cache = static_cast<ThreadCache*>(data);
-  for (FreeBlock*& list : thread_cache->lists) {
+void EmptyCache(ThreadCache* cache) {
+  for (FreeBlock*& list : cache->lists) {
     while (list) {
       FreeBlock* next = list->next;
       std::free(reinterpret_cast<BlockHeader*>(list) - 1);
       list = next;
     }
   }
-  for (uint32_t& count : thread_cache->counts) count = 0;
-}
-
-void MakeCacheKey() {
-  if (pthread_key_create(&cache_key, EmptyCache) != 0) std::abort();
-}
-
-// False when the thread's cache cannot be emptied at its end: the block then goes back to malloc.
-bool CacheRegistered() {
-  if (cache.registered) return true;
-  if (pthread_once(&cache_key_once, MakeCacheKey) != 0 || pthread_setspecific(cache_key, &cache) != 0) return false;
-  cache.registered = true;
-  return true;
+  for (uint32_t& count : cache->counts) count = 0;
 }
 
 void* NewBlock(size_t size) {
+  ThreadCache& cache = thread_heap.cache;
   const uint32_t size_class = size <= kClasses * kGranule ? static_cast<uint32_t>((size + kGranule - 1) / kGranule) - 1
                                                           : kLargeBlock;
   if (size_class < kClasses) {
@@ -104,9 +126,10 @@ void* NewBlock(size_t size) {
 }
 
 void DeleteBlock(void* block) {
+  ThreadCache& cache = thread_heap.cache;
   BlockHeader* header = static_cast<BlockHeader*>(block) - 1;
   const uint32_t size_class = header->size_class;
-  if (size_class < kClasses && cache.counts[size_class] < kMostCachedPerClass && CacheRegistered()) {
+  if (size_class < kClasses && cache.counts[size_class] < kMostCachedPerClass && cache.registered) {
     auto* free_block = static_cast<FreeBlock*>(block);
     free_block->next = cache.lists[size_class];
     cache.lists[size_class] = free_block;
@@ -120,33 +143,93 @@ void DeleteBlock(void* block) {
 
 void* NewBlock(size_t size) { return std::malloc(size); }
 void DeleteBlock(void* block) { std::free(block); }
+void EmptyCache(ThreadCache*) {}
 
 #endif
+
+pthread_key_t heap_key;
+pthread_once_t heap_key_once = PTHREAD_ONCE_INIT;
+
+void ThreadEnded(void* data) {
+  auto* heap = static_cast<ThreadHeap*>(data);
+  EmptyCache(&heap->cache);
+  pthread_mutex_lock(&counts_lock);
+  ended_allocations += heap->counts.allocations.load(std::memory_order_relaxed);
+  ended_live += heap->counts.live.load(std::memory_order_relaxed);
+  for (ThreadCounts** link = &running_counts; *link; link = &(*link)->next) {
+    if (*link == &heap->counts) {
+      *link = heap->counts.next;
+      break;
+    }
+  }
+  pthread_mutex_unlock(&counts_lock);
+  heap->counts.allocations.store(0, std::memory_order_relaxed);
+  heap->counts.live.store(0, std::memory_order_relaxed);
+  heap->cache.registered = false;
+}
+
+void MakeHeapKey() {
+  if (pthread_key_create(&heap_key, ThreadEnded) != 0) std::abort();
+}
+
+// The calling thread's heap data, registered on first use. Should the
+// registration fail, the counts still go to the thread's record, and a block
+// freed there goes back to malloc.
+ThreadHeap& OwnHeap() {
+  ThreadHeap& heap = thread_heap;
+  if (!heap.cache.registered) [[unlikely]] {
+    if (pthread_once(&heap_key_once, MakeHeapKey) == 0 && pthread_setspecific(heap_key, &heap) == 0) {
+      pthread_mutex_lock(&counts_lock);
+      heap.counts.next = running_counts;
+      running_counts = &heap.counts;
+      pthread_mutex_unlock(&counts_lock);
+      heap.cache.registered = true;
+    }
+  }
+  return heap;
+}
+
+// The counts of running threads and of those that ended, summed.
+template <typename Counter, typename Ended>
+int64_t Total(Counter ThreadCounts::*counter, const Ended* ended) {
+  pthread_mutex_lock(&counts_lock);
+  auto total = static_cast<int64_t>(*ended);
+  for (const ThreadCounts* counts = running_counts; counts; counts = counts->next) {
+    total += static_cast<int64_t>((counts->*counter).load(std::memory_order_relaxed));
+  }
+  pthread_mutex_unlock(&counts_lock);
+  return total;
+}
 
 }  // namespace
 
 namespace host {
 
 void FailNthAllocation(uint64_t n) {
-  fail_at.store(n == 0 ? 0 : allocation_count.load() + n);
+  failure_armed.store(false);
+  failure_countdown.store(static_cast<int64_t>(n));
+  if (n != 0) failure_armed.store(true);
 }
 
-uint64_t AllocationCount() { return allocation_count.load(); }
-int64_t LiveBlockCount() { return live_blocks.load(); }
+uint64_t AllocationCount() { return static_cast<uint64_t>(Total(&ThreadCounts::allocations, &ended_allocations)); }
+int64_t LiveBlockCount() { return Total(&ThreadCounts::live, &ended_live); }
 
 }  // namespace host
 
 extern "C" void* SysAlloc(size_t size) {
-  const uint64_t number = allocation_count.fetch_add(1, std::memory_order_relaxed) + 1;
-  uint64_t failing = number;
-  if (fail_at.load(std::memory_order_relaxed) == number && fail_at.compare_exchange_strong(failing, 0)) return nullptr;
+  ThreadHeap& heap = OwnHeap();
+  AddOwn(heap.counts.allocations, uint64_t{1});
+  if (failure_armed.load(std::memory_order_relaxed) && failure_countdown.fetch_sub(1) == 1) {
+    failure_armed.store(false);
+    return nullptr;
+  }
   void* block = NewBlock(size == 0 ? 1 : size);
-  if (block) live_blocks.fetch_add(1, std::memory_order_relaxed);
+  if (block) AddOwn(heap.counts.live, int64_t{1});
   return block;
 }
 
 extern "C" void SysFree(void* block) {
   if (!block) return;
-  live_blocks.fetch_sub(1, std::memory_order_relaxed);
+  AddOwn(OwnHeap().counts.live, int64_t{-1});
   DeleteBlock(block);
 }
