@@ -29,7 +29,7 @@ struct RunFrame {
 constexpr size_t kFrameBatch = 256;
 
 struct RunnerOptions {
-  uint32_t input_buffer_size = 32768;
+  uint32_t input_buffer_size = 65536;  // the read unit the input format announces
   uint32_t first_input_buffer_size = 0;  // bytes of the streamer's first buffer; 0: input_buffer_size
   // Indexes of the output channels to acquire; empty: all of them.
   std::vector<int32_t> channels;

@@ -53,7 +53,7 @@ const std::string kExtractHelp =
     "                     default: every track the plug-in offers\n"
     "  -o, --output DIR   the directory to write to (made, with its parents, when missing)\n"
     "  -q, --quiet        no progress bar\n"
-    "  --buffer-size BYTES  bytes per input buffer (default 32768); small ones split\n"
+    "  --buffer-size BYTES  bytes per input buffer (default 65536); small ones split\n"
     "                     frames across buffers, which must not change the files\n"
     "  --plugin PATH      the plug-in to load (default: kelvane.so beside this program)\n"
     "  -h, --help         this text\n"

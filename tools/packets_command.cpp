@@ -48,7 +48,7 @@ const char kPacketsHelp[] =
     "options:\n"
     "  --channels K,K,...  output channels to acquire, by index (default: all)\n"
     "  --buffer-size BYTES\n"
-    "                      bytes per input buffer, 1 to 67108864 (default 32768)\n"
+    "                      bytes per input buffer, 1 to 67108864 (default 65536)\n"
     "  --no-hash           no Adler-32 of the frames\n"
     "  --json              one JSON document instead of lines (docs/json.md, section packets)\n"
     "  --plugin PATH       the plug-in to load (default: kelvane.so beside this program)\n"
