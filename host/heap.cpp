@@ -29,9 +29,12 @@ namespace {
 // so that counting costs no locked instruction and no cache line moving
 // between cores; the totals are summed when asked for. A thread that ends
 // adds its counts to the totals of ended threads.
+// Plain fields (a thread_local with atomics would need an initialisation
+// check at every use), written by their thread and read by others through
+// atomic_ref.
 struct ThreadCounts {
-  std::atomic<uint64_t> allocations;
-  std::atomic<int64_t> live;
+  uint64_t allocations;
+  int64_t live;
   ThreadCounts* next;  // in the list of running threads' counts
 };
 
@@ -45,8 +48,13 @@ std::atomic<bool> failure_armed{false};
 std::atomic<int64_t> failure_countdown{0};
 
 template <typename T>
-inline void AddOwn(std::atomic<T>& counter, T amount) {
-  counter.store(counter.load(std::memory_order_relaxed) + amount, std::memory_order_relaxed);
+inline T Read(T& counter) {
+  return std::atomic_ref<T>(counter).load(std::memory_order_relaxed);
+}
+
+template <typename T>
+inline void AddOwn(T& counter, T amount) {
+  std::atomic_ref<T>(counter).store(counter + amount, std::memory_order_relaxed);
 }
 
 #if KELVANE_HOST_HEAP_CACHE
@@ -154,8 +162,8 @@ void ThreadEnded(void* data) {
   auto* heap = static_cast<ThreadHeap*>(data);
   EmptyCache(&heap->cache);
   pthread_mutex_lock(&counts_lock);
-  ended_allocations += heap->counts.allocations.load(std::memory_order_relaxed);
-  ended_live += heap->counts.live.load(std::memory_order_relaxed);
+  ended_allocations += Read(heap->counts.allocations);
+  ended_live += Read(heap->counts.live);
   for (ThreadCounts** link = &running_counts; *link; link = &(*link)->next) {
     if (*link == &heap->counts) {
       *link = heap->counts.next;
@@ -163,8 +171,8 @@ void ThreadEnded(void* data) {
     }
   }
   pthread_mutex_unlock(&counts_lock);
-  heap->counts.allocations.store(0, std::memory_order_relaxed);
-  heap->counts.live.store(0, std::memory_order_relaxed);
+  std::atomic_ref<uint64_t>(heap->counts.allocations).store(0, std::memory_order_relaxed);
+  std::atomic_ref<int64_t>(heap->counts.live).store(0, std::memory_order_relaxed);
   heap->cache.registered = false;
 }
 
@@ -190,12 +198,12 @@ ThreadHeap& OwnHeap() {
 }
 
 // The counts of running threads and of those that ended, summed.
-template <typename Counter, typename Ended>
-int64_t Total(Counter ThreadCounts::*counter, const Ended* ended) {
+template <typename Counter>
+int64_t Total(Counter ThreadCounts::*counter, const Counter* ended) {
   pthread_mutex_lock(&counts_lock);
   auto total = static_cast<int64_t>(*ended);
-  for (const ThreadCounts* counts = running_counts; counts; counts = counts->next) {
-    total += static_cast<int64_t>((counts->*counter).load(std::memory_order_relaxed));
+  for (ThreadCounts* counts = running_counts; counts; counts = counts->next) {
+    total += static_cast<int64_t>(Read(counts->*counter));
   }
   pthread_mutex_unlock(&counts_lock);
   return total;

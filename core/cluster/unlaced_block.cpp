@@ -312,14 +312,14 @@ void store_passed_group(const uint8_t* at, uint64_t position, mkvcluster* cluste
 // passable_group_end takes), passed over by their headers alone. Each would
 // leave the record as the next overwrites it, except that a BlockGroup's
 // values stay under the SimpleBlocks after it: the last group's record is
-// written here, and only the last SimpleBlock's header is kept, in *last with
-// its file offset, when *last_is_simple. True when any was passed over. A run
+// written here, and the last SimpleBlock after it, if any, is left in
+// *last_simple for the record (simple_view). True when any was passed over. A run
 // that ends at one of the channel's own blocks of the common kind leaves it in
 // *own_block, at the new read position (a BlockGroup whose first bytes are of
 // the common kind counts too). The checks are decode_header's; a block's
 // header and data together are its ID, size field and size.
-bool pass_other_blocks(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track, block_header_view* last,
-                       uint64_t* last_position, bool* last_is_simple, const uint8_t** own_block) {
+bool pass_other_blocks(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track, const uint8_t** last_simple,
+                       const uint8_t** own_block) {
   if (cluster->resume.step != mkv_resume_step::none) return false;
   // Not before the current BlockGroup's values are read (finish_group_values).
   const uint64_t position = inbuff1->buff_fileoff + inbuff1->buff_pos;
@@ -376,15 +376,16 @@ bool pass_other_blocks(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_tra
   inbuff1->buff_left = total - pos;
   // The group's values stay in the record under the SimpleBlocks after it.
   if (last_group_pos != kNoGroup) store_passed_group(buff + last_group_pos, fileoff + last_group_pos, cluster);
-  *last_is_simple = last_pos != last_group_pos;
-  if (!*last_is_simple) return true;
-  const uint8_t* const at = buff + last_pos;
-  uint64_t last_size = 0;
-  const uint32_t last_length = read_vint(at + 1, &last_size);
-  *last = block_header_view{cluster_id::kSimpleBlock, last_size, 0, at[1 + last_length] & 0x7Fu, 1, 0,
-                            1 + last_length, 1 + last_length + 1 + 3, at + 1 + last_length + 1};
-  *last_position = fileoff + last_pos;
+  if (last_pos != last_group_pos) *last_simple = buff + last_pos;
   return true;
+}
+
+// The header of a SimpleBlock that pass_other_blocks passed over.
+block_header_view simple_view(const uint8_t* at) {
+  uint64_t size = 0;
+  const uint32_t length = read_vint(at + 1, &size);
+  return block_header_view{cluster_id::kSimpleBlock, size, 0, at[1 + length] & 0x7Fu, 1, 0,
+                           1 + length, 1 + length + 1 + 3, at + 1 + length + 1};
 }
 
 // The channel's own block at inbuff1's read position, as the pass over other
@@ -421,21 +422,21 @@ unlaced_block_result take_unlaced_block(mkvinbuff* inbuff1, mkvcluster* cluster,
   *data_left = 0;
   bool own = false;
   int32_t data = 0;
-  block_header_view passed;
-  uint64_t passed_position = 0;
   for (;;) {
     if (cluster->resume.step == mkv_resume_step::none && cluster->in_blockgroup &&
         !finish_group_values(inbuff1, cluster)) {
       break;
     }
     const uint8_t* own_block = nullptr;
-    bool passed_simple = false;
-    const bool any =
-        pass_other_blocks(inbuff1, cluster, own_track, &passed, &passed_position, &passed_simple, &own_block);
+    const uint8_t* passed_simple = nullptr;
+    const bool any = pass_other_blocks(inbuff1, cluster, own_track, &passed_simple, &own_block);
     if (any) result = unlaced_block_result::other_track;
     if (own_block && take_own_common_block(inbuff1, cluster, own_block)) return unlaced_block_result::own_track;
     if (!take_one(inbuff1, cluster, own_track, &own, &data)) {
-      if (passed_simple) store_header(cluster, passed, passed_position, nullptr);
+      if (passed_simple) {
+        const uint64_t position = inbuff1->buff_fileoff + static_cast<uint64_t>(passed_simple - inbuff1->buff);
+        store_header(cluster, simple_view(passed_simple), position, nullptr);
+      }
       break;
     }
     if (own) return unlaced_block_result::own_track;
