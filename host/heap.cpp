@@ -1,3 +1,4 @@
+#include <malloc.h>
 #include <pthread.h>
 
 #include <atomic>
@@ -59,16 +60,27 @@ inline void AddOwn(T& counter, T amount) {
 
 #if KELVANE_HOST_HEAP_CACHE
 
-constexpr size_t kGranule = 16;
-constexpr uint32_t kClasses = 8;           // blocks up to 128 bytes are cached
-constexpr uint32_t kLargeBlock = kClasses;  // the class of a block that malloc takes back
+// Blocks are kept by the size malloc says they can hold (no header of our
+// own, so a block costs what malloc's does): list c holds blocks of
+// c * kGranule to c * kGranule + kGranule - 1 bytes. A request takes from the
+// list of the block malloc gives for its size, found once at load time.
+constexpr size_t kGranule = 8;
+constexpr size_t kLargestCached = 120;
+constexpr uint32_t kClasses = 32;  // room for what malloc gives for kLargestCached bytes
 constexpr uint32_t kMostCachedPerClass = 256;
 
-// Precedes every block; 16 bytes keep the block as aligned as malloc's.
-struct alignas(16) BlockHeader {
-  uint32_t size_class;
+struct RequestClasses {
+  uint8_t of[kLargestCached + 1];  // the list a request of n bytes takes from, or kClasses
+  RequestClasses() {
+    for (size_t size = 0; size <= kLargestCached; ++size) {
+      void* probe = std::malloc(size < 8 ? 8 : size);
+      const size_t size_class = probe ? malloc_usable_size(probe) / kGranule : kClasses;
+      of[size] = static_cast<uint8_t>(size_class < kClasses ? size_class : kClasses);
+      std::free(probe);
+    }
+  }
 };
-static_assert(sizeof(BlockHeader) == kGranule);
+const RequestClasses request_classes;
 
 struct FreeBlock {
   FreeBlock* next;
@@ -108,7 +120,7 @@ void EmptyCache(ThreadCache* cache) {
   for (FreeBlock*& list : cache->lists) {
     while (list) {
       FreeBlock* next = list->next;
-      std::free(reinterpret_cast<BlockHeader*>(list) - 1);
+      std::free(list);
       list = next;
     }
   }
@@ -117,26 +129,20 @@ void EmptyCache(ThreadCache* cache) {
 
 void* NewBlock(size_t size) {
   ThreadCache& cache = thread_heap.cache;
-  const uint32_t size_class = size <= kClasses * kGranule ? static_cast<uint32_t>((size + kGranule - 1) / kGranule) - 1
-                                                          : kLargeBlock;
-  if (size_class < kClasses) {
+  if (size <= kLargestCached && request_classes.of[size] < kClasses) {
+    const size_t size_class = request_classes.of[size];
     if (FreeBlock* block = cache.lists[size_class]) {
       cache.lists[size_class] = block->next;
       --cache.counts[size_class];
       return block;
     }
-    size = (size_class + 1) * kGranule;
   }
-  auto* header = static_cast<BlockHeader*>(std::malloc(sizeof(BlockHeader) + size));
-  if (!header) return nullptr;
-  header->size_class = size_class;
-  return header + 1;
+  return std::malloc(size < sizeof(FreeBlock) ? sizeof(FreeBlock) : size);
 }
 
 void DeleteBlock(void* block) {
   ThreadCache& cache = thread_heap.cache;
-  BlockHeader* header = static_cast<BlockHeader*>(block) - 1;
-  const uint32_t size_class = header->size_class;
+  const size_t size_class = malloc_usable_size(block) / kGranule;
   if (size_class < kClasses && cache.counts[size_class] < kMostCachedPerClass && cache.registered) {
     auto* free_block = static_cast<FreeBlock*>(block);
     free_block->next = cache.lists[size_class];
@@ -144,7 +150,7 @@ void DeleteBlock(void* block) {
     ++cache.counts[size_class];
     return;
   }
-  std::free(header);
+  std::free(block);
 }
 
 #else
