@@ -265,24 +265,35 @@ uint32_t passable_group_end(const uint8_t* at, uint32_t pos, uint32_t total, uin
   return end;
 }
 
+constexpr uint32_t kOwnGroup = UINT32_MAX;
+
+// The header of a BlockGroup of the common kind at `at`, or false.
+[[gnu::always_inline]] inline bool common_group_view(const uint8_t* at, block_header_view* h) {
+  const uint32_t word = header_word(at);
+  const uint32_t block = header_word(at + 4);  // Block size, track number, timecode's first byte
+  if ((word & 0xFFC000FFu) != (uint32_t{cluster_id::kBlockGroup} << 24 | 0x00400000u | cluster_id::kBlock) ||
+      (block & 0xC0008000u) != 0x40008000u || (at[9] & kLacingBits) != 0) {
+    return false;
+  }
+  const uint32_t group_size = word >> 8 & 0x3FFFu, block_size = block >> 16 & 0x3FFFu;
+  if (block_size < 4 || group_size == 0) return false;
+  *h = block_header_view{cluster_id::kBlockGroup, block_size, group_size, at[6] & 0x7Fu, 1, 3, 6, 10, at + 7};
+  return true;
+}
+
 // passable_group_end for the common BlockGroup: two-byte group and Block
 // sizes, a one-byte track number, then the children (most often one
-// ReferenceBlock, or none). 0 when the group is not of that kind or cannot be
+// ReferenceBlock, or none), all before `limit` (the end of inbuff1 or of the
+// Cluster, if sooner). 0 when the group is not of that kind or cannot be
 // passed over; kOwnGroup when it is the channel's own.
-constexpr uint32_t kOwnGroup = UINT32_MAX;
 [[gnu::always_inline]] inline uint32_t common_group_end(const uint8_t* at, uint32_t pos, uint32_t total,
-                                                        uint64_t cluster_left, uint32_t own_field) {
-  const uint32_t word = header_word(at);
-  if ((word & 0xFFC000FFu) != (uint32_t{cluster_id::kBlockGroup} << 24 | 0x00400000u | cluster_id::kBlock) ||
-      (at[4] & 0xC0) != 0x40 || (at[6] & 0x80) == 0 || (at[9] & kLacingBits) != 0) {
-    return 0;
-  }
-  const uint32_t block_size = (at[4] & 0x3Fu) << 8 | at[5];
-  if (block_size < 4 || (word >> 8 & 0x3FFFu) == 0) return 0;
+                                                        uint32_t limit, uint32_t own_field) {
+  block_header_view h;
+  if (!common_group_view(at, &h)) return 0;
   if (at[6] == own_field) return kOwnGroup;
-  const uint32_t end = pos + 3 + (word >> 8 & 0x3FFFu);
-  uint32_t child = pos + 6 + block_size;
-  if (end > total || end > cluster_left || child > end) return 0;
+  const auto end = static_cast<uint32_t>(pos + 3 + h.group_size);
+  auto child = static_cast<uint32_t>(pos + 6 + h.size);
+  if (end > limit || child > end) return 0;
   while (child < end) {
     if (total - child < kLongestValue) return 0;
     const uint32_t length = group_value_length(at - pos + child);
@@ -297,7 +308,7 @@ constexpr uint32_t kOwnGroup = UINT32_MAX;
 // passable_group_end took.
 void store_passed_group(const uint8_t* at, uint64_t position, mkvcluster* cluster) {
   block_header_view h{};
-  if (!decode_header(at, &h)) return;  // it did decode when the group was passed
+  if (!common_group_view(at, &h) && !decode_header(at, &h)) return;  // it did decode when the group was passed
   store_header(cluster, h, position, nullptr);
   const uint8_t* child = at + h.block_offset + h.size;
   const uint8_t* const end = at + h.group_offset + h.group_size;
@@ -332,6 +343,7 @@ bool pass_other_blocks(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_tra
   // Headers start before both the last kLongestHeader bytes and the Cluster's end.
   const uint64_t cluster_left = cluster->cluster_end > fileoff ? cluster->cluster_end - fileoff : 0;
   const auto stop = static_cast<uint32_t>(std::min<uint64_t>(total - kLongestHeader + 1, cluster_left));
+  const auto limit = static_cast<uint32_t>(std::min<uint64_t>(total, cluster_left));  // where passed groups end
   // The own track's number as a one-byte field, or 0, which no such field is.
   const uint8_t own_field = own_track < 0x80 ? static_cast<uint8_t>(0x80 | own_track) : 0;
   uint32_t pos = first_pos, last_pos = 0, last_group_pos = kNoGroup;
@@ -345,15 +357,25 @@ bool pass_other_blocks(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_tra
       break;  // the channel's own, or cut by the end of inbuff1
     }
     if (at[0] == cluster_id::kBlockGroup) {
-      uint32_t end = common_group_end(at, pos, total, cluster_left, own_field);
-      if (end == kOwnGroup) {
-        *own_block = at;
-        break;
-      }
-      if (!end) end = passable_group_end(at, pos, total, fileoff, cluster->cluster_end, own_track);
-      if (!end) break;
-      last_pos = last_group_pos = pos;
-      pos = end;
+      // Groups come in runs of their own (a muxer writes all blocks alike).
+      bool run_ends = false;
+      do {
+        const uint8_t* const group = buff + pos;
+        uint32_t end = common_group_end(group, pos, total, limit, own_field);
+        if (end == kOwnGroup) {
+          *own_block = group;
+          run_ends = true;
+          break;
+        }
+        if (!end) end = passable_group_end(group, pos, total, fileoff, cluster->cluster_end, own_track);
+        if (!end) {
+          run_ends = true;
+          break;
+        }
+        last_pos = last_group_pos = pos;
+        pos = end;
+      } while (pos < stop && buff[pos] == cluster_id::kBlockGroup);
+      if (run_ends) break;
       continue;
     }
     // Any other unlaced SimpleBlock of another track, one at a time.
