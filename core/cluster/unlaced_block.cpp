@@ -11,6 +11,8 @@
 namespace {
 
 constexpr uint8_t kLacingBits = 0x06;
+constexpr uint8_t kXiphLacingBits = 0x02;
+constexpr uint8_t kFixedLacingBits = 0x04;
 // Sizes up to here keep the parser's 32-bit block arithmetic exact.
 constexpr uint64_t kLargestExactSize = 0x7FFFFFFF;
 // The longest header taken here: BlockGroup ID and size, Block ID and size,
@@ -430,6 +432,133 @@ bool take_own_common_block(mkvinbuff* inbuff1, mkvcluster* cluster, const uint8_
   return true;
 }
 
+// Whether the lace table of the laced SimpleBlock of the common kind at `at`
+// (`size` bytes after its size field, whole in inbuff1) lies within the block,
+// as the parser reads it: then, passed over, the block ends where its size
+// says, as after the parser's read and skip. A table the parser would refuse,
+// or that runs past the block, is left to the parser.
+[[gnu::noinline]] bool lace_table_fits(const uint8_t* at, uint32_t size, uint8_t lacing) {
+  if (size < 5) return false;  // track, timecode, flags and the frame count
+  const uint8_t* entry = at + 8;
+  const uint8_t* const end = at + 3 + size;
+  const uint32_t sizes = at[7];  // every frame but the last has one
+  if (lacing == kFixedLacingBits) return true;
+  for (uint32_t i = 0; i < sizes; ++i) {
+    if (lacing == kXiphLacingBits) {
+      uint8_t byte;
+      do {
+        if (entry >= end) return false;
+        byte = *entry++;
+      } while (byte == 255);
+    } else {
+      if (entry >= end || *entry == 0) return false;
+      entry += std::countl_zero(static_cast<uint32_t>(*entry)) - 23;  // the vint's length
+      if (entry > end) return false;
+    }
+  }
+  return true;
+}
+
+// The most common step of all, on its own so that it stays short: from
+// between SimpleBlocks outside any group, other tracks' blocks of the common
+// kind lying whole in inbuff1 (laced ones too, when lace_table_fits), then
+// the channel's own unlaced block of that kind, taken as
+// take_own_common_block takes it. Its header overwrites every field the
+// passed ones would have written, except the parser's lace-table working
+// values (lace index, sum and entries past the count), which nothing reads
+// before the next laced block sets them afresh. False, with nothing changed,
+// when the blocks ahead are of another kind: the general steps take them.
+enum class common_run_result : uint8_t {
+  none,    // nothing taken
+  own,     // the channel's own unlaced block taken, ready as after kClusterBlockReady
+  passed,  // other tracks' blocks passed, up to the channel's own laced block
+};
+
+[[gnu::always_inline]] inline common_run_result take_common_run(mkvinbuff* inbuff1, mkvcluster* cluster,
+                                                               uint64_t own_track) {
+  if (cluster->resume.step != mkv_resume_step::none || cluster->in_blockgroup || own_track >= 0x80 ||
+      inbuff1->buff_left < kLongestHeader) {
+    return common_run_result::none;
+  }
+  const uint8_t* const buff = inbuff1->buff;
+  const uint32_t first_pos = inbuff1->buff_pos;
+  const uint32_t total = first_pos + inbuff1->buff_left;
+  const uint64_t fileoff = inbuff1->buff_fileoff;
+  const uint64_t cluster_left = cluster->cluster_end > fileoff ? cluster->cluster_end - fileoff : 0;
+  const auto stop = static_cast<uint32_t>(std::min<uint64_t>(total - kLongestHeader + 1, cluster_left));
+  const uint32_t own_field = 0x80u | static_cast<uint32_t>(own_track);
+  uint32_t pos = first_pos;
+  for (;;) {
+    if (pos >= stop) return common_run_result::none;
+    const uint8_t* const at = buff + pos;
+    const uint32_t word = header_word(at);
+    const uint32_t size = word >> 8 & 0x3FFFu;
+    if (is_common_block(at, word)) {
+      if ((word & 0xFFu) == own_field) break;
+      if (size + 3 > total - pos) return common_run_result::none;
+      pos += size + 3;
+      continue;
+    }
+    if ((word & kCommonMask) != kCommonHeader || size < 4) return common_run_result::none;
+    if ((word & 0xFFu) == own_field) {
+      // The channel's own laced block: the parser reads its lace table from
+      // here (it rewrites every field the passed blocks would have left).
+      if (pos == first_pos) return common_run_result::none;
+      inbuff1->buff_pos = pos;
+      inbuff1->buff_left = total - pos;
+      return common_run_result::passed;
+    }
+    if (size + 3 > total - pos || !lace_table_fits(at, size, at[6] & kLacingBits)) return common_run_result::none;
+    pos += size + 3;
+  }
+  auto* sizes = static_cast<int64_t*>(mem_alloc_zeroed(sizeof(int64_t)));
+  if (!sizes) return common_run_result::none;
+  const uint8_t* const at = buff + pos;
+  const block_header_view h{cluster_id::kSimpleBlock, (at[1] & 0x3Fu) << 8 | at[2], 0, at[3] & 0x7Fu, 1, 0, 3, 7,
+                            at + 4};
+  sizes[0] = data_size(h);
+  store_header(cluster, h, fileoff + pos, sizes);
+  inbuff1->buff_pos = pos + 7;
+  inbuff1->buff_left = total - pos - 7;
+  return common_run_result::own;
+}
+
+// take_common_run for BlockGroups: after the current group's values, other
+// tracks' groups of the common kind lying whole in inbuff1, then the
+// channel's own group of that kind. The own group's header overwrites every
+// field the passed groups would have written.
+[[gnu::always_inline]] inline bool take_common_group_run(mkvinbuff* inbuff1, mkvcluster* cluster,
+                                                         uint64_t own_track) {
+  if (cluster->resume.step != mkv_resume_step::none || own_track >= 0x80) return false;
+  if (cluster->in_blockgroup && !finish_group_values(inbuff1, cluster)) return false;
+  if (inbuff1->buff_left < kLongestHeader) return false;
+  const uint8_t* const buff = inbuff1->buff;
+  const uint32_t first_pos = inbuff1->buff_pos;
+  const uint32_t total = first_pos + inbuff1->buff_left;
+  const uint64_t fileoff = inbuff1->buff_fileoff;
+  const uint64_t cluster_left = cluster->cluster_end > fileoff ? cluster->cluster_end - fileoff : 0;
+  const auto stop = static_cast<uint32_t>(std::min<uint64_t>(total - kLongestHeader + 1, cluster_left));
+  const auto limit = static_cast<uint32_t>(std::min<uint64_t>(total, cluster_left));
+  const uint32_t own_field = 0x80u | static_cast<uint32_t>(own_track);
+  uint32_t pos = first_pos;
+  for (;;) {
+    if (pos >= stop || buff[pos] != cluster_id::kBlockGroup) return false;
+    const uint32_t end = common_group_end(buff + pos, pos, total, limit, own_field);
+    if (end == kOwnGroup) break;
+    if (!end) return false;
+    pos = end;
+  }
+  block_header_view h;
+  if (!common_group_view(buff + pos, &h)) return false;
+  auto* sizes = static_cast<int64_t*>(mem_alloc_zeroed(sizeof(int64_t)));
+  if (!sizes) return false;
+  sizes[0] = data_size(h);
+  store_header(cluster, h, fileoff + pos, sizes);
+  inbuff1->buff_pos = pos + h.header_length;
+  inbuff1->buff_left = total - pos - h.header_length;
+  return true;
+}
+
 }  // namespace
 
 // Other tracks' blocks whose data lies whole in inbuff1 are passed over here
@@ -440,8 +569,17 @@ bool take_own_common_block(mkvinbuff* inbuff1, mkvcluster* cluster, const uint8_
 // record would (and take_one reads none that it would change).
 unlaced_block_result take_unlaced_block(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track,
                                         uint64_t* data_left) {
-  auto result = unlaced_block_result::parse;
   *data_left = 0;
+  switch (take_common_run(inbuff1, cluster, own_track)) {
+    case common_run_result::own:
+      return unlaced_block_result::own_track;
+    case common_run_result::passed:
+      return unlaced_block_result::parse;
+    case common_run_result::none:
+      break;
+  }
+  if (take_common_group_run(inbuff1, cluster, own_track)) return unlaced_block_result::own_track;
+  auto result = unlaced_block_result::parse;
   bool own = false;
   int32_t data = 0;
   for (;;) {
