@@ -79,6 +79,18 @@ void store_group_value(const uint8_t* at, mkvcluster* cluster) {
 // is past the group; false at a child of another kind or one that does not
 // lie whole in inbuff1, after the values before it: the parser goes on from there.
 bool finish_group_values(mkvinbuff* inbuff1, mkvcluster* cluster) {
+  // Most often the group ends with one ReferenceBlock of one byte (FB 81 xx).
+  const uint64_t start = inbuff1->buff_fileoff + inbuff1->buff_pos;
+  if (start + 3 == cluster->blockgroup_end && start + 3 <= cluster->cluster_end && inbuff1->buff_left >= kLongestValue) {
+    const uint8_t* at = inbuff1->buff + inbuff1->buff_pos;
+    if (at[0] == cluster_id::kReferenceBlock && at[1] == 0x81) {
+      cluster->reference_block = static_cast<int8_t>(at[2]);
+      cluster->resume.id = cluster_id::kReferenceBlock;
+      inbuff1->buff_pos += 3;
+      inbuff1->buff_left -= 3;
+      return true;
+    }
+  }
   for (;;) {
     const uint64_t position = inbuff1->buff_fileoff + inbuff1->buff_pos;
     if (position >= cluster->blockgroup_end || position >= cluster->cluster_end) return true;
@@ -258,6 +270,11 @@ uint32_t passable_group_end(const uint8_t* at, uint32_t pos, uint32_t total, uin
   if (group_end > total || fileoff + group_end > cluster_end || block_end > group_end) return 0;
   auto child = static_cast<uint32_t>(block_end);
   const auto end = static_cast<uint32_t>(group_end);
+  // Most groups hold one ReferenceBlock of one byte (FB 81 xx), or nothing.
+  if (end - child == 3 && total - child >= kLongestValue && at[child - pos] == cluster_id::kReferenceBlock &&
+      at[child - pos + 1] == 0x81) {
+    return end;
+  }
   while (child < end) {
     if (total - child < kLongestValue) return 0;
     const uint32_t length = group_value_length(at - pos + child);
@@ -296,6 +313,11 @@ constexpr uint32_t kOwnGroup = UINT32_MAX;
   const auto end = static_cast<uint32_t>(pos + 3 + h.group_size);
   auto child = static_cast<uint32_t>(pos + 6 + h.size);
   if (end > limit || child > end) return 0;
+  // Most groups hold one ReferenceBlock of one byte (FB 81 xx), or nothing.
+  if (end - child == 3 && total - child >= kLongestValue && at[child - pos] == cluster_id::kReferenceBlock &&
+      at[child - pos + 1] == 0x81) {
+    return end;
+  }
   while (child < end) {
     if (total - child < kLongestValue) return 0;
     const uint32_t length = group_value_length(at - pos + child);

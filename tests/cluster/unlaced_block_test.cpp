@@ -99,7 +99,8 @@ std::vector<Case> Cases() {
        {1, 2, 3}},
       // Runs of other tracks' groups passed whole, their values left under the SimpleBlocks after them.
       {"group_runs",
-       cat({Group({block(2, 0, 0, big), sinteger(kReferenceBlock, -10, 1)}), Group({block(3, 1, 0, big)}),
+       cat({Group({block(2, 0, 0, big), sinteger(kReferenceBlock, -10, 1)}), simple_block(2, 1, 0, big),
+            Group({block(3, 1, 0, big)}),
             simple_block(2, 2, 0, big), Group({block(1, 3, 0, big), uinteger(kReferenceBlock, 0x0102, 2)}),
             Group({block(2, 4, 0, big), uinteger(kBlockDuration, 7), uinteger(kReferencePriority, 2)}),
             Group({block(3, 5, 0, big), sinteger(kReferenceBlock, -3, 8)}), simple_block(3, 6, 0, big),
