@@ -16,13 +16,16 @@ constexpr int kNoBuffer = 11;
 
 }  // namespace
 
-FileStreamer::FileStreamer(InputStream* source, StreamerConfig config) : source_(source), config_(config) {
+FileStreamer::FileStreamer(InputStream* source, StreamerConfig config)
+    : source_(source),
+      config_(config),
+      bytes_(std::make_unique<MemoryPool>(config.buffer_size, config.buffer_count)),
+      read_ahead_(source, bytes_.get()) {
   output_.Kind = kMmfChannelKind;
   output_.Direction = kMmfDirectionOutput;
   output_.Format.buffer_size = config.buffer_size;
   output_.Format.buffer_count = config.buffer_count;
   output_.State = this;
-  bytes_ = std::make_unique<MemoryPool>(config.buffer_size, config.buffer_count);
   mras_ = MakeMraPool(config.buffer_count, kElementsPerBuffer);
 }
 
@@ -61,6 +64,7 @@ int FileStreamer::Seek(uint64_t offset, uint64_t time_us) {
   marker_pending_ = true;
   marker_time_ = time_us;
   ended_ = false;
+  read_ahead_.Discard();
   return kMmfOk;
 }
 
@@ -76,6 +80,7 @@ int FileStreamer::SetListMode(uint32_t mode) {
   list_mode_ = mode ? 1 : 0;
   switch_pending_ = true;
   ended_ = false;
+  read_ahead_.Discard();
   return kMmfOk;
 }
 
@@ -148,18 +153,39 @@ int FileStreamer::NextBuffer(MmfMra** buffer) {
     }
     if (request_left_ < wanted) wanted = static_cast<uint32_t>(request_left_);
   }
+  // Read ahead only once the reader streams on: the buffer after a seek is
+  // often followed by another seek (a cue lookup, a trick-play step), and
+  // reading ahead then only costs reads.
+  const bool continues = delivered_ && !marker_pending_ && !list_mode_;
   int result = Deliver(position_, wanted, buffer);
   if (result == kMmfEndOfStream) ended_ = true;
   if (result == kMmfBufferDelivered) delivered_ = true;
+  if (result == kMmfBufferDelivered && continues && config_.read_ahead && source_->seekable()) {
+    read_ahead_.Start(position_, config_.buffer_size);
+  }
   return result;
 }
 
-int FileStreamer::Deliver(uint64_t offset, uint32_t wanted, MmfMra** buffer) {
-  if (source_->Seek(offset) < 0) return kMmfEndOfStream;
+// The bytes at `offset`: those read ahead when they are these, else read now
+// into a pool buffer. Null with the answer in `failure` when there are none.
+MmfPoolBuffer* FileStreamer::ReadBytes(uint64_t offset, uint32_t wanted, int64_t* got, int* failure) {
+  if (MmfPoolBuffer* bytes = read_ahead_.Take(offset, wanted, got)) return bytes;
   MmfPoolBuffer* bytes = bytes_->AcquireWaiting(kPoolWait);
-  if (!bytes) return kNoBuffer;
+  if (!bytes) {
+    // An offset the source cannot reach ends the stream, whatever the pool holds.
+    *failure = source_->Seek(offset) < 0 ? kMmfEndOfStream : kNoBuffer;
+    return nullptr;
+  }
   MemoryPool::Ops()->MapBuffer(bytes);
-  int64_t got = source_->Read(bytes->Data, wanted);
+  *got = source_->ReadAt(offset, bytes->Data, wanted);
+  return bytes;
+}
+
+int FileStreamer::Deliver(uint64_t offset, uint32_t wanted, MmfMra** buffer) {
+  int64_t got = 0;
+  int failure = kMmfEndOfStream;
+  MmfPoolBuffer* bytes = ReadBytes(offset, wanted, &got, &failure);
+  if (!bytes) return failure;
   if (got <= 0) {
     MemoryPool::Ops()->ReleaseMappedBuffer(bytes);
     return kMmfEndOfStream;

@@ -7,7 +7,9 @@
 // with a type-3 time marker. In list mode it reads only the byte ranges of
 // read-list requests, asking the downstream list maker for each next entry;
 // a request length of -1 ends the stream. At the end NextBuffer answers
-// kMmfEndOfStream, and keeps answering it.
+// kMmfEndOfStream, and keeps answering it. With read-ahead on, while it
+// streams on normally from a seekable source, the next buffers are read on a
+// thread of its own.
 
 #include <cstdint>
 #include <memory>
@@ -15,6 +17,7 @@
 
 #include "host/input_streams.h"
 #include "host/memory_pools.h"
+#include "host/read_ahead.h"
 #include "platform/interfaces.h"
 
 namespace host {
@@ -25,6 +28,10 @@ struct StreamerConfig {
   // Bytes of the first buffer only (at most buffer_size; 0: buffer_size), so
   // that tests can split the input at any byte.
   uint32_t first_buffer_size = 0;
+  // Read the next buffers in the background while streaming on. The source is
+  // then read between NextBuffer calls too, so it must outlive the streamer
+  // strictly; and the order of reads and of pool use is no longer fixed.
+  bool read_ahead = false;
 };
 
 class FileStreamer {
@@ -60,6 +67,7 @@ class FileStreamer {
   int NextRequest();
   int TakeCurrentEntry();
   int Deliver(uint64_t offset, uint32_t wanted, MmfMra** buffer);
+  MmfPoolBuffer* ReadBytes(uint64_t offset, uint32_t wanted, int64_t* got, int* failure);
   static int OpNextBuffer(MmfChannel* output, MmfMra** buffer);
 
   InputStream* source_;
@@ -67,6 +75,7 @@ class FileStreamer {
   MmfChannel output_{};
   std::unique_ptr<MemoryPool> bytes_;
   MmfMraPool* mras_ = nullptr;
+  ReadAhead read_ahead_;  // after bytes_: its buffers go back before the pool goes
 
   mutable std::mutex mutex_;
   uint64_t position_ = 0;        // next file offset to read

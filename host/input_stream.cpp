@@ -62,6 +62,20 @@ int64_t InputStream::Peek(void* buffer, uint64_t count) {
 
 int64_t InputStream::Read(void* buffer, uint64_t count) {
   std::lock_guard lock(mutex_);
+  return ReadLocked(buffer, count);
+}
+
+int64_t InputStream::Seek(uint64_t offset) {
+  std::lock_guard lock(mutex_);
+  return SeekLocked(offset) ? static_cast<int64_t>(offset) : -1;
+}
+
+int64_t InputStream::ReadAt(uint64_t offset, void* buffer, uint64_t count) {
+  std::lock_guard lock(mutex_);
+  return SeekLocked(offset) ? ReadLocked(buffer, count) : -1;
+}
+
+int64_t InputStream::ReadLocked(void* buffer, uint64_t count) {
   ++counters_.reads;
   auto* out = static_cast<uint8_t*>(buffer);
   uint64_t from_lookahead = std::min<uint64_t>(count, lookahead_.size());
@@ -84,14 +98,13 @@ int64_t InputStream::Read(void* buffer, uint64_t count) {
   return static_cast<int64_t>(done);
 }
 
-int64_t InputStream::Seek(uint64_t offset) {
-  std::lock_guard lock(mutex_);
+bool InputStream::SeekLocked(uint64_t offset) {
   ++counters_.seeks;
-  if (offset == position_) return static_cast<int64_t>(offset);
-  if (!seekable_ || !SourceSeek(offset)) return -1;
+  if (offset == position_) return true;
+  if (!seekable_ || !SourceSeek(offset)) return false;
   lookahead_.clear();
   position_ = offset;
-  return static_cast<int64_t>(offset);
+  return true;
 }
 
 int64_t InputStream::Tell() {

@@ -35,6 +35,9 @@ class InputStream {
   int64_t Peek(void* buffer, uint64_t count);
   int64_t Read(void* buffer, uint64_t count);
   int64_t Seek(uint64_t offset);
+  // Seek and Read as one step, so that no other caller's seek or read comes
+  // between them: -1 when the offset cannot be reached.
+  int64_t ReadAt(uint64_t offset, void* buffer, uint64_t count);
   int64_t Tell();
   uint64_t Length();
 
@@ -48,6 +51,8 @@ class InputStream {
 
  private:
   int64_t FillLookahead(uint64_t count);
+  int64_t ReadLocked(void* buffer, uint64_t count);
+  bool SeekLocked(uint64_t offset);
 
   std::string name_;
   MmfInputStream record_{};

@@ -116,13 +116,16 @@ const MmfListMakerOps kListMaker = {.GetNextReadList = GetNextReadList};
 
 class FileStreamerTest : public testing::Test {
  protected:
-  void Make(size_t size, uint32_t buffer_size) {
+  void Make(size_t size, uint32_t buffer_size, bool read_ahead = false) {
+    streamer_.reset();  // it may read ahead from the source until it goes
     file_ = Pattern(size);
     source_ = host::MakeMemoryStream(file_.data(), file_.size(), true);
-    streamer_ = std::make_unique<host::FileStreamer>(source_.get(), host::StreamerConfig{buffer_size, 8});
+    const host::StreamerConfig config{buffer_size, 8, 0, read_ahead};
+    streamer_ = std::make_unique<host::FileStreamer>(source_.get(), config);
   }
   void StartList(std::vector<ScriptedListMaker::Step> script) {
     maker_.script = std::move(script);
+    maker_.next = 0;
     maker_.Advance();
     active_list_maker = &maker_;
     streamer_->ConnectListMaker(&kListMaker, &downstream_input);
@@ -244,6 +247,46 @@ TEST_F(FileStreamerTest, ReadListSwitchesTheStreamerItsChannelIsConnectedTo) {
   EXPECT_EQ(Rest(), std::vector<Delivered>{At(6000, 1000, 3000000)});
   EXPECT_EQ(MmfStreamerSetListMode(nullptr, 1), 22);
   MmfFreeReadlist(list);
+}
+
+// Streaming on reads the next buffers ahead; whatever is asked for instead
+// must not be answered with the bytes read ahead.
+TEST_F(FileStreamerTest, WhatFollowsAReadAheadGetsTheBytesItAsksFor) {
+  enum Action { kStreamOn, kSeek, kListMode };
+  struct Case {
+    const char* name;
+    Action action;
+    uint64_t offset, time;
+    int32_t length;  // list mode: the request
+    std::vector<std::pair<uint64_t, size_t>> expected;  // offset and size of each buffer, the first with the marker
+  };
+  const Case cases[] = {
+      {"streams on", kStreamOn, 0, 0, 0, {{3000, 1000}, {4000, 1000}}},
+      {"seek back", kSeek, 1000, 5, 0, {{1000, 1000}, {2000, 1000}, {3000, 1000}, {4000, 1000}}},
+      {"seek to the offset read ahead", kSeek, 3000, 6, 0, {{3000, 1000}, {4000, 1000}}},
+      {"seek into the range read ahead", kSeek, 3500, 7, 0, {{3500, 1000}, {4500, 500}}},
+      {"list request at the offset read ahead, shorter", kListMode, 3000, 8, 400, {{3000, 400}}},
+      {"list request back", kListMode, 500, 9, 1000, {{500, 1000}}},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    Make(5000, 1000, true);
+    StartList({{c.offset, c.time, c.length}});
+    Delivered d;
+    for (int i = 0; i < 3; ++i) ASSERT_EQ(Next(&d), kMmfBufferDelivered);  // reading ahead from the second on
+    const int answer = c.action == kSeek       ? streamer_->Seek(c.offset, c.time)
+                       : c.action == kListMode ? streamer_->SetListMode(1)
+                                               : 0;
+    ASSERT_EQ(answer, 0);
+    std::vector<Delivered> expected;
+    uint64_t bytes = 3000;
+    for (auto [offset, size] : c.expected) {
+      expected.push_back(At(offset, size, expected.empty() && c.action != kStreamOn ? c.time : UINT64_MAX));
+      bytes += size;
+    }
+    EXPECT_EQ(Rest(), expected);
+    EXPECT_EQ(streamer_->bytes_read(), bytes);  // delivered bytes only
+  }
 }
 
 TEST(GraphClockTest, ReportsTheMediaTimeConsumedOnTheAttachedGraph) {

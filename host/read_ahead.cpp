@@ -1,0 +1,114 @@
+#include "host/read_ahead.h"
+
+#include <chrono>
+
+namespace host {
+
+namespace {
+
+// Reads kept ahead, and how few there are when the thread is woken again:
+// woken for every buffer taken, the thread would cost a wake-up per buffer,
+// more than the read it saves.
+constexpr size_t kDepth = 8;
+constexpr size_t kRefill = kDepth / 2;
+
+}  // namespace
+
+ReadAhead::ReadAhead(InputStream* source, MemoryPool* pool) : source_(source), pool_(pool) {}
+
+ReadAhead::~ReadAhead() {
+  std::unique_lock lock(mutex_);
+  stopping_ = true;
+  wanted_.notify_one();
+  lock.unlock();
+  if (thread_.joinable()) thread_.join();
+  lock.lock();
+  DiscardLocked(lock);
+}
+
+void ReadAhead::Start(uint64_t offset, uint32_t size) {
+  std::unique_lock lock(mutex_);
+  if (Continues(offset, size)) return;
+  DiscardLocked(lock);
+  active_ = true;
+  next_ = offset;
+  size_ = size;
+  if (!thread_.joinable()) thread_ = std::thread([this] { Run(); });
+  wanted_.notify_one();
+}
+
+MmfPoolBuffer* ReadAhead::Take(uint64_t offset, uint32_t size, int64_t* got) {
+  std::unique_lock lock(mutex_);
+  if (!active_) return nullptr;
+  if (!Continues(offset, size)) {
+    DiscardLocked(lock);
+    return nullptr;
+  }
+  // The thread may not have got to it yet, but it will unless the pool ran
+  // dry: waiting costs less than reading it here and starting over.
+  done_.wait(lock, [this] { return !reads_.empty() || (!reading_ && !MayRead()); });
+  if (reads_.empty()) {
+    DiscardLocked(lock);
+    return nullptr;
+  }
+  Read read = reads_.front();
+  reads_.pop_front();
+  *got = read.got;
+  if (starved_ || reads_.size() == kRefill) {
+    starved_ = false;
+    wanted_.notify_one();
+  }
+  return read.buffer;
+}
+
+void ReadAhead::Discard() {
+  std::unique_lock lock(mutex_);
+  DiscardLocked(lock);
+}
+
+// A read under way cannot be called back: its buffer goes once it is done.
+void ReadAhead::DiscardLocked(std::unique_lock<std::mutex>& lock) {
+  active_ = false;
+  done_.wait(lock, [this] { return !reading_; });
+  for (const Read& read : reads_) MemoryPool::Ops()->ReleaseMappedBuffer(read.buffer);
+  reads_.clear();
+  starved_ = false;
+  ended_ = false;
+}
+
+// The read-ahead's next buffer is the one of `size` bytes at `offset`.
+bool ReadAhead::Continues(uint64_t offset, uint32_t size) const {
+  return active_ && size == size_ && offset == (reads_.empty() ? next_ : reads_.front().offset);
+}
+
+bool ReadAhead::MayRead() const { return active_ && !ended_ && !starved_ && reads_.size() < kDepth; }
+
+void ReadAhead::Run() {
+  std::unique_lock lock(mutex_);
+  for (;;) {
+    wanted_.wait(lock, [this] { return stopping_ || (MayRead() && reads_.size() <= kRefill); });
+    while (!stopping_ && MayRead()) {
+      MmfPoolBuffer* buffer = pool_->AcquireWaiting(std::chrono::milliseconds(0));
+      if (!buffer) {
+        starved_ = true;
+        done_.notify_all();
+        break;
+      }
+      MemoryPool::Ops()->MapBuffer(buffer);
+      const uint64_t offset = next_;
+      const uint32_t size = size_;
+      reading_ = true;
+      lock.unlock();
+      const int64_t got = source_->ReadAt(offset, buffer->Data, size);
+      lock.lock();
+      reading_ = false;
+      reads_.push_back({buffer, offset, got});
+      if (got > 0) next_ = offset + static_cast<uint64_t>(got);
+      ended_ = got <= 0;
+      done_.notify_all();
+    }
+    if (stopping_) return;
+  }
+}
+
+}  // namespace host
