@@ -71,10 +71,16 @@ constexpr uint32_t kMostCachedPerClass = 256;
 
 struct RequestClasses {
   uint8_t of[kLargestCached + 1];  // the list a request of n bytes takes from, or kClasses
+  // A list never holds blocks smaller than the request: every block in list
+  // c holds at least c * kGranule bytes, so the list is at least the
+  // request's size in granules, rounded up (an allocator that gives exactly
+  // what was asked, as ThreadSanitizer's does, gets no larger list).
   RequestClasses() {
     for (size_t size = 0; size <= kLargestCached; ++size) {
       void* probe = std::malloc(size < 8 ? 8 : size);
-      const size_t size_class = probe ? malloc_usable_size(probe) / kGranule : kClasses;
+      size_t size_class = probe ? malloc_usable_size(probe) / kGranule : kClasses;
+      const size_t least = (size + kGranule - 1) / kGranule;
+      if (size_class < least) size_class = least;
       of[size] = static_cast<uint8_t>(size_class < kClasses ? size_class : kClasses);
       std::free(probe);
     }
