@@ -338,7 +338,7 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
   MemoryPool config_pool(options.config_buffer_size, kConfigBuffers);
   FileStreamer streamer(source.get(), StreamerConfig{options.input_buffer_size,
                                                      InputBufferCount(options.input_buffer_size),
-                                                     options.first_input_buffer_size});
+                                                     options.first_input_buffer_size, options.read_ahead});
   SetupOptions setup;
   setup.buffer_size = options.input_buffer_size;
   setup.configure_outputs = false;

@@ -56,6 +56,10 @@ struct RunnerOptions {
   // in order, or, when set, the script in their place.
   std::vector<ControlAction> actions;
   std::function<void(PlaybackControl&)> script;
+  // The file streamer reads the next buffers on a thread of its own while
+  // the channels parse (see StreamerConfig::read_ahead); off for tests that
+  // need a fixed order of reads.
+  bool read_ahead = false;
   bool preroll = false;       // sets "EnablePreroll"
   int32_t trick_time_ms = 0;  // sets "TrickTime" when not 0
 };

@@ -245,6 +245,7 @@ int RunExtract(int argc, char** argv) {
   RunState state;
   host::RunnerOptions run;
   run.checksum = false;
+  run.read_ahead = true;
   run.input_buffer_size = options.buffer_size;
   for (const ChannelFacts& facts : channels) {
     auto extraction = std::make_unique<Extraction>();

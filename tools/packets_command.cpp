@@ -263,6 +263,7 @@ std::string ChannelList(const std::vector<uint64_t>& tracks) {
 
 int RunPackets(int argc, char** argv) {
   Options options;
+  options.run.read_ahead = true;  // the streamer reads on while the channels parse
   if (int code = ParseOptions(argc, argv, &options); code >= 0) return code;
   const char* file = options.file;
   if (int code = CheckInputFile("packets", file); code != kExitOk) return code;
