@@ -4,6 +4,7 @@
 // it, for the common SimpleBlock and BlockGroup and the values that end a
 // group.
 
+#include <algorithm>
 #include <bit>
 #include <cstdint>
 #include <cstring>
@@ -44,6 +45,30 @@ constexpr uint32_t kLongestHeader = 1 + 8 + 1 + 8 + 8 + 3;
   const auto length = static_cast<uint32_t>(std::countl_zero(word) + 1);
   *value = (word << length) >> length >> (64 - 8 * length);
   return length;
+}
+
+// Where inbuff1 allows a run of block headers, from its read position:
+// headers start before both its last kLongestHeader bytes and the Cluster's
+// end (`stop`), and blocks passed whole end by `limit`. Offsets from inbuff1's start.
+struct run_window {
+  const uint8_t* buff;
+  uint32_t first;  // the read position
+  uint32_t total;  // the bytes of inbuff1
+  uint64_t fileoff;
+  uint32_t stop;
+  uint32_t limit;
+};
+
+[[gnu::always_inline]] inline run_window window_of(const mkvinbuff* inbuff1, const mkvcluster* cluster) {
+  const uint32_t total = inbuff1->buff_pos + inbuff1->buff_left;
+  const uint64_t fileoff = inbuff1->buff_fileoff;
+  const uint64_t cluster_left = cluster->cluster_end > fileoff ? cluster->cluster_end - fileoff : 0;
+  return run_window{inbuff1->buff,
+                    inbuff1->buff_pos,
+                    total,
+                    fileoff,
+                    static_cast<uint32_t>(std::min<uint64_t>(total - kLongestHeader + 1, cluster_left)),
+                    static_cast<uint32_t>(std::min<uint64_t>(total, cluster_left))};
 }
 
 // The longest BlockDuration, ReferencePriority or ReferenceBlock: ID, size, 8 bytes.
@@ -180,6 +205,25 @@ constexpr uint32_t kCommonHeader = uint32_t{cluster_id::kSimpleBlock} << 24 | 0x
   return (word & kCommonMask) == kCommonHeader && (at[6] & kLacingBits) == 0 && (word >> 8 & 0x3FFFu) >= 4;
 }
 
+// Whether the children of a BlockGroup from `child` to `end` (offsets in
+// `buff`, whose first `total` bytes are readable) are only BlockDuration,
+// ReferencePriority and ReferenceBlock, each with kLongestValue bytes
+// readable, ending exactly at `end`: then they are read as the parser reads them.
+[[gnu::always_inline]] inline bool group_values_fit(const uint8_t* buff, uint32_t child, uint32_t end, uint32_t total) {
+  // Most groups hold one ReferenceBlock of one byte (FB 81 xx), or nothing.
+  if (end - child == 3 && total - child >= kLongestValue && buff[child] == cluster_id::kReferenceBlock &&
+      buff[child + 1] == 0x81) {
+    return true;
+  }
+  while (child < end) {
+    if (total - child < kLongestValue) return false;
+    const uint32_t length = group_value_length(buff + child);
+    if (!length || length > end - child) return false;
+    child += length;
+  }
+  return true;
+}
+
 constexpr uint32_t kOwnGroup = UINT32_MAX;
 
 // The header of a BlockGroup of the common kind at `at`, or false.
@@ -209,18 +253,7 @@ constexpr uint32_t kOwnGroup = UINT32_MAX;
   const auto end = static_cast<uint32_t>(pos + 3 + h.group_size);
   auto child = static_cast<uint32_t>(pos + 6 + h.size);
   if (end > limit || child > end) return 0;
-  // Most groups hold one ReferenceBlock of one byte (FB 81 xx), or nothing.
-  if (end - child == 3 && total - child >= kLongestValue && at[child - pos] == cluster_id::kReferenceBlock &&
-      at[child - pos + 1] == 0x81) {
-    return end;
-  }
-  while (child < end) {
-    if (total - child < kLongestValue) return 0;
-    const uint32_t length = group_value_length(at - pos + child);
-    if (!length || length > end - child) return 0;
-    child += length;
-  }
-  return end;
+  return group_values_fit(at - pos, child, end, total) ? end : 0;
 }
 
 // BlockDuration, ReferencePriority and ReferenceBlock after a BlockGroup's

@@ -39,12 +39,7 @@ bool lace_table_fits(const uint8_t* at, uint32_t size, uint8_t lacing);
       inbuff1->buff_left < kLongestHeader) {
     return common_run_result::none;
   }
-  const uint8_t* const buff = inbuff1->buff;
-  const uint32_t first_pos = inbuff1->buff_pos;
-  const uint32_t total = first_pos + inbuff1->buff_left;
-  const uint64_t fileoff = inbuff1->buff_fileoff;
-  const uint64_t cluster_left = cluster->cluster_end > fileoff ? cluster->cluster_end - fileoff : 0;
-  const auto stop = static_cast<uint32_t>(std::min<uint64_t>(total - kLongestHeader + 1, cluster_left));
+  const auto [buff, first_pos, total, fileoff, stop, limit] = window_of(inbuff1, cluster);
   const uint32_t own_field = 0x80u | static_cast<uint32_t>(own_track);
   uint32_t pos = first_pos;
   for (;;) {
@@ -92,13 +87,7 @@ bool lace_table_fits(const uint8_t* at, uint32_t size, uint8_t lacing);
   if (cluster->resume.step != mkv_resume_step::none || own_track >= 0x80) return false;
   if (cluster->in_blockgroup && !finish_group_values(inbuff1, cluster)) return false;
   if (inbuff1->buff_left < kLongestHeader) return false;
-  const uint8_t* const buff = inbuff1->buff;
-  const uint32_t first_pos = inbuff1->buff_pos;
-  const uint32_t total = first_pos + inbuff1->buff_left;
-  const uint64_t fileoff = inbuff1->buff_fileoff;
-  const uint64_t cluster_left = cluster->cluster_end > fileoff ? cluster->cluster_end - fileoff : 0;
-  const auto stop = static_cast<uint32_t>(std::min<uint64_t>(total - kLongestHeader + 1, cluster_left));
-  const auto limit = static_cast<uint32_t>(std::min<uint64_t>(total, cluster_left));
+  const auto [buff, first_pos, total, fileoff, stop, limit] = window_of(inbuff1, cluster);
   const uint32_t own_field = 0x80u | static_cast<uint32_t>(own_track);
   uint32_t pos = first_pos;
   for (;;) {

@@ -73,20 +73,8 @@ uint32_t passable_group_end(const uint8_t* at, uint32_t pos, uint32_t total, uin
   const uint64_t group_end = uint64_t{pos} + h.group_offset + h.group_size;
   const uint64_t block_end = uint64_t{pos} + h.block_offset + h.size;
   if (group_end > total || fileoff + group_end > cluster_end || block_end > group_end) return 0;
-  auto child = static_cast<uint32_t>(block_end);
   const auto end = static_cast<uint32_t>(group_end);
-  // Most groups hold one ReferenceBlock of one byte (FB 81 xx), or nothing.
-  if (end - child == 3 && total - child >= kLongestValue && at[child - pos] == cluster_id::kReferenceBlock &&
-      at[child - pos + 1] == 0x81) {
-    return end;
-  }
-  while (child < end) {
-    if (total - child < kLongestValue) return 0;
-    const uint32_t length = group_value_length(at - pos + child);
-    if (!length || length > end - child) return 0;
-    child += length;
-  }
-  return end;
+  return group_values_fit(at - pos, static_cast<uint32_t>(block_end), end, total) ? end : 0;
 }
 
 // The record as take_one, skipping the Block's data, and finish_group_values
@@ -122,14 +110,7 @@ bool pass_other_blocks(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_tra
   const uint64_t position = inbuff1->buff_fileoff + inbuff1->buff_pos;
   if (cluster->in_blockgroup && position < cluster->blockgroup_end && position < cluster->cluster_end) return false;
   if (inbuff1->buff_left < kLongestHeader) return false;
-  const uint8_t* const buff = inbuff1->buff;
-  const uint32_t first_pos = inbuff1->buff_pos;
-  const uint32_t total = first_pos + inbuff1->buff_left;
-  const uint64_t fileoff = inbuff1->buff_fileoff;
-  // Headers start before both the last kLongestHeader bytes and the Cluster's end.
-  const uint64_t cluster_left = cluster->cluster_end > fileoff ? cluster->cluster_end - fileoff : 0;
-  const auto stop = static_cast<uint32_t>(std::min<uint64_t>(total - kLongestHeader + 1, cluster_left));
-  const auto limit = static_cast<uint32_t>(std::min<uint64_t>(total, cluster_left));  // where passed groups end
+  const auto [buff, first_pos, total, fileoff, stop, limit] = window_of(inbuff1, cluster);
   // The own track's number as a one-byte field, or 0, which no such field is.
   const uint8_t own_field = own_track < 0x80 ? static_cast<uint8_t>(0x80 | own_track) : 0;
   uint32_t pos = first_pos, last_pos = 0, last_group_pos = kNoGroup;
