@@ -12,6 +12,7 @@
 #include "core/cluster/cluster_ids.h"
 #include "core/cluster/element_header.h"
 #include "core/cluster/mkv_cluster.h"
+#include "core/memory.h"
 
 namespace cluster_shortcut {
 
@@ -226,6 +227,12 @@ constexpr uint32_t kCommonHeader = uint32_t{cluster_id::kSimpleBlock} << 24 | 0x
 
 constexpr uint32_t kOwnGroup = UINT32_MAX;
 
+// The header of a SimpleBlock of the common kind at `at` (is_common_block).
+[[gnu::always_inline]] inline block_header_view common_block_view(const uint8_t* at) {
+  return block_header_view{cluster_id::kSimpleBlock, (at[1] & 0x3Fu) << 8 | at[2], 0, at[3] & 0x7Fu, 1, 0, 3, 7,
+                           at + 4};
+}
+
 // The header of a BlockGroup of the common kind at `at`, or false.
 [[gnu::always_inline]] inline bool common_group_view(const uint8_t* at, block_header_view* h) {
   const uint32_t word = header_word(at);
@@ -254,6 +261,25 @@ constexpr uint32_t kOwnGroup = UINT32_MAX;
   auto child = static_cast<uint32_t>(pos + 6 + h.size);
   if (end > limit || child > end) return 0;
   return group_values_fit(at - pos, child, end, total) ? end : 0;
+}
+
+// Takes the channel's own block of the common kind at `at` in inbuff1 (a
+// SimpleBlock, or a BlockGroup common_group_view reads): its one-entry frame
+// table, its header in the record, the read position after the header, as
+// take_one leaves them. False, with nothing changed, when the table cannot be had.
+[[gnu::always_inline]] inline bool take_own_common_block(mkvinbuff* inbuff1, mkvcluster* cluster,
+                                                         const uint8_t* at) {
+  block_header_view h = common_block_view(at);
+  if (at[0] == cluster_id::kBlockGroup && !common_group_view(at, &h)) return false;
+  auto* sizes = static_cast<int64_t*>(mem_alloc_zeroed(sizeof(int64_t)));
+  if (!sizes) return false;
+  sizes[0] = data_size(h);
+  const auto pos = static_cast<uint32_t>(at - inbuff1->buff);
+  const uint32_t total = inbuff1->buff_pos + inbuff1->buff_left;
+  store_header(cluster, h, inbuff1->buff_fileoff + pos, sizes);
+  inbuff1->buff_pos = pos + h.header_length;
+  inbuff1->buff_left = total - pos - h.header_length;
+  return true;
 }
 
 // BlockDuration, ReferencePriority and ReferenceBlock after a BlockGroup's

@@ -9,7 +9,6 @@
 
 #include "core/cluster/block_header_view.h"
 #include "core/cluster/mkv_cluster.h"
-#include "core/memory.h"
 
 enum class common_run_result : uint8_t {
   none,    // nothing taken or changed: the blocks ahead are of another kind
@@ -65,16 +64,7 @@ bool lace_table_fits(const uint8_t* at, uint32_t size, uint8_t lacing);
     if (size + 3 > total - pos || !lace_table_fits(at, size, at[6] & kLacingBits)) return common_run_result::none;
     pos += size + 3;
   }
-  auto* sizes = static_cast<int64_t*>(mem_alloc_zeroed(sizeof(int64_t)));
-  if (!sizes) return common_run_result::none;
-  const uint8_t* const at = buff + pos;
-  const block_header_view h{cluster_id::kSimpleBlock, (at[1] & 0x3Fu) << 8 | at[2], 0, at[3] & 0x7Fu, 1, 0, 3, 7,
-                            at + 4};
-  sizes[0] = data_size(h);
-  store_header(cluster, h, fileoff + pos, sizes);
-  inbuff1->buff_pos = pos + 7;
-  inbuff1->buff_left = total - pos - 7;
-  return common_run_result::own;
+  return take_own_common_block(inbuff1, cluster, buff + pos) ? common_run_result::own : common_run_result::none;
 }
 
 // The same for BlockGroups: after the current group's values, other tracks'
@@ -97,15 +87,7 @@ bool lace_table_fits(const uint8_t* at, uint32_t size, uint8_t lacing);
     if (!end) return false;
     pos = end;
   }
-  block_header_view h;
-  if (!common_group_view(buff + pos, &h)) return false;
-  auto* sizes = static_cast<int64_t*>(mem_alloc_zeroed(sizeof(int64_t)));
-  if (!sizes) return false;
-  sizes[0] = data_size(h);
-  store_header(cluster, h, fileoff + pos, sizes);
-  inbuff1->buff_pos = pos + h.header_length;
-  inbuff1->buff_left = total - pos - h.header_length;
-  return true;
+  return take_own_common_block(inbuff1, cluster, buff + pos);
 }
 
 }  // namespace cluster_shortcut

@@ -5,7 +5,6 @@
 
 #include "core/cluster/block_header_view.h"
 #include "core/cluster/common_run.h"
-#include "core/memory.h"
 
 using namespace cluster_shortcut;
 
@@ -41,10 +40,9 @@ bool take_one(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track, bool*
 
 // Other tracks' blocks of the common kind from `pos`, each whole before
 // `total`, starting before `stop`: returns where the run ends; *last_pos is
-// the start of the last block passed (unchanged when none was). Kept apart
-// from its caller so that its few values stay in registers.
-inline uint32_t pass_common_run(const uint8_t* buff, uint32_t pos, uint32_t stop, uint32_t total,
-                                           uint32_t own_field, uint32_t* last_pos) {
+// the start of the last block passed (unchanged when none was).
+inline uint32_t pass_common_run(const uint8_t* buff, uint32_t pos, uint32_t stop, uint32_t total, uint32_t own_field,
+                                uint32_t* last_pos) {
   uint32_t last = *last_pos;
   while (pos < stop) {
     const uint8_t* const at = buff + pos;
@@ -177,25 +175,6 @@ block_header_view simple_view(const uint8_t* at) {
                            1 + length, 1 + length + 1 + 3, at + 1 + length + 1};
 }
 
-// The channel's own block at inbuff1's read position, as the pass over other
-// blocks found it: a SimpleBlock of the common kind, or a BlockGroup that
-// common_group_end found to be the channel's own. The record as take_one
-// leaves it.
-bool take_own_common_block(mkvinbuff* inbuff1, mkvcluster* cluster, const uint8_t* at) {
-  auto* sizes = static_cast<int64_t*>(mem_alloc_zeroed(sizeof(int64_t)));
-  if (!sizes) return false;
-  const block_header_view h =
-      at[0] == cluster_id::kBlockGroup
-          ? block_header_view{cluster_id::kBlockGroup, (at[4] & 0x3Fu) << 8 | at[5], (at[1] & 0x3Fu) << 8 | at[2],
-                              at[6] & 0x7Fu, 1, 3, 6, 10, at + 7}
-          : block_header_view{cluster_id::kSimpleBlock, (at[1] & 0x3Fu) << 8 | at[2], 0, at[3] & 0x7Fu, 1, 0, 3, 7,
-                              at + 4};
-  sizes[0] = data_size(h);
-  store_header(cluster, h, inbuff1->buff_fileoff + inbuff1->buff_pos, sizes);
-  inbuff1->buff_pos += h.header_length;
-  inbuff1->buff_left -= h.header_length;
-  return true;
-}
 }  // namespace
 
 // Other tracks' blocks whose data lies whole in inbuff1 are passed over here
