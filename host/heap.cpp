@@ -1,17 +1,22 @@
-#include <malloc.h>
 #include <pthread.h>
+#include <sys/mman.h>
 
 #include <atomic>
 #include <cstdlib>
+#include <type_traits>
 
 #include "host/heap_control.h"
 #include "platform/system.h"
 
 // The plug-in allocates and frees a small block for nearly every block it
-// delivers, so small blocks are kept on per-thread free lists by size class,
-// as a real-time framework's pool allocator would, instead of going through
-// malloc each time. Under AddressSanitizer every block goes to malloc with
-// its exact size, so overruns and uses after free are still caught.
+// delivers, so small blocks do not go through malloc. They come from one
+// range of address space reserved at the first allocation and cut into
+// chunks, each chunk holding blocks of one size class, as a real-time
+// framework's pool allocator would: a block's class follows from its
+// address, so a block carries no header, and freeing it needs no lookup in
+// malloc. Freed blocks wait on per-thread free lists for the next request of
+// their class. Under AddressSanitizer every block goes to malloc with its
+// exact size, so overruns and uses after free are still caught.
 
 #if defined(__SANITIZE_ADDRESS__)
 #define KELVANE_HOST_HEAP_CACHE 0
@@ -60,42 +65,59 @@ inline void AddOwn(T& counter, T amount) {
 
 #if KELVANE_HOST_HEAP_CACHE
 
-// Blocks are kept by the size malloc says they can hold (no header of our
-// own, so a block costs what malloc's does): list c holds blocks of
-// c * kGranule to c * kGranule + kGranule - 1 bytes. A request takes from the
-// list of the block malloc gives for its size, found once at load time.
-constexpr size_t kGranule = 8;
-constexpr size_t kLargestCached = 120;
-constexpr uint32_t kClasses = 32;  // room for what malloc gives for kLargestCached bytes
-constexpr uint32_t kMostCachedPerClass = 256;
+// Class c holds blocks of c * kGranule bytes, the alignment malloc gives.
+constexpr size_t kGranule = 16;
+constexpr size_t kLargestSmall = 256;
+constexpr uint32_t kClasses = kLargestSmall / kGranule + 1;  // class 0 unused
+constexpr size_t kChunkShift = 16;
+constexpr size_t kChunkBytes = size_t{1} << kChunkShift;
+// Address space only: pages cost memory once a block in them is used.
+constexpr size_t kRangeBytes = sizeof(void*) == 8 ? size_t{1} << 30 : size_t{64} << 20;
+constexpr size_t kChunks = kRangeBytes / kChunkBytes;
 
-struct RequestClasses {
-  uint8_t of[kLargestCached + 1];  // the list a request of n bytes takes from, or kClasses
-  // A list never holds blocks smaller than the request: every block in list
-  // c holds at least c * kGranule bytes, so the list is at least the
-  // request's size in granules, rounded up (an allocator that gives exactly
-  // what was asked, as ThreadSanitizer's does, gets no larger list).
-  RequestClasses() {
-    for (size_t size = 0; size <= kLargestCached; ++size) {
-      void* probe = std::malloc(size < 8 ? 8 : size);
-      size_t size_class = probe ? malloc_usable_size(probe) / kGranule : kClasses;
-      const size_t least = (size + kGranule - 1) / kGranule;
-      if (size_class < least) size_class = least;
-      of[size] = static_cast<uint8_t>(size_class < kClasses ? size_class : kClasses);
-      std::free(probe);
-    }
+inline uint32_t ClassOf(size_t size) { return size == 0 ? 1 : static_cast<uint32_t>((size + kGranule - 1) / kGranule); }
+
+// The reserved range and the class of each chunk handed out from it. A chunk
+// belongs to one thread until that thread ends; the blocks in it go wherever
+// they are freed.
+struct SmallBlockRange {
+  uint8_t* base = nullptr;  // null when the range could not be reserved: all to malloc
+  std::atomic<size_t> chunks_taken{0};
+  uint8_t class_of_chunk[kChunks] = {};
+
+  SmallBlockRange() {
+    void* range = mmap(nullptr, kRangeBytes, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS | MAP_NORESERVE, -1, 0);
+    if (range != MAP_FAILED) base = static_cast<uint8_t*>(range);
+  }
+  // The class of a block of the range, or 0 for a block of malloc's.
+  uint32_t ClassOfBlock(const void* block) const {
+    const uintptr_t offset = reinterpret_cast<uintptr_t>(block) - reinterpret_cast<uintptr_t>(base);
+    return offset < kRangeBytes && base ? class_of_chunk[offset >> kChunkShift] : 0;
   }
 };
-const RequestClasses request_classes;
+SmallBlockRange small_blocks;
 
 struct FreeBlock {
   FreeBlock* next;
 };
 
-// Blocks freed on this thread, by size class; `registered` as in ThreadHeap.
+// The unused rest of a chunk. No member initialisers: it is part of the
+// plain thread data (zero at a thread's start).
+struct ChunkRest {
+  uint8_t* next;
+  uint8_t* end;
+};
+
+// Blocks and chunk rests left by threads that ended, for any thread to take.
+pthread_mutex_t orphans_lock = PTHREAD_MUTEX_INITIALIZER;
+FreeBlock* orphan_blocks[kClasses] = {};    // guarded by orphans_lock
+ChunkRest orphan_rests[kClasses][4] = {};   // guarded by orphans_lock
+std::atomic<uint32_t> orphan_classes{0};    // bit c: orphans of class c may wait
+
+// Blocks freed on this thread and the chunk it cuts new blocks from, by class.
 struct ThreadCache {
   FreeBlock* lists[kClasses];
-  uint32_t counts[kClasses];
+  ChunkRest rests[kClasses];
   bool registered;
 };
 
@@ -109,8 +131,8 @@ struct ThreadCache {
 
 // Plain thread data (no initialisation check on each use), registered at the
 // thread's first allocation or free (cache.registered); the key's destructor
-// gives the cache back to malloc and folds the counts into the ended totals
-// when the thread ends.
+// hands the cache to the other threads and folds the counts into the ended
+// totals when the thread ends.
 struct ThreadHeap {
   ThreadCounts counts;
   ThreadCache cache;
@@ -119,51 +141,136 @@ struct ThreadHeap {
 // Initial-exec: this library is loaded with the program, so its thread data
 // sits at a fixed offset and is reached without a call.
 [[gnu::tls_model("initial-exec")]] thread_local ThreadHeap thread_heap;
+static_assert(std::is_trivially_default_constructible_v<ThreadHeap>, "thread data needs no initialisation check");
 
 #if KELVANE_HOST_HEAP_CACHE
 
-void EmptyCache(ThreadCache* cache) {
-  for (FreeBlock*& list : cache->lists) {
-    while (list) {
-      FreeBlock* next = list->next;
-      std::free(list);
-      list = next;
+// A thread that ends leaves its free blocks and the rests of its chunks to
+// the others.
+void OrphanCache(ThreadCache* cache) {
+  pthread_mutex_lock(&orphans_lock);
+  uint32_t classes = 0;
+  for (uint32_t c = 1; c < kClasses; ++c) {
+    if (FreeBlock* list = cache->lists[c]) {
+      FreeBlock* last = list;
+      while (last->next) last = last->next;
+      last->next = orphan_blocks[c];
+      orphan_blocks[c] = list;
+      cache->lists[c] = nullptr;
+      classes |= 1u << c;
+    }
+    ChunkRest& rest = cache->rests[c];
+    if (rest.next != rest.end) {
+      for (ChunkRest& slot : orphan_rests[c]) {
+        if (slot.next == slot.end) {
+          slot = rest;
+          classes |= 1u << c;
+          break;
+        }
+      }
+    }
+    rest = {};
+  }
+  orphan_classes.fetch_or(classes, std::memory_order_relaxed);
+  pthread_mutex_unlock(&orphans_lock);
+}
+
+// Takes what ended threads left of class c: all their free blocks, or one
+// chunk rest. False when there was nothing.
+bool AdoptOrphans(ThreadCache& cache, uint32_t c) {
+  if (!(orphan_classes.load(std::memory_order_relaxed) & (1u << c))) return false;
+  bool adopted = false;
+  pthread_mutex_lock(&orphans_lock);
+  if (orphan_blocks[c]) {
+    cache.lists[c] = orphan_blocks[c];
+    orphan_blocks[c] = nullptr;
+    adopted = true;
+  } else {
+    for (ChunkRest& slot : orphan_rests[c]) {
+      if (slot.next != slot.end) {
+        cache.rests[c] = slot;
+        slot = {};
+        adopted = true;
+        break;
+      }
     }
   }
-  for (uint32_t& count : cache->counts) count = 0;
+  bool left = orphan_blocks[c] != nullptr;
+  for (const ChunkRest& slot : orphan_rests[c]) left |= slot.next != slot.end;
+  if (!left) orphan_classes.fetch_and(~(1u << c), std::memory_order_relaxed);
+  pthread_mutex_unlock(&orphans_lock);
+  return adopted;
+}
+
+// A block of class c when the thread's list is empty: cut from its chunk, from
+// what ended threads left, or from a new chunk; null when the range is used up.
+[[gnu::noinline]] void* RefillBlock(ThreadCache& cache, uint32_t c) {
+  const size_t block_bytes = size_t{c} * kGranule;
+  for (;;) {
+    ChunkRest& rest = cache.rests[c];
+    if (rest.next != rest.end) {
+      void* block = rest.next;
+      rest.next += block_bytes;
+      return block;
+    }
+    if (cache.lists[c]) {
+      FreeBlock* block = cache.lists[c];
+      cache.lists[c] = block->next;
+      return block;
+    }
+    if (AdoptOrphans(cache, c)) continue;
+    if (!small_blocks.base) return nullptr;
+    const size_t chunk = small_blocks.chunks_taken.fetch_add(1, std::memory_order_relaxed);
+    if (chunk >= kChunks) return nullptr;
+    small_blocks.class_of_chunk[chunk] = static_cast<uint8_t>(c);
+    uint8_t* start = small_blocks.base + chunk * kChunkBytes;
+    rest.next = start;
+    rest.end = start + kChunkBytes / block_bytes * block_bytes;
+  }
 }
 
 void* NewBlock(size_t size) {
-  ThreadCache& cache = thread_heap.cache;
-  if (size <= kLargestCached && request_classes.of[size] < kClasses) {
-    const size_t size_class = request_classes.of[size];
-    if (FreeBlock* block = cache.lists[size_class]) {
-      cache.lists[size_class] = block->next;
-      --cache.counts[size_class];
+  if (size <= kLargestSmall) {
+    ThreadCache& cache = thread_heap.cache;
+    const uint32_t c = ClassOf(size);
+    if (FreeBlock* block = cache.lists[c]) {
+      cache.lists[c] = block->next;
       return block;
     }
+    if (cache.registered) {
+      if (void* block = RefillBlock(cache, c)) return block;
+    }
   }
-  return std::malloc(size < sizeof(FreeBlock) ? sizeof(FreeBlock) : size);
+  return std::malloc(size);
 }
 
 void DeleteBlock(void* block) {
   ThreadCache& cache = thread_heap.cache;
-  const size_t size_class = malloc_usable_size(block) / kGranule;
-  if (size_class < kClasses && cache.counts[size_class] < kMostCachedPerClass && cache.registered) {
-    auto* free_block = static_cast<FreeBlock*>(block);
-    free_block->next = cache.lists[size_class];
-    cache.lists[size_class] = free_block;
-    ++cache.counts[size_class];
+  const uint32_t c = small_blocks.ClassOfBlock(block);
+  if (c == 0) {
+    std::free(block);
     return;
   }
-  std::free(block);
+  auto* free_block = static_cast<FreeBlock*>(block);
+  if (!cache.registered) [[unlikely]] {
+    // A thread without heap data of its own keeps nothing: nobody would
+    // hand its list on when it ends.
+    pthread_mutex_lock(&orphans_lock);
+    free_block->next = orphan_blocks[c];
+    orphan_blocks[c] = free_block;
+    orphan_classes.fetch_or(1u << c, std::memory_order_relaxed);
+    pthread_mutex_unlock(&orphans_lock);
+    return;
+  }
+  free_block->next = cache.lists[c];
+  cache.lists[c] = free_block;
 }
 
 #else
 
 void* NewBlock(size_t size) { return std::malloc(size); }
 void DeleteBlock(void* block) { std::free(block); }
-void EmptyCache(ThreadCache*) {}
+void OrphanCache(ThreadCache*) {}
 
 #endif
 
@@ -172,7 +279,7 @@ pthread_once_t heap_key_once = PTHREAD_ONCE_INIT;
 
 void ThreadEnded(void* data) {
   auto* heap = static_cast<ThreadHeap*>(data);
-  EmptyCache(&heap->cache);
+  OrphanCache(&heap->cache);
   pthread_mutex_lock(&counts_lock);
   ended_allocations += Read(heap->counts.allocations);
   ended_live += Read(heap->counts.live);
@@ -193,8 +300,9 @@ void MakeHeapKey() {
 }
 
 // The calling thread's heap data, registered on first use. Should the
-// registration fail, the counts still go to the thread's record, and a block
-// freed there goes back to malloc.
+// registration fail, the counts still go to the thread's record, and the
+// thread cuts no chunks (its small blocks come from malloc, or from what
+// other threads freed), so nothing is left behind when it ends.
 ThreadHeap& OwnHeap() {
   ThreadHeap& heap = thread_heap;
   if (!heap.cache.registered) [[unlikely]] {
@@ -236,7 +344,9 @@ int64_t LiveBlockCount() { return Total(&ThreadCounts::live, &ended_live); }
 
 }  // namespace host
 
-extern "C" void* SysAlloc(size_t size) {
+namespace {
+
+[[gnu::noinline]] void* AllocateBlock(size_t size) {
   ThreadHeap& heap = OwnHeap();
   AddOwn(heap.counts.allocations, uint64_t{1});
   if (failure_armed.load(std::memory_order_relaxed) && failure_countdown.fetch_sub(1) == 1) {
@@ -248,8 +358,44 @@ extern "C" void* SysAlloc(size_t size) {
   return block;
 }
 
-extern "C" void SysFree(void* block) {
+[[gnu::noinline]] void FreeBlockOf(void* block) {
   if (!block) return;
   AddOwn(OwnHeap().counts.live, int64_t{-1});
   DeleteBlock(block);
+}
+
+}  // namespace
+
+// The commonest requests, a small block while its class's list holds one and
+// a small block given back on a thread that has its heap data, are served
+// here without a call; everything else takes the general path.
+extern "C" void* SysAlloc(size_t size) {
+#if KELVANE_HOST_HEAP_CACHE
+  ThreadHeap& heap = thread_heap;
+  if (size <= kLargestSmall && heap.cache.registered && !failure_armed.load(std::memory_order_relaxed)) [[likely]] {
+    const uint32_t c = ClassOf(size);
+    if (FreeBlock* block = heap.cache.lists[c]) [[likely]] {
+      heap.cache.lists[c] = block->next;
+      AddOwn(heap.counts.allocations, uint64_t{1});
+      AddOwn(heap.counts.live, int64_t{1});
+      return block;
+    }
+  }
+#endif
+  return AllocateBlock(size);
+}
+
+extern "C" void SysFree(void* block) {
+#if KELVANE_HOST_HEAP_CACHE
+  ThreadHeap& heap = thread_heap;
+  const uint32_t c = small_blocks.ClassOfBlock(block);
+  if (c != 0 && heap.cache.registered) [[likely]] {
+    auto* free_block = static_cast<FreeBlock*>(block);
+    free_block->next = heap.cache.lists[c];
+    heap.cache.lists[c] = free_block;
+    AddOwn(heap.counts.live, int64_t{-1});
+    return;
+  }
+#endif
+  FreeBlockOf(block);
 }

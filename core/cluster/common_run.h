@@ -48,7 +48,8 @@ bool lace_table_fits(const uint8_t* at, uint32_t size, uint8_t lacing);
     const uint32_t size = word >> 8 & 0x3FFFu;
     if (is_common_block(at, word)) {
       if ((word & 0xFFu) == own_field) break;
-      if (size + 3 > total - pos) return common_run_result::none;
+      // No bound check: a block that ends past inbuff1 (or the cluster) leaves
+      // pos at or past `stop`, which ends the run with nothing taken.
       pos += size + 3;
       continue;
     }

@@ -1,7 +1,8 @@
 #include <gtest/gtest.h>
-#include <malloc.h>
 
-#include <cstring>
+#include <cstddef>
+#include <cstdint>
+#include <thread>
 #include <vector>
 
 #include "host/heap_control.h"
@@ -9,30 +10,80 @@
 
 namespace {
 
-// Blocks given back are handed out again for other sizes: each must still
-// hold what was asked, whatever sizes the underlying allocator rounds to
-// (under ThreadSanitizer it rounds to none), and be counted.
-TEST(HostHeapTest, ReusedBlocksHoldTheSizeAsked) {
+struct Block {
+  uint8_t* bytes;
+  size_t size;
+  uint8_t mark;
+};
+
+// Blocks of every size up to past the largest kept apart from malloc's, each
+// filled with its own mark.
+std::vector<Block> MakeBlocks(size_t largest, uint8_t first_mark) {
+  std::vector<Block> blocks;
+  for (size_t size = 1; size <= largest; ++size) {
+    auto* bytes = static_cast<uint8_t*>(SysAlloc(size));
+    EXPECT_NE(bytes, nullptr) << size << " bytes asked";
+    if (!bytes) continue;
+    EXPECT_EQ(reinterpret_cast<uintptr_t>(bytes) % alignof(std::max_align_t), 0u) << size << " bytes asked";
+    const auto mark = static_cast<uint8_t>(first_mark + size);
+    for (size_t i = 0; i < size; ++i) bytes[i] = mark;
+    blocks.push_back({bytes, size, mark});
+  }
+  return blocks;
+}
+
+// Every block still holds its own mark in each of its bytes: no block was
+// smaller than asked, and no two overlap.
+void ExpectIntact(const std::vector<Block>& blocks) {
+  for (const Block& block : blocks) {
+    size_t changed = 0;
+    for (size_t i = 0; i < block.size; ++i) changed += block.bytes[i] != block.mark;
+    EXPECT_EQ(changed, 0u) << "block of " << block.size << " bytes";
+  }
+}
+
+void FreeBlocks(const std::vector<Block>& blocks) {
+  for (const Block& block : blocks) SysFree(block.bytes);
+}
+
+constexpr size_t kLargest = 300;  // past the small sizes, into malloc's
+
+// Blocks given back are handed out again, on the thread that freed them or
+// on another once it has ended: each must hold what was asked, apart from
+// every other, and be counted.
+TEST(HostHeapTest, BlocksGivenBackServeLaterRequestsOfTheirSize) {
   const int64_t live_before = host::LiveBlockCount();
   const uint64_t count_before = host::AllocationCount();
-  constexpr size_t kLargest = 160;
-  for (size_t round = 0; round < 2; ++round) {
-    std::vector<void*> blocks;
-    for (size_t size = 1; size <= kLargest; ++size) {
-      // Freed in the order they were made, the blocks come back last first:
-      // the second round's sizes each get a block freed for another size.
-      const size_t asked = size;
-      void* block = SysAlloc(asked);
-      ASSERT_NE(block, nullptr);
-      EXPECT_GE(malloc_usable_size(block), asked) << asked << " bytes asked";
-      std::memset(block, 0xA5, asked);
-      blocks.push_back(block);
-    }
-    EXPECT_EQ(host::LiveBlockCount(), live_before + static_cast<int64_t>(kLargest));
-    for (void* block : blocks) SysFree(block);
+
+  std::vector<Block> kept = MakeBlocks(kLargest, 0);
+  for (int round = 0; round < 2; ++round) {
+    std::vector<Block> blocks = MakeBlocks(kLargest, static_cast<uint8_t>(round + 1));
+    EXPECT_EQ(host::LiveBlockCount(), live_before + static_cast<int64_t>(2 * kLargest));
+    ExpectIntact(blocks);
+    FreeBlocks(blocks);
   }
+
+  // Made on one thread, freed on a second, which makes more and ends with
+  // blocks on its lists; the blocks it left serve this thread.
+  std::vector<Block> from_other;
+  std::thread maker([&] { from_other = MakeBlocks(kLargest, 7); });
+  maker.join();
+  std::thread freer([&] {
+    FreeBlocks(from_other);
+    std::vector<Block> own = MakeBlocks(kLargest, 9);
+    ExpectIntact(own);
+    FreeBlocks(own);
+    FreeBlocks(MakeBlocks(kLargest, 11));
+  });
+  freer.join();
+  std::vector<Block> after = MakeBlocks(kLargest, 13);
+  ExpectIntact(kept);
+  ExpectIntact(after);
+  FreeBlocks(after);
+  FreeBlocks(kept);
+
   EXPECT_EQ(host::LiveBlockCount(), live_before);
-  EXPECT_EQ(host::AllocationCount(), count_before + 2 * kLargest);
+  EXPECT_EQ(host::AllocationCount(), count_before + 7 * kLargest);
 }
 
 }  // namespace
