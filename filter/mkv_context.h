@@ -43,6 +43,7 @@ struct MkvContext {
 
   // Stream set-up.
   uint32_t Rated;
+  uint32_t RatingTried;  // an earlier rating may have left a file model, channels or a ring behind
   int32_t OutputChannelCount;
   int32_t AcquiredChannelCount;
   uint64_t Duration;  // "Duration", microseconds

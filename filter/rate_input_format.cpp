@@ -117,7 +117,9 @@ int RateInputFormat(MkvChannel* input, const MmfMediaFormat* format, uint32_t re
 
   MmfInputStream* stream = nullptr;
   if (MmfGetInputStream(AsFrameworkChannel(input), &stream) != 0 || !stream) return kRatingRefused;
-  DiscardEarlierAttempt(filter);
+  // A fresh context is all zero already: clearing its large file model again costs for nothing.
+  if (context->RatingTried) DiscardEarlierAttempt(filter);
+  context->RatingTried = 1;
 
   context->Seekable = 0;
   if (format->no_seek_test != kNoSeekTest) {

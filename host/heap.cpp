@@ -83,7 +83,9 @@ inline uint32_t ClassOf(size_t size) { return size == 0 ? 1 : static_cast<uint32
 struct SmallBlockRange {
   uint8_t* base = nullptr;  // null when the range could not be reserved: all to malloc
   std::atomic<size_t> chunks_taken{0};
-  uint8_t class_of_chunk[kChunks] = {};
+  // No initialiser: zero as the object's static storage is before it is
+  // constructed, and clearing it again would touch every page of it.
+  uint8_t class_of_chunk[kChunks];
 
   SmallBlockRange() {
     void* range = mmap(nullptr, kRangeBytes, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS | MAP_NORESERVE, -1, 0);

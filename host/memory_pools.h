@@ -78,10 +78,15 @@ inline void DropBufferReference(MmfPoolBuffer* buffer) {
 MmfMraPool* MakeMraPool(uint32_t count, uint32_t capacity);
 uint32_t MraPoolFreeCount(MmfMraPool* pool);
 
+constexpr uint32_t kOwnReference = 1;
+
 // One element of a media buffer as the host stores it.
 struct MraElement {
   uint32_t kind;  // kMmfElement...
-  uint32_t type;  // property type
+  // Property type. For a buffer element: kOwnReference when it holds a
+  // reference of its own, else an earlier element of the media buffer holds
+  // the one on the same pool buffer that it relies on.
+  uint32_t type;
   uint32_t low;
   uint16_t high;
   MmfPoolBuffer* handle;  // buffer element: holds one reference

@@ -181,14 +181,3 @@ bool mkvcluster_inside_element(const mkvcluster* cluster) {
   }
 }
 
-// Called before every block by every channel, most often with nothing to free.
-void destroy_mkvcluster(mkvcluster* cluster) {
-  if (cluster->codec_state) {
-    mem_free(cluster->codec_state);
-    cluster->codec_state = nullptr;
-  }
-  if (cluster->frame_sizes) {
-    mem_free(cluster->frame_sizes);
-    cluster->frame_sizes = nullptr;
-  }
-}

@@ -9,6 +9,7 @@
 
 #include "core/cluster/ebml_number.h"
 #include "core/cluster/mkv_inbuff.h"
+#include "core/memory.h"
 
 constexpr uint32_t kMaxLaceFrames = 256;  // a frame-count byte of 255
 constexpr uint32_t kMaxCodecStateSize = 32768;
@@ -97,5 +98,16 @@ static_assert(std::is_standard_layout_v<mkvcluster> && std::is_trivially_copyabl
 // awaited. A record waiting for the next header with none of it read is not.
 [[nodiscard]] bool mkvcluster_inside_element(const mkvcluster* cluster);
 
-// Frees codec_state and frame_sizes and nulls them; other fields stay.
-void destroy_mkvcluster(mkvcluster* cluster);
+// Frees codec_state and frame_sizes and nulls them; other fields stay. Every
+// channel calls it before every block, most often with only a one-entry
+// table to free, so it is inline.
+inline void destroy_mkvcluster(mkvcluster* cluster) {
+  if (cluster->codec_state) {
+    mem_free(cluster->codec_state);
+    cluster->codec_state = nullptr;
+  }
+  if (cluster->frame_sizes) {
+    mem_free(cluster->frame_sizes);
+    cluster->frame_sizes = nullptr;
+  }
+}

@@ -8,6 +8,7 @@
 #include <memory>
 #include <thread>
 #include <tuple>
+#include <vector>
 
 #include <gtest/gtest.h>
 
@@ -137,6 +138,53 @@ TEST_F(MediaBufferTest, ElementsKeepTheirKindAndIndexesStayInsideTheCount) {
   Ops().ReleaseBuffer(buffer);
   ASSERT_EQ(MmfSetMraPropertyElement(mra_, 1, kMmfPropSkipMark, 0, 0), 0);
   EXPECT_EQ(bytes_.FreeCount(), 2u);
+}
+
+// Frames of one pool buffer appended one after another share one reference;
+// whatever replaces elements, the pool buffer goes back exactly when the last
+// element on it is gone, and not before.
+TEST_F(MediaBufferTest, ElementsOnOnePoolBufferKeepItUntilTheLastOfThemGoes) {
+  enum Set { kPropertyAt, kOnA, kOnB };
+  struct Step {
+    Set set;
+    uint32_t index;
+    uint32_t a_references, b_references;  // the media buffer's, after the step
+  };
+  const struct {
+    const char* name;
+    std::vector<Step> steps;
+  } cases[] = {
+      {"appended frames share one", {{kOnA, 0, 1, 0}, {kPropertyAt, 1, 1, 0}, {kOnA, 2, 1, 0}, {kOnA, 3, 1, 0}}},
+      {"the holder replaced: a sharer takes over",
+       {{kOnA, 0, 1, 0}, {kOnA, 1, 1, 0}, {kOnA, 2, 1, 0}, {kPropertyAt, 0, 1, 0}, {kPropertyAt, 1, 1, 0},
+        {kPropertyAt, 2, 0, 0}}},
+      {"the holder replaced by another buffer's frame",
+       {{kOnA, 0, 1, 0}, {kOnA, 1, 1, 0}, {kOnB, 0, 1, 1}, {kOnB, 1, 0, 2}}},
+      {"another buffer between: each run holds its own",
+       {{kOnA, 0, 1, 0}, {kOnB, 1, 1, 1}, {kOnA, 2, 2, 1}, {kPropertyAt, 0, 1, 1}, {kPropertyAt, 2, 0, 1}}},
+      {"a replaced frame on the same buffer", {{kOnA, 0, 1, 0}, {kOnA, 0, 1, 0}, {kOnA, 1, 2, 0}}},
+      {"the only holder replaced, then a frame appended", {{kOnA, 0, 1, 0}, {kPropertyAt, 0, 0, 0}, {kOnA, 1, 1, 0}}},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    MmfPoolBuffer* a = Acquire(bytes_);
+    MmfPoolBuffer* b = Acquire(bytes_);
+    ASSERT_TRUE(a && b);
+    for (const Step& step : c.steps) {
+      SCOPED_TRACE(step.index);
+      const int result = step.set == kPropertyAt ? MmfSetMraPropertyElement(mra_, step.index, kMmfPropSkipMark, 0, 0)
+                         : step.set == kOnA      ? MmfSetMraBufferElement(mra_, step.index, a, a->Data + step.index, 1)
+                                                 : MmfSetMraBufferElement(mra_, step.index, b, b->Data + step.index, 1);
+      ASSERT_EQ(result, 0);
+      EXPECT_EQ(host::BufferReferences(a), 1 + step.a_references);
+      EXPECT_EQ(host::BufferReferences(b), 1 + step.b_references);
+    }
+    Ops().ReleaseBuffer(a);
+    Ops().ReleaseBuffer(b);
+    ASSERT_EQ(MmfReleaseMra(mra_), 0);
+    EXPECT_EQ(bytes_.FreeCount(), 2u);  // both back, each once
+    ASSERT_EQ(MmfAcquireMra(mras_, &mra_, kMmfAcquireNoWait), 0);
+  }
 }
 
 TEST_F(MediaBufferTest, BufferElementMustLieInsideItsPoolBuffer) {
