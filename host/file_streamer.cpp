@@ -20,7 +20,7 @@ FileStreamer::FileStreamer(InputStream* source, StreamerConfig config)
     : source_(source),
       config_(config),
       bytes_(std::make_unique<MemoryPool>(config.buffer_size, config.buffer_count)),
-      read_ahead_(source, bytes_.get()) {
+      read_ahead_(source, bytes_.get(), config.reader_cpu) {
   output_.Kind = kMmfChannelKind;
   output_.Direction = kMmfDirectionOutput;
   output_.Format.buffer_size = config.buffer_size;

@@ -32,6 +32,7 @@ struct StreamerConfig {
   // then read between NextBuffer calls too, so it must outlive the streamer
   // strictly; and the order of reads and of pool use is no longer fixed.
   bool read_ahead = false;
+  int reader_cpu = -1;  // where the read-ahead thread runs; -1: anywhere
 };
 
 class FileStreamer {

@@ -11,6 +11,7 @@
 #include "host/graph_setup.h"
 #include "host/input_streams.h"
 #include "host/memory_pools.h"
+#include "host/thread_placement.h"
 #include "platform/media_buffer.h"
 #include "platform/mmf_status.h"
 
@@ -336,9 +337,11 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
 
   MemoryPool prefix_pool(kPrefixBufferSize, kPrefixBuffers);
   MemoryPool config_pool(options.config_buffer_size, kConfigBuffers);
+  const ThreadPlacement placement = options.channels_share_core ? PlaceChannelsTogether() : ThreadPlacement{};
   FileStreamer streamer(source.get(), StreamerConfig{options.input_buffer_size,
                                                      InputBufferCount(options.input_buffer_size),
-                                                     options.first_input_buffer_size, options.read_ahead});
+                                                     options.first_input_buffer_size, options.read_ahead,
+                                                     placement.reader_cpu});
   SetupOptions setup;
   setup.buffer_size = options.input_buffer_size;
   setup.configure_outputs = false;
@@ -405,6 +408,7 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
       // By pointer: a Thumb function's address is odd, and a reference bound to it reads as misaligned.
       sinks.emplace_back(&SinkThread, output, acquired[i], &out.channels[i], std::cref(options), delay,
                          config_pool.handle(), prefix_pool.handle(), playback.get(), GraphStopper{control, handle});
+      KeepOnCpu(sinks.back(), placement.channels_cpu);
     }
     std::thread controller;
     if (playback) {

@@ -60,6 +60,9 @@ struct RunnerOptions {
   // the channels parse (see StreamerConfig::read_ahead); off for tests that
   // need a fixed order of reads.
   bool read_ahead = false;
+  // The sinks' threads side by side on one core and the reader on another
+  // (see host/thread_placement.h): for sinks that do little of their own.
+  bool channels_share_core = false;
   bool preroll = false;       // sets "EnablePreroll"
   int32_t trick_time_ms = 0;  // sets "TrickTime" when not 0
 };

@@ -1,5 +1,7 @@
 #include "host/read_ahead.h"
 
+#include "host/thread_placement.h"
+
 #include <chrono>
 
 namespace host {
@@ -14,7 +16,7 @@ constexpr size_t kRefill = kDepth / 2;
 
 }  // namespace
 
-ReadAhead::ReadAhead(InputStream* source, MemoryPool* pool) : source_(source), pool_(pool) {}
+ReadAhead::ReadAhead(InputStream* source, MemoryPool* pool, int cpu) : source_(source), pool_(pool), cpu_(cpu) {}
 
 ReadAhead::~ReadAhead() {
   std::unique_lock lock(mutex_);
@@ -33,7 +35,10 @@ void ReadAhead::Start(uint64_t offset, uint32_t size) {
   active_ = true;
   next_ = offset;
   size_ = size;
-  if (!thread_.joinable()) thread_ = std::thread([this] { Run(); });
+  if (!thread_.joinable()) {
+    thread_ = std::thread([this] { Run(); });
+    KeepOnCpu(thread_, cpu_);
+  }
   wanted_.notify_one();
 }
 

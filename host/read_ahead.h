@@ -20,8 +20,9 @@ namespace host {
 
 class ReadAhead {
  public:
-  // `source` and `pool` are not owned and must outlive the read-ahead.
-  ReadAhead(InputStream* source, MemoryPool* pool);
+  // `source` and `pool` are not owned and must outlive the read-ahead. The
+  // thread runs on `cpu` (-1: anywhere).
+  ReadAhead(InputStream* source, MemoryPool* pool, int cpu = -1);
   // Stops the thread, and gives the buffers read ahead back to their pool.
   ~ReadAhead();
   ReadAhead(const ReadAhead&) = delete;
@@ -52,6 +53,7 @@ class ReadAhead {
 
   InputStream* source_;
   MemoryPool* pool_;
+  int cpu_;
   std::mutex mutex_;
   std::condition_variable wanted_;  // the thread may read more, or stop
   std::condition_variable done_;    // a read finished

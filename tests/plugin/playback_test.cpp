@@ -59,6 +59,7 @@ INSTANTIATE_TEST_SUITE_P(Fixtures, PlaybackFixtureTest, testing::ValuesIn(testin
 struct ThreadsCase {
   const char* fixture;
   std::vector<uint32_t> sink_delay_us;  // per channel
+  bool as_the_tool = false;             // the streamer reads ahead; the channels share one core
 };
 
 class PlaybackThreadsTest : public testing::TestWithParam<ThreadsCase> {};
@@ -72,6 +73,8 @@ TEST_P(PlaybackThreadsTest, ChannelsAtDifferentSpeedsEachGetTheirWholeTrack) {
   host::RunnerOptions options;
   options.input_buffer_size = 1000;
   options.sink_delay_us = c.sink_delay_us;
+  options.read_ahead = c.as_the_tool;
+  options.channels_share_core = c.as_the_tool;
   CheckRun(c.fixture, fixture, OfferedTracks(fixture),
            host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(c.fixture), options));
 }
@@ -79,7 +82,9 @@ TEST_P(PlaybackThreadsTest, ChannelsAtDifferentSpeedsEachGetTheirWholeTrack) {
 INSTANTIATE_TEST_SUITE_P(Speeds, PlaybackThreadsTest,
                          testing::Values(ThreadsCase{"long_cues", {0, 3000}}, ThreadsCase{"long_cues", {3000, 0}},
                                          ThreadsCase{"multi_audio", {2000, 0, 1000, 0}},
-                                         ThreadsCase{"multi_audio", {0, 0, 0, 3000}}),
+                                         ThreadsCase{"multi_audio", {0, 0, 0, 3000}},
+                                         ThreadsCase{"long_cues", {0, 3000}, true},
+                                         ThreadsCase{"multi_audio", {0, 0, 0, 0}, true}),
                          [](const testing::TestParamInfo<ThreadsCase>& info) {
                            return std::string(info.param.fixture) + "_" + std::to_string(info.index);
                          });
