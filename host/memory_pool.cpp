@@ -6,6 +6,7 @@
 #include <cstring>
 #include <memory>
 #include <mutex>
+#include <new>
 #include <type_traits>
 #include <vector>
 
@@ -13,12 +14,21 @@
 
 namespace {
 
+// Frees the storage of records that need no destruction.
+struct StorageDeleter {
+  void operator()(host::PoolBuffer* records) const { ::operator delete[](records); }
+};
+static_assert(std::is_trivially_destructible_v<host::PoolBuffer>);
+
 struct PoolState {
   std::mutex mutex;
   std::condition_variable returned;
   uint32_t size = 0;
-  std::unique_ptr<host::PoolBuffer[]> buffers;
+  // Records are made as they are first handed out: a generous pool costs
+  // nothing for the buffers a run never needs.
+  std::unique_ptr<host::PoolBuffer[], StorageDeleter> buffers;
   uint32_t count = 0;
+  uint32_t made = 0;  // buffers[0, made) have their records
   // Left unfilled: a page costs memory only once a buffer that uses it is filled.
   std::unique_ptr<uint8_t[]> bytes;
   std::vector<host::PoolBuffer*> free;
@@ -31,9 +41,18 @@ host::PoolBuffer* Host(MmfPoolBuffer* buffer) { return reinterpret_cast<host::Po
 
 // With the pool's lock held: a free buffer with one reference, or null.
 MmfPoolBuffer* TakeLocked(PoolState* state) {
-  if (state->free.empty()) return nullptr;
-  host::PoolBuffer* buffer = state->free.back();
-  state->free.pop_back();
+  host::PoolBuffer* buffer = nullptr;
+  if (!state->free.empty()) {
+    buffer = state->free.back();
+    state->free.pop_back();
+  } else if (state->made < state->count) {
+    const uint32_t i = state->made++;
+    const MmfPoolBuffer record{reinterpret_cast<MmfMemoryPool*>(state),
+                               state->bytes.get() + static_cast<size_t>(state->size) * i, state->size, 0};
+    buffer = new (&state->buffers[i]) host::PoolBuffer{record, {0}, 0};
+  } else {
+    return nullptr;
+  }
   buffer->references.store(1, std::memory_order_relaxed);
   buffer->mapped = 0;
   ++state->in_use;
@@ -46,8 +65,9 @@ uint32_t OpBufferCount(MmfMemoryPool* pool) {
 }
 uint32_t OpFreeCount(MmfMemoryPool* pool) {
   if (!pool) return 0;
-  std::lock_guard lock(State(pool)->mutex);
-  return static_cast<uint32_t>(State(pool)->free.size());
+  PoolState* state = State(pool);
+  std::lock_guard lock(state->mutex);
+  return static_cast<uint32_t>(state->free.size()) + (state->count - state->made);
 }
 
 int OpAcquireBuffer(MmfMemoryPool* pool, MmfPoolBuffer** buffer, uint32_t) {
@@ -97,17 +117,10 @@ MemoryPool::MemoryPool(uint32_t size, uint32_t count) {
   auto* state = new PoolState;
   state->size = size;
   state->bytes.reset(new uint8_t[static_cast<size_t>(size) * count]);
-  state->buffers.reset(new host::PoolBuffer[count]);
+  // Storage only: each record is made when its buffer is first taken.
+  state->buffers.reset(static_cast<host::PoolBuffer*>(::operator new[](sizeof(host::PoolBuffer) * count)));
   state->count = count;
-  for (uint32_t i = 0; i < count; ++i) {
-    host::PoolBuffer& buffer = state->buffers[i];
-    buffer.record.Pool = reinterpret_cast<MmfMemoryPool*>(state);
-    buffer.record.Data = state->bytes.get() + static_cast<size_t>(size) * i;
-    buffer.record.Size = size;
-    buffer.references.store(0, std::memory_order_relaxed);
-    buffer.mapped = 0;
-    state->free.push_back(&buffer);
-  }
+  state->free.reserve(count);
   handle_ = reinterpret_cast<MmfMemoryPool*>(state);
 }
 
@@ -127,7 +140,7 @@ const MmfMemoryPoolOps* MemoryPool::Ops() { return &kPoolOps; }
 MmfPoolBuffer* MemoryPool::AcquireWaiting(std::chrono::milliseconds timeout) {
   PoolState* state = State(handle_);
   std::unique_lock lock(state->mutex);
-  state->returned.wait_for(lock, timeout, [state] { return !state->free.empty(); });
+  state->returned.wait_for(lock, timeout, [state] { return !state->free.empty() || state->made < state->count; });
   return TakeLocked(state);
 }
 
