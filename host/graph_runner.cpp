@@ -79,12 +79,18 @@ class Sink {
 
   void Consume(MmfMra* mra) {
     const MraElement* element = MraElements(mra);
-    for (const MraElement* end = element + mra->ElementCount; element != end; ++element) {
+    const MraElement* const end = element + mra->ElementCount;
+    while (element != end) {
+      if (config_left_ == 0 && !in_parts_ && !checksum_) {
+        element = TakeWholeFrames(element, end);
+        if (element == end) break;
+      }
       if (element->kind == kMmfElementBuffer) {
         Buffer(*element);
       } else if (element->kind == kMmfElementProperty) {
         Property(*element);
       }
+      ++element;
     }
     PassFrames();
   }
@@ -172,6 +178,39 @@ class Sink {
     last_part_ = false;
     const RunFrame frame = frame_;
     Deliver(frame);
+  }
+
+  // Nearly every element is a frame's time or a whole frame: without
+  // checksums those go straight into the batch, the sink's state held in
+  // locals, up to the first element of another kind (or the end), which is
+  // returned for the general steps.
+  const MraElement* TakeWholeFrames(const MraElement* element, const MraElement* end) {
+    uint64_t time = time_;
+    bool marked = marked_;
+    RunFrame* out = batch_end_;
+    uint64_t foreign = 0;
+    for (; element != end; ++element) {
+      if (element->kind == kMmfElementProperty) {
+        const uint32_t type = element->type;
+        if (type != kMmfPropVideoTime && type != kMmfPropAudioTime && type != kMmfPropSubtitleTime) break;
+        time = MmfPropertyValue(element->low, element->high);
+        continue;
+      }
+      if (element->kind != kMmfElementBuffer) break;
+      foreign += ZeroCopy(element->handle) ? 0 : 1;
+      *out++ = RunFrame{time, element->size, 0, marked};
+      marked = false;
+      if (out == batch_ + kFrameBatch) {
+        batch_end_ = out;
+        PassFrames();
+        out = batch_end_;
+      }
+    }
+    time_ = time;
+    marked_ = marked;
+    batch_end_ = out;
+    run_->foreign_elements += foreign;
+    return element;
   }
 
   static uint32_t Checksum(const MraElement& element) {

@@ -8,6 +8,7 @@
 #include <cstdio>
 #include <fstream>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -55,6 +56,43 @@ TEST_P(PlaybackFixtureTest, EveryTrackDeliversTheListedFramesAtEveryBufferSize) 
 
 INSTANTIATE_TEST_SUITE_P(Fixtures, PlaybackFixtureTest, testing::ValuesIn(testing_support::FixtureNames()),
                          [](const testing::TestParamInfo<std::string>& info) { return info.param; });
+
+// The tool plays without checksums another way: sinks take whole frames on a
+// short path, one thread consumes every channel's buffers, the channels share
+// a core and the streamer reads ahead. What each channel gets is the same.
+TEST_P(PlaybackFixtureTest, WithoutChecksumsTheToolsWayDeliversTheSameFrames) {
+  const std::string name = GetParam();
+  for (uint32_t size : {1000u, 65536u}) {
+    SCOPED_TRACE("input buffers of " + std::to_string(size) + " bytes");
+    host::RunnerOptions plain;
+    plain.input_buffer_size = size;
+    host::RunnerOptions tool = plain;
+    tool.checksum = false;
+    tool.read_ahead = true;
+    tool.channels_share_core = true;
+    tool.consumer_thread = true;
+    const host::RunResult expected = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), plain);
+    const host::RunResult got = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), tool);
+    ASSERT_EQ(got.ok, expected.ok) << got.error;
+    ASSERT_EQ(got.channels.size(), expected.channels.size());
+    for (size_t k = 0; k < got.channels.size(); ++k) {
+      SCOPED_TRACE("channel " + std::to_string(k));
+      const host::ChannelRun &a = got.channels[k], &b = expected.channels[k];
+      ASSERT_EQ(a.frames.size(), b.frames.size());
+      for (size_t i = 0; i < a.frames.size(); ++i) {
+        ASSERT_EQ(std::make_tuple(a.frames[i].time_us, a.frames[i].size, a.frames[i].marked, a.frames[i].adler32),
+                  std::make_tuple(b.frames[i].time_us, b.frames[i].size, b.frames[i].marked, 0u))
+            << "frame " << i;
+      }
+      EXPECT_EQ(a.frame_count, b.frame_count);
+      EXPECT_EQ(a.last_time_us, b.last_time_us);
+      EXPECT_EQ(a.config.size(), b.config.size());
+      EXPECT_EQ(a.foreign_elements, b.foreign_elements);
+      EXPECT_EQ(a.incomplete_frame, b.incomplete_frame);
+      EXPECT_EQ(a.time_markers, b.time_markers);
+    }
+  }
+}
 
 struct ThreadsCase {
   const char* fixture;
