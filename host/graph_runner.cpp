@@ -3,11 +3,8 @@
 #include <algorithm>
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <memory>
-#include <mutex>
 #include <thread>
-#include <vector>
 
 #include "host/file_streamer.h"
 #include "host/graph_clock.h"
@@ -96,8 +93,6 @@ class Sink {
   }
 
   void Finish() { run_->incomplete_frame = in_parts_; }
-  ChannelRun* run() const { return run_; }
-  int32_t index() const { return index_; }
 
   // After a seek or a scan took effect: a frame being put together is lost to the flush.
   void Restart() {
@@ -277,63 +272,10 @@ struct GraphStopper {
   }
 };
 
-// Output buffers on their way from the channel threads to the thread that
-// consumes them all (RunnerOptions::consumer_thread), in delivery order. The
-// consumer takes everything waiting at once, and is woken only when it may
-// be asleep: when a buffer comes to an empty queue.
-class ConsumerQueue {
- public:
-  struct Item {
-    Sink* sink;
-    MmfMra* mra;  // null: the sink's channel has ended
-  };
-  void Push(Item item) {
-    bool was_empty;
-    {
-      std::lock_guard lock(mutex_);
-      was_empty = items_.empty();
-      items_.push_back(item);
-    }
-    if (was_empty) ready_.notify_one();
-  }
-  // Everything waiting, in order, once there is something.
-  void TakeAll(std::vector<Item>* taken) {
-    taken->clear();
-    std::unique_lock lock(mutex_);
-    ready_.wait(lock, [this] { return !items_.empty(); });
-    taken->swap(items_);
-  }
-
- private:
-  std::mutex mutex_;
-  std::condition_variable ready_;
-  std::vector<Item> items_;
-};
-
-// Consumes what the channels deliver until each of `channels` has ended.
-void ConsumerThread(ConsumerQueue* queue, size_t channels, const RunnerOptions& options) {
-  std::vector<ConsumerQueue::Item> taken;
-  for (size_t ended = 0; ended < channels;) {
-    queue->TakeAll(&taken);
-    for (const ConsumerQueue::Item& item : taken) {
-      if (!item.mra) {
-        item.sink->Finish();
-        ++ended;
-        continue;
-      }
-      item.sink->Consume(item.mra);
-      if (options.on_buffer) options.on_buffer(options.user, item.sink->index(), item.mra);
-      (void)MmfReleaseMra(item.mra);
-    }
-  }
-}
-
-// Calls NextBuffer until the channel ends, and consumes each output buffer,
-// or hands it to the consumer thread when there is one (`queue`).
-void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, Sink* sink_of_channel, ConsumerQueue* queue,
-                const RunnerOptions& options, uint32_t delay_us, PlaybackControl* playback, GraphStopper stopper) {
-  Sink& sink = *sink_of_channel;
-  ChannelRun* run = sink.run();
+void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun* run, const RunnerOptions& options,
+                uint32_t delay_us, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool, PlaybackControl* playback,
+                GraphStopper stopper) {
+  Sink sink(run, options, config_pool, prefix_pool);
   auto restart = [&] {
     if (playback->Flushed()) sink.Restart();
     run->seeks.push_back(static_cast<size_t>(run->frame_count));
@@ -355,21 +297,13 @@ void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, Sink* sink
     }
     short_inputs = 0;
     ++run->buffers;
-    if (queue) {
-      queue->Push({&sink, mra});
-      continue;
-    }
     sink.Consume(mra);
     if (playback && run->frame_count && playback->Consumed(run->last_time_us)) restart();
     if (options.on_buffer) options.on_buffer(options.user, run->index, mra);
     (void)MmfReleaseMra(mra);
     if (delay_us) std::this_thread::sleep_for(std::chrono::microseconds(delay_us));
   }
-  if (queue) {
-    queue->Push({&sink, nullptr});
-  } else {
-    sink.Finish();
-  }
+  sink.Finish();
 }
 
 // The streamer's upstream as the plug-in sees it. Playback from the first
@@ -507,25 +441,12 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
     if (!own_upstream && (!options.actions.empty() || options.script)) {
       playback = std::make_unique<PlaybackControl>(ControlTablesOf(plugin), handle, &streamer, &clock, acquired.size());
     }
-    std::vector<std::unique_ptr<Sink>> sink_of;
-    for (size_t i = 0; i < acquired.size(); ++i) {
-      sink_of.push_back(std::make_unique<Sink>(&out.channels[i], options, config_pool.handle(), prefix_pool.handle()));
-    }
-    // Consumption moves off the channel threads only where nothing waits for it
-    // (playback control follows what each sink has consumed).
-    std::unique_ptr<ConsumerQueue> queue;
-    std::thread consumer;
-    if (options.consumer_thread && !playback && !acquired.empty()) {
-      queue = std::make_unique<ConsumerQueue>();
-      // Left to the scheduler: it finds the core with room, the channels' or the reader's.
-      consumer = std::thread(&ConsumerThread, queue.get(), acquired.size(), std::cref(options));
-    }
     std::vector<std::thread> sinks;
     for (size_t i = 0; i < acquired.size(); ++i) {
       uint32_t delay = i < options.sink_delay_us.size() ? options.sink_delay_us[i] : 0;
       // By pointer: a Thumb function's address is odd, and a reference bound to it reads as misaligned.
-      sinks.emplace_back(&SinkThread, output, acquired[i], sink_of[i].get(), queue.get(), std::cref(options), delay,
-                         playback.get(), GraphStopper{control, handle});
+      sinks.emplace_back(&SinkThread, output, acquired[i], &out.channels[i], std::cref(options), delay,
+                         config_pool.handle(), prefix_pool.handle(), playback.get(), GraphStopper{control, handle});
       KeepOnCpu(sinks.back(), placement.channels_cpu);
     }
     std::thread controller;
@@ -540,7 +461,6 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
       });
     }
     for (std::thread& sink : sinks) sink.join();
-    if (consumer.joinable()) consumer.join();
     if (controller.joinable()) controller.join();
     (void)control->Stop(handle);
     out.ok = std::all_of(out.channels.begin(), out.channels.end(),

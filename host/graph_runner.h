@@ -63,10 +63,6 @@ struct RunnerOptions {
   // The sinks' threads side by side on one core and the reader on another
   // (see host/thread_placement.h): for sinks that do little of their own.
   bool channels_share_core = false;
-  // The sinks' work on each output buffer moves from the channel threads to
-  // one thread of its own, so that the channel threads only pull buffers.
-  // Not with playback control, which follows what each sink has consumed.
-  bool consumer_thread = false;
   bool preroll = false;       // sets "EnablePreroll"
   int32_t trick_time_ms = 0;  // sets "TrickTime" when not 0
 };

@@ -267,10 +267,8 @@ int RunPackets(int argc, char** argv) {
   if (int code = ParseOptions(argc, argv, &options); code >= 0) return code;
   // Without checksums a sink does next to nothing of its own: its thread is
   // one of the channel threads that take turns under the plug-in's lock, and
-  // those run best side by side on one core, with what little the sinks do
-  // on one thread beside the reader.
+  // those run best side by side on one core.
   options.run.channels_share_core = !options.run.checksum;
-  options.run.consumer_thread = !options.run.checksum;
   const char* file = options.file;
   if (int code = CheckInputFile("packets", file); code != kExitOk) return code;
   auto plugin = LoadPlugin("packets", options.plugin_path);

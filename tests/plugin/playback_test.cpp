@@ -97,7 +97,7 @@ TEST_P(PlaybackFixtureTest, WithoutChecksumsTheToolsWayDeliversTheSameFrames) {
 struct ThreadsCase {
   const char* fixture;
   std::vector<uint32_t> sink_delay_us;  // per channel
-  bool as_the_tool = false;  // the streamer reads ahead; the channels share one core; one thread consumes
+  bool as_the_tool = false;             // the streamer reads ahead; the channels share one core
 };
 
 class PlaybackThreadsTest : public testing::TestWithParam<ThreadsCase> {};
@@ -113,7 +113,6 @@ TEST_P(PlaybackThreadsTest, ChannelsAtDifferentSpeedsEachGetTheirWholeTrack) {
   options.sink_delay_us = c.sink_delay_us;
   options.read_ahead = c.as_the_tool;
   options.channels_share_core = c.as_the_tool;
-  options.consumer_thread = c.as_the_tool;
   CheckRun(c.fixture, fixture, OfferedTracks(fixture),
            host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(c.fixture), options));
 }
