@@ -58,8 +58,8 @@ INSTANTIATE_TEST_SUITE_P(Fixtures, PlaybackFixtureTest, testing::ValuesIn(testin
                          [](const testing::TestParamInfo<std::string>& info) { return info.param; });
 
 // The tool plays without checksums another way: sinks take whole frames on a
-// short path, one thread consumes every channel's buffers, the channels share
-// a core and the streamer reads ahead. What each channel gets is the same.
+// short path, the channels share a core and the streamer reads ahead. What
+// each channel gets is the same.
 TEST_P(PlaybackFixtureTest, WithoutChecksumsTheToolsWayDeliversTheSameFrames) {
   const std::string name = GetParam();
   for (uint32_t size : {1000u, 65536u}) {
@@ -70,7 +70,6 @@ TEST_P(PlaybackFixtureTest, WithoutChecksumsTheToolsWayDeliversTheSameFrames) {
     tool.checksum = false;
     tool.read_ahead = true;
     tool.channels_share_core = true;
-    tool.consumer_thread = true;
     const host::RunResult expected = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), plain);
     const host::RunResult got = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), tool);
     ASSERT_EQ(got.ok, expected.ok) << got.error;
