@@ -49,7 +49,7 @@ const char kPacketsHelp[] =
     "  --channels K,K,...  output channels to acquire, by index (default: all)\n"
     "  --buffer-size BYTES\n"
     "                      bytes per input buffer, 1 to 67108864 (default 65536)\n"
-    "  --no-hash           no Adler-32 of the frames\n"
+    "  --no-hash           no Adler-32 of the frames (the channel threads then share one core)\n"
     "  --json              one JSON document instead of lines (docs/json.md, section packets)\n"
     "  --plugin PATH       the plug-in to load (default: kelvane.so beside this program)\n"
     "  -h, --help          this text\n"
