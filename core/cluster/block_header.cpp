@@ -2,16 +2,17 @@
 
 #include <cstring>
 
+#include "core/cluster/block_flags.h"
 #include "core/cluster/cluster_status.h"
 #include "core/cluster/element_header.h"
 #include "core/memory.h"
 
 namespace {
 
-constexpr uint8_t kLacingBits = 0x06;
-constexpr uint8_t kNoLacing = 0x00;
-constexpr uint8_t kFixedLacing = 0x04;
-constexpr uint8_t kXiphLacing = 0x02;
+using block_flags::kFixedLacing;
+using block_flags::kLacingBits;
+using block_flags::kNoLacing;
+using block_flags::kXiphLacing;
 
 // Block sizes are 32-bit signed arithmetic that wraps, as real muxers' sizes
 // never come near it and hostile ones must not be undefined behaviour.

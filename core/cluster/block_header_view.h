@@ -9,6 +9,7 @@
 #include <cstdint>
 #include <cstring>
 
+#include "core/cluster/block_flags.h"
 #include "core/cluster/cluster_ids.h"
 #include "core/cluster/element_header.h"
 #include "core/cluster/mkv_cluster.h"
@@ -16,9 +17,7 @@
 
 namespace cluster_shortcut {
 
-constexpr uint8_t kLacingBits = 0x06;
-constexpr uint8_t kXiphLacingBits = 0x02;
-constexpr uint8_t kFixedLacingBits = 0x04;
+using block_flags::kLacingBits;
 // Sizes up to here keep the parser's 32-bit block arithmetic exact.
 constexpr uint64_t kLargestExactSize = 0x7FFFFFFF;
 // The longest header taken here: BlockGroup ID and size, Block ID and size,

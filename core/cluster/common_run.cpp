@@ -7,9 +7,9 @@ bool lace_table_fits(const uint8_t* at, uint32_t size, uint8_t lacing) {
   const uint8_t* entry = at + 8;
   const uint8_t* const end = at + 3 + size;
   const uint32_t sizes = at[7];  // every frame but the last has one
-  if (lacing == kFixedLacingBits) return true;
+  if (lacing == block_flags::kFixedLacing) return true;
   for (uint32_t i = 0; i < sizes; ++i) {
-    if (lacing == kXiphLacingBits) {
+    if (lacing == block_flags::kXiphLacing) {
       uint8_t byte;
       do {
         if (entry >= end) return false;
