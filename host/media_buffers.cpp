@@ -82,33 +82,31 @@ inline bool Append(MmfMra* mra, uint32_t index) {
   return true;
 }
 
-// Sets an existing element to `value`, or answers that index is out of
-// range. Rare (a filter fixing up what it appended), so it stays out of the
-// setters' path. The new reference is taken before the old one goes: an
-// element set again to the same pool buffer must not hand that buffer back.
-// A replaced element that holds a reference others share hands it to the
-// first of them instead of dropping it.
+// Sets an existing element to `value` (a buffer element with a reference of
+// its own), or answers that index is out of range. Rare (a filter fixing up
+// what it appended), so it stays out of the setters' path. The new reference
+// is taken before the old one goes: an element set again to the same pool
+// buffer must not hand that buffer back. A replaced element that holds a
+// reference others share hands it to the first of them instead of dropping it.
 [[gnu::noinline]] int Replace(MmfMra* mra, uint32_t index, const Element& value) {
   if (index >= mra->ElementCount) return kOutOfRange;
   HostMra* host_mra = Host(mra);
   Element* element = &host_mra->elements[index];
   if (value.kind == kMmfElementBuffer) host::ReferenceBuffer(value.handle);
   if (element->kind == kMmfElementBuffer && element->type == host::kOwnReference) {
+    Element* const end = host_mra->elements + mra->ElementCount;
     Element* sharer = element + 1;
-    for (const Element* end = host_mra->elements + mra->ElementCount; sharer != end; ++sharer) {
-      if (sharer->kind == kMmfElementBuffer && sharer->handle == element->handle &&
-          sharer->type != host::kOwnReference) {
-        break;
-      }
+    while (sharer != end && !(sharer->kind == kMmfElementBuffer && sharer->handle == element->handle &&
+                              sharer->type == host::kSharedReference)) {
+      ++sharer;
     }
-    if (sharer != host_mra->elements + mra->ElementCount) {
+    if (sharer != end) {
       sharer->type = host::kOwnReference;
     } else {
       host::DropBufferReference(element->handle);
     }
   }
   *element = value;
-  if (value.kind == kMmfElementBuffer) element->type = host::kOwnReference;
   host_mra->referenced = nullptr;
   return 0;
 }
@@ -258,11 +256,13 @@ extern "C" int MmfSetMraBufferElement(MmfMra* mra, uint32_t index, MmfPoolBuffer
   const uintptr_t offset = reinterpret_cast<uintptr_t>(address) - reinterpret_cast<uintptr_t>(handle->Data);
   uintptr_t end = 0;
   if (__builtin_add_overflow(offset, size, &end) || end > handle->Size) return kInvalid;
-  if (!Append(mra, index)) return Replace(mra, index, Element{kMmfElementBuffer, 0, 0, 0, handle, address, size});
+  if (!Append(mra, index)) {
+    return Replace(mra, index, Element{kMmfElementBuffer, host::kOwnReference, 0, 0, handle, address, size});
+  }
   HostMra* host_mra = Host(mra);
   Element* element = &host_mra->elements[index];
   if (handle == host_mra->referenced) {
-    element->type = 0;  // shares the reference of the element before
+    element->type = host::kSharedReference;
   } else {
     host::ReferenceBuffer(handle);
     element->type = host::kOwnReference;

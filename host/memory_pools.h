@@ -78,18 +78,20 @@ inline void DropBufferReference(MmfPoolBuffer* buffer) {
 MmfMraPool* MakeMraPool(uint32_t count, uint32_t capacity);
 uint32_t MraPoolFreeCount(MmfMraPool* pool);
 
+// A buffer element's `type`: whether it holds its pool buffer's reference.
 constexpr uint32_t kOwnReference = 1;
+constexpr uint32_t kSharedReference = 0;
 
 // One element of a media buffer as the host stores it.
 struct MraElement {
   uint32_t kind;  // kMmfElement...
   // Property type. For a buffer element: kOwnReference when it holds a
-  // reference of its own, else an earlier element of the media buffer holds
-  // the one on the same pool buffer that it relies on.
+  // reference of its own; kSharedReference when an earlier element of the
+  // media buffer holds the one on the same pool buffer that it relies on.
   uint32_t type;
   uint32_t low;
   uint16_t high;
-  MmfPoolBuffer* handle;  // buffer element: holds one reference
+  MmfPoolBuffer* handle;  // buffer element: the pool buffer its bytes lie in
   uint8_t* address;
   uint32_t size;
 };
