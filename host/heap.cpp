@@ -204,20 +204,19 @@ bool AdoptOrphans(ThreadCache& cache, uint32_t c) {
   return adopted;
 }
 
-// A block of class c when the thread's list is empty: cut from its chunk, from
-// what ended threads left, or from a new chunk; null when the range is used up.
-[[gnu::noinline]] void* RefillBlock(ThreadCache& cache, uint32_t c) {
+// A block of class c: from the thread's list, cut from its chunk, from what
+// ended threads left, or from a new chunk; null when the range is used up.
+void* TakeBlock(ThreadCache& cache, uint32_t c) {
   const size_t block_bytes = size_t{c} * kGranule;
   for (;;) {
+    if (FreeBlock* block = cache.lists[c]) {
+      cache.lists[c] = block->next;
+      return block;
+    }
     ChunkRest& rest = cache.rests[c];
     if (rest.next != rest.end) {
       void* block = rest.next;
       rest.next += block_bytes;
-      return block;
-    }
-    if (cache.lists[c]) {
-      FreeBlock* block = cache.lists[c];
-      cache.lists[c] = block->next;
       return block;
     }
     if (AdoptOrphans(cache, c)) continue;
@@ -231,17 +230,12 @@ bool AdoptOrphans(ThreadCache& cache, uint32_t c) {
   }
 }
 
+// Small blocks only for a thread with heap data of its own: only its lists
+// and chunk rests are handed on when it ends.
 void* NewBlock(size_t size) {
-  if (size <= kLargestSmall) {
-    ThreadCache& cache = thread_heap.cache;
-    const uint32_t c = ClassOf(size);
-    if (FreeBlock* block = cache.lists[c]) {
-      cache.lists[c] = block->next;
-      return block;
-    }
-    if (cache.registered) {
-      if (void* block = RefillBlock(cache, c)) return block;
-    }
+  ThreadCache& cache = thread_heap.cache;
+  if (size <= kLargestSmall && cache.registered) {
+    if (void* block = TakeBlock(cache, ClassOf(size))) return block;
   }
   return std::malloc(size);
 }
@@ -303,8 +297,8 @@ void MakeHeapKey() {
 
 // The calling thread's heap data, registered on first use. Should the
 // registration fail, the counts still go to the thread's record, and the
-// thread cuts no chunks (its small blocks come from malloc, or from what
-// other threads freed), so nothing is left behind when it ends.
+// thread keeps no blocks (its requests go to malloc, the small blocks it
+// frees to the other threads), so nothing is left behind when it ends.
 ThreadHeap& OwnHeap() {
   ThreadHeap& heap = thread_heap;
   if (!heap.cache.registered) [[unlikely]] {
