@@ -55,6 +55,22 @@ class FileInputStream final : public InputStream {
     offset_known_ = true;
     return true;
   }
+  // pread() leaves the descriptor's offset alone, so what is held stays valid.
+  int64_t SourceReadAlongside(uint64_t offset, void* buffer, uint64_t count) override {
+    auto* out = static_cast<uint8_t*>(buffer);
+    uint64_t done = 0;
+    while (done < count) {
+      ssize_t got = pread(fd_, out + done, count - done, static_cast<off_t>(offset + done));
+      if (got == 0) break;
+      if (got < 0) {
+        if (errno == EINTR) continue;
+        if (done == 0) return -1;
+        break;
+      }
+      done += static_cast<uint64_t>(got);
+    }
+    return static_cast<int64_t>(done);
+  }
   uint64_t SourceLength() override {
     struct stat st;
     return fstat(fd_, &st) == 0 && S_ISREG(st.st_mode) ? static_cast<uint64_t>(st.st_size) : 0;

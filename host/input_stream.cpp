@@ -75,6 +75,16 @@ int64_t InputStream::ReadAt(uint64_t offset, void* buffer, uint64_t count) {
   return SeekLocked(offset) ? ReadLocked(buffer, count) : -1;
 }
 
+int64_t InputStream::ReadAtAlongside(uint64_t offset, void* buffer, uint64_t count) {
+  if (!seekable_) return ReadAt(offset, buffer, count);
+  const int64_t got = SourceReadAlongside(offset, buffer, count);
+  if (got == kCannotReadAlongside) return ReadAt(offset, buffer, count);
+  std::lock_guard lock(mutex_);
+  ++counters_.reads;
+  if (got > 0) counters_.bytes_read += static_cast<uint64_t>(got);
+  return got;
+}
+
 int64_t InputStream::ReadLocked(void* buffer, uint64_t count) {
   ++counters_.reads;
   auto* out = static_cast<uint8_t*>(buffer);

@@ -38,6 +38,10 @@ class InputStream {
   // Seek and Read as one step, so that no other caller's seek or read comes
   // between them: -1 when the offset cannot be reached.
   int64_t ReadAt(uint64_t offset, void* buffer, uint64_t count);
+  // ReadAt that other reads may overlap, and that leaves the stream where it
+  // is: the file streamer's reader and the caller it serves then both copy
+  // at once. Sources that cannot read at an offset do it as ReadAt.
+  int64_t ReadAtAlongside(uint64_t offset, void* buffer, uint64_t count);
   int64_t Tell();
   uint64_t Length();
 
@@ -48,6 +52,12 @@ class InputStream {
   virtual int64_t SourceRead(void* buffer, uint64_t count) = 0;
   virtual bool SourceSeek(uint64_t offset) = 0;
   virtual uint64_t SourceLength() = 0;
+  // Reads at `offset` without the stream's position or lock, safe alongside
+  // any other call: kCannotReadAlongside when the source cannot.
+  static constexpr int64_t kCannotReadAlongside = -2;
+  virtual int64_t SourceReadAlongside(uint64_t /*offset*/, void* /*buffer*/, uint64_t /*count*/) {
+    return kCannotReadAlongside;
+  }
 
  private:
   int64_t FillLookahead(uint64_t count);

@@ -23,6 +23,11 @@ class MemoryInputStream final : public InputStream {
     return true;
   }
   uint64_t SourceLength() override { return size_; }
+  int64_t SourceReadAlongside(uint64_t offset, void* buffer, uint64_t count) override {
+    uint64_t n = offset < size_ ? std::min<uint64_t>(count, size_ - offset) : 0;
+    if (n) std::memcpy(buffer, data_ + offset, static_cast<size_t>(n));
+    return static_cast<int64_t>(n);
+  }
 
  private:
   const uint8_t* data_;

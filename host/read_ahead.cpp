@@ -54,16 +54,20 @@ MmfPoolBuffer* ReadAhead::Take(uint64_t offset, uint32_t size, int64_t* got) {
     return nullptr;
   }
   // The thread may not have got to it yet, but it will unless the pool ran
-  // dry: waiting costs less than reading it here and starting over.
-  done_.wait(lock, [this] { return !reads_.empty() || (!reading_ && !MayRead()); });
-  if (reads_.empty()) {
-    DiscardLocked(lock);
-    return nullptr;
+  // dry: waiting costs less than reading it here and starting over. While it
+  // is being read, reading the one after it here costs no more than waiting.
+  while (reads_.empty() || !reads_.front().done) {
+    if (MayRead() && ReadNext(lock) == Outcome::kRead) continue;
+    if (reads_.empty()) {  // none begun, and none can be: the end, or no buffer free
+      DiscardLocked(lock);
+      return nullptr;
+    }
+    done_.wait(lock);  // the thread is reading it
   }
   Read read = reads_.front();
   reads_.pop_front();
   *got = read.got;
-  if (starved_ || reads_.size() == kRefill) {
+  if (starved_ || reads_.size() <= kRefill) {
     starved_ = false;
     wanted_.notify_one();
   }
@@ -78,7 +82,7 @@ void ReadAhead::Discard() {
 // A read under way cannot be called back: its buffer goes once it is done.
 void ReadAhead::DiscardLocked(std::unique_lock<std::mutex>& lock) {
   active_ = false;
-  done_.wait(lock, [this] { return !reading_; });
+  done_.wait(lock, [this] { return under_way_ == 0; });
   for (const Read& read : reads_) MemoryPool::Ops()->ReleaseMappedBuffer(read.buffer);
   reads_.clear();
   starved_ = false;
@@ -90,6 +94,31 @@ bool ReadAhead::Continues(uint64_t offset, uint32_t size) const {
   return active_ && size == size_ && offset == (reads_.empty() ? next_ : reads_.front().offset);
 }
 
+// Begins the read at next_ and makes it outside the lock; the reads after it
+// may begin meanwhile, on the assumption that it gets every byte. When it
+// does not (the end), the read-ahead stops, and the caller's next request,
+// which then differs from the next read's, drops the rest.
+ReadAhead::Outcome ReadAhead::ReadNext(std::unique_lock<std::mutex>& lock) {
+  MmfPoolBuffer* buffer = pool_->AcquireWaiting(std::chrono::milliseconds(0));
+  if (!buffer) return Outcome::kNoBuffer;
+  MemoryPool::Ops()->MapBuffer(buffer);
+  reads_.push_back({buffer, next_, 0, false});
+  Read& read = reads_.back();  // stays where it is: only done reads leave, and a discard waits for this one
+  const uint64_t offset = next_;
+  const uint32_t size = size_;
+  next_ += size;
+  ++under_way_;
+  lock.unlock();
+  const int64_t got = source_->ReadAtAlongside(offset, buffer->Data, size);
+  lock.lock();
+  --under_way_;
+  read.got = got;
+  read.done = true;
+  if (got < static_cast<int64_t>(size)) ended_ = true;
+  done_.notify_all();
+  return Outcome::kRead;
+}
+
 bool ReadAhead::MayRead() const { return active_ && !ended_ && !starved_ && reads_.size() < kDepth; }
 
 void ReadAhead::Run() {
@@ -97,24 +126,11 @@ void ReadAhead::Run() {
   for (;;) {
     wanted_.wait(lock, [this] { return stopping_ || (MayRead() && reads_.size() <= kRefill); });
     while (!stopping_ && MayRead()) {
-      MmfPoolBuffer* buffer = pool_->AcquireWaiting(std::chrono::milliseconds(0));
-      if (!buffer) {
+      if (ReadNext(lock) == Outcome::kNoBuffer) {
         starved_ = true;
         done_.notify_all();
         break;
       }
-      MemoryPool::Ops()->MapBuffer(buffer);
-      const uint64_t offset = next_;
-      const uint32_t size = size_;
-      reading_ = true;
-      lock.unlock();
-      const int64_t got = source_->ReadAt(offset, buffer->Data, size);
-      lock.lock();
-      reading_ = false;
-      reads_.push_back({buffer, offset, got});
-      if (got > 0) next_ = offset + static_cast<uint64_t>(got);
-      ended_ = got <= 0;
-      done_.notify_all();
     }
     if (stopping_) return;
   }

@@ -6,6 +6,9 @@
 // the streamer then delivers as they are. A buffer is only taken when one is
 // free at once: the downstream filter may hold every buffer while it waits
 // for the next one, and a read-ahead waiting for one of them would never end.
+// A caller that finds its buffer still being read reads the next one itself
+// meanwhile: when the downstream filter walks faster than one core copies
+// (large frames), both cores then copy instead of one copying and one waiting.
 
 #include <condition_variable>
 #include <cstdint>
@@ -44,9 +47,12 @@ class ReadAhead {
     MmfPoolBuffer* buffer;
     uint64_t offset;
     int64_t got;
+    bool done;  // else under way
   };
+  enum class Outcome { kRead, kNoBuffer };
 
   void Run();
+  Outcome ReadNext(std::unique_lock<std::mutex>& lock);
   bool Continues(uint64_t offset, uint32_t size) const;
   bool MayRead() const;
   void DiscardLocked(std::unique_lock<std::mutex>& lock);
@@ -59,12 +65,12 @@ class ReadAhead {
   std::condition_variable done_;    // a read finished
   bool stopping_ = false;
   bool active_ = false;
-  bool reading_ = false;   // the thread reads next_ now
+  int under_way_ = 0;      // reads made outside the lock now
   bool starved_ = false;   // no pool buffer was free: wait for one to be taken
   bool ended_ = false;     // a read found the end or failed
-  uint64_t next_ = 0;      // offset of the read after those made
+  uint64_t next_ = 0;      // offset of the read after those begun
   uint32_t size_ = 0;
-  std::deque<Read> reads_;  // done, in file order
+  std::deque<Read> reads_;  // begun, in file order
   std::thread thread_;      // started with the first Start
 };
 

@@ -6,6 +6,7 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <memory>
 #include <string>
@@ -62,6 +63,14 @@ TEST(HostInputStreamTest, PeekReadSeekAndLengthFollowTheKind) {
         EXPECT_EQ(ops->Seek(handle, 3, 0), 3);
         ASSERT_EQ(ops->Read(handle, read.data(), 2), 2);
         EXPECT_EQ(Slice(read, 0, 2), Slice(bytes, 3, 2));
+        // A read alongside others leaves the stream where it stands.
+        EXPECT_EQ(stream->ReadAtAlongside(9950, read.data(), 100), 50);
+        EXPECT_EQ(Slice(read, 0, 50), Slice(bytes, 9950, 50));
+        EXPECT_EQ(stream->ReadAtAlongside(10000, read.data(), 100), 0);
+        ASSERT_EQ(ops->Read(handle, read.data(), 2), 2);
+        EXPECT_EQ(Slice(read, 0, 2), Slice(bytes, 5, 2));
+      } else {
+        EXPECT_EQ(stream->ReadAtAlongside(0, read.data(), 100), -1);
       }
     }
   }
@@ -287,6 +296,62 @@ TEST_F(FileStreamerTest, WhatFollowsAReadAheadGetsTheBytesItAsksFor) {
     EXPECT_EQ(Rest(), expected);
     EXPECT_EQ(streamer_->bytes_read(), bytes);  // delivered bytes only
   }
+}
+
+// A long read ahead, with the caller reading alongside the reader whenever it
+// catches up with it: every byte in order, and the end once, also while the
+// caller holds most of the pool's buffers so that reads find none free.
+TEST_F(FileStreamerTest, ReadingAheadDeliversEveryByteOnceInOrder) {
+  struct Case {
+    const char* name;
+    bool file;
+    size_t size;
+    size_t held;  // buffers the caller keeps before giving the oldest back (the pool has 8)
+  };
+  const Case cases[] = {
+      {"memory", false, 400'500, 0},  {"memory, pool nearly dry", false, 400'500, 7},
+      {"file", true, 400'000, 0},     {"file, pool half held", true, 399'999, 4},
+  };
+  char path[] = "/tmp/kelvane-read-ahead-XXXXXX";
+  const int fd = mkstemp(path);
+  ASSERT_GE(fd, 0);
+  close(fd);
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    Make(c.size, 1000, true);
+    if (c.file) {
+      FILE* out = std::fopen(path, "wb");
+      ASSERT_EQ(std::fwrite(file_.data(), 1, file_.size(), out), file_.size());
+      std::fclose(out);
+      streamer_.reset();
+      source_ = host::OpenFileStream(path, true);
+      streamer_ = std::make_unique<host::FileStreamer>(source_.get(), host::StreamerConfig{1000, 8, 0, true});
+    }
+    std::vector<MmfMra*> held;
+    uint64_t offset = 0;
+    int result = 0;
+    for (MmfMra* mra = nullptr; (result = host::FileStreamer::Ops()->NextBuffer(streamer_->output(), &mra)) ==
+                                kMmfBufferDelivered;) {
+      uint32_t kind = 0, size = 0;
+      MmfPoolBuffer* handle = nullptr;
+      uint8_t* address = nullptr;
+      uint32_t i = 0;
+      while (MmfGetMraElementType(mra, i, &kind) == 0 && MmfGetMraBufferElement(mra, i, &handle, &address, &size) != 0) ++i;
+      ASSERT_NE(address, nullptr);
+      ASSERT_LE(offset + size, file_.size());
+      ASSERT_TRUE(std::equal(address, address + size, file_.begin() + static_cast<ptrdiff_t>(offset))) << "at " << offset;
+      offset += size;
+      held.push_back(mra);
+      if (held.size() > c.held) {
+        EXPECT_EQ(MmfReleaseMra(held.front()), 0);
+        held.erase(held.begin());
+      }
+    }
+    EXPECT_EQ(result, kMmfEndOfStream);
+    EXPECT_EQ(offset, file_.size());
+    for (MmfMra* mra : held) EXPECT_EQ(MmfReleaseMra(mra), 0);
+  }
+  std::remove(path);
 }
 
 TEST(GraphClockTest, ReportsTheMediaTimeConsumedOnTheAttachedGraph) {
