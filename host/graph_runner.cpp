@@ -447,7 +447,10 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
       // By pointer: a Thumb function's address is odd, and a reference bound to it reads as misaligned.
       sinks.emplace_back(&SinkThread, output, acquired[i], &out.channels[i], std::cref(options), delay,
                          config_pool.handle(), prefix_pool.handle(), playback.get(), GraphStopper{control, handle});
-      KeepOnCpu(sinks.back(), placement.channels_cpu);
+      if (placement.channels_cpu >= 0) {
+        KeepOnCpu(sinks.back(), placement.channels_cpu);
+        WaitForTurnOnCore(sinks.back());
+      }
     }
     std::thread controller;
     if (playback) {

@@ -26,4 +26,14 @@ void KeepOnCpu(std::thread& thread, int cpu) {
   (void)pthread_setaffinity_np(thread.native_handle(), sizeof set, &set);
 }
 
+void WaitForTurnOnCore(std::thread& thread) {
+#ifdef SCHED_BATCH
+  if (!thread.joinable()) return;
+  const sched_param param{};
+  (void)pthread_setschedparam(thread.native_handle(), SCHED_BATCH, &param);
+#else
+  (void)thread;
+#endif
+}
+
 }  // namespace host

@@ -22,4 +22,12 @@ ThreadPlacement PlaceChannelsTogether();
 // thread then runs anywhere, as before).
 void KeepOnCpu(std::thread& thread, int cpu);
 
+// Keeps `thread`, once woken by another thread of its core, from taking the
+// core from the waker. A channel woken by a ring slot's release would only
+// find the ring lock still held by the channel that released it, and go back
+// to sleep: two switches for nothing, at every release. Threads of one
+// priority under a real-time scheduler behave so; on Linux it is the batch
+// policy, which needs no privilege. Nothing when the system refuses.
+void WaitForTurnOnCore(std::thread& thread);
+
 }  // namespace host
