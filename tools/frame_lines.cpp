@@ -5,7 +5,7 @@
 namespace {
 
 // A block per channel: a few such blocks cost far less than a line per frame of a long file.
-constexpr size_t kBlockBytes = 256 * 1024;
+constexpr size_t kBlockBytes = 64 * 1024;
 // Room a line may take: its prefix (whose array is copied whole), a time of
 // up to 20 digits, a size of up to 10, a checksum and the separators.
 constexpr size_t kLongestLine = 96;
