@@ -1,11 +1,18 @@
 #include "tools/frame_lines.h"
 
+#include <algorithm>
 #include <cstring>
+#include <utility>
+
+#include "host/thread_placement.h"
 
 namespace {
 
 // A block per channel: a few such blocks cost far less than a line per frame of a long file.
 constexpr size_t kBlockBytes = 64 * 1024;
+// Frames a sink gathers before the formatter takes them over: few hand-overs,
+// and two chunks per channel of 48 KiB.
+constexpr size_t kChunkFrames = 2048;
 // Room a line may take: its prefix (whose array is copied whole), a time of
 // up to 20 digits, a size of up to 10, a checksum and the separators.
 constexpr size_t kLongestLine = 96;
@@ -109,10 +116,11 @@ char* Hex8(char* out, uint32_t value) {
 
 }  // namespace
 
-FrameLines::FrameLines(const std::vector<uint64_t>& tracks, bool hash)
-    : tracks_(tracks), hash_(hash), channels_(tracks.size()), channel_count_(channels_.size()) {
+FrameLines::FrameLines(const std::vector<uint64_t>& tracks, bool hash, int cpu)
+    : tracks_(tracks), hash_(hash), cpu_(cpu), channels_(tracks.size()), channel_count_(channels_.size()) {
   for (size_t k = 0; k < channels_.size(); ++k) {
     Channel& channel = channels_[k];
+    channel.chunk = MakeChunk();
     channel.block.reset(new char[kBlockBytes]);
     channel.capacity = kBlockBytes;
     char* out = Decimal(channel.prefix, k);
@@ -124,16 +132,79 @@ FrameLines::FrameLines(const std::vector<uint64_t>& tracks, bool hash)
 }
 
 FrameLines::~FrameLines() {
+  {
+    std::lock_guard lock(mutex_);
+    stopping_ = true;
+  }
+  handed_.notify_one();
+  if (formatter_.joinable()) formatter_.join();
   for (Channel& channel : channels_) {
     if (channel.spill) std::fclose(channel.spill);
   }
 }
 
-// "CHANNEL TRACK TIME SIZE[ ADLER32]", as the lines of a kept run print.
+FrameLines::FrameChunk FrameLines::MakeChunk() {
+  return FrameChunk(static_cast<host::RunFrame*>(::operator new(kChunkFrames * sizeof(host::RunFrame))));
+}
+
+// On the sink's thread: the frames go into the channel's chunk, and a full
+// chunk to the formatter.
 void FrameLines::OnFrames(void* user, int32_t index, const host::RunFrame* frames, size_t count) {
   auto* lines = static_cast<FrameLines*>(user);
   if (static_cast<uint32_t>(index) >= lines->channel_count_) return;  // not an offered channel (negative ones wrap)
   Channel& channel = lines->channels_[static_cast<size_t>(index)];
+  while (count > 0) {
+    const size_t taken = std::min(count, kChunkFrames - channel.filled);
+    std::memcpy(channel.chunk.get() + channel.filled, frames, taken * sizeof *frames);
+    channel.filled += taken;
+    frames += taken;
+    count -= taken;
+    if (channel.filled == kChunkFrames) lines->Hand(channel);
+  }
+}
+
+// Waits until the channel's chunk handed over before is formatted (its sink
+// fills chunks faster only when the formatter is far behind), then hands
+// this one over and gives the sink the other.
+void FrameLines::Hand(Channel& channel) {
+  std::unique_lock lock(mutex_);
+  formatted_.wait(lock, [&channel] { return !channel.formatting; });
+  if (!channel.handed) channel.handed = MakeChunk();
+  std::swap(channel.chunk, channel.handed);
+  channel.handed_count = channel.filled;
+  channel.filled = 0;
+  channel.formatting = true;
+  queue_.push_back(&channel);
+  if (!formatter_.joinable()) {
+    formatter_ = std::thread([this] { RunFormatter(); });
+    host::KeepOnCpu(formatter_, cpu_);
+  }
+  lock.unlock();
+  handed_.notify_one();
+}
+
+void FrameLines::RunFormatter() {
+  std::unique_lock lock(mutex_);
+  for (;;) {
+    handed_.wait(lock, [this] { return stopping_ || !queue_.empty(); });
+    if (queue_.empty()) return;  // stopping, with every chunk formatted
+    Channel& channel = *queue_.front();
+    queue_.pop_front();
+    lock.unlock();
+    Format(channel, channel.handed.get(), channel.handed_count);
+    lock.lock();
+    channel.formatting = false;
+    formatted_.notify_all();
+  }
+}
+
+void FrameLines::Format(Channel& channel, const host::RunFrame* frames, size_t count) {
+  hash_ ? FormatLines<true>(channel, frames, count) : FormatLines<false>(channel, frames, count);
+}
+
+// "CHANNEL TRACK TIME SIZE[ ADLER32]", as the lines of a kept run print.
+template <bool kHash>
+void FrameLines::FormatLines(Channel& channel, const host::RunFrame* frames, size_t count) {
   // The prefix array, copied in fixed sizes the compiler does inline (its
   // first 16 bytes, which hold nearly every prefix, then the rest): each line
   // goes on over what was copied past the prefix. Held here, apart from the
@@ -150,13 +221,12 @@ void FrameLines::OnFrames(void* user, int32_t index, const host::RunFrame* frame
   char seconds_text[sizeof channel.seconds_text];
   std::memcpy(seconds_text, channel.seconds_text, sizeof seconds_text);
   size_t seconds_length = channel.seconds_length;
-  const bool hash = lines->hash_;
   char* out = channel.block.get() + channel.used;
   const char* last_start = channel.block.get() + (channel.capacity - kLongestLine);  // where a line still fits
   for (const host::RunFrame* frame = frames; frame != frames + count; ++frame) {
     if (out > last_start) {
       channel.used = static_cast<size_t>(out - channel.block.get());
-      lines->Spill(channel);
+      Spill(channel);
       out = channel.block.get() + channel.used;
       last_start = channel.block.get() + (channel.capacity - kLongestLine);
     }
@@ -178,7 +248,7 @@ void FrameLines::OnFrames(void* user, int32_t index, const host::RunFrame* frame
     }
     *out++ = ' ';
     out = Number(out, frame->size);
-    if (hash) {
+    if constexpr (kHash) {
       *out++ = ' ';
       out = Hex8(out, frame->adler32);
     }
@@ -208,6 +278,12 @@ void FrameLines::Spill(Channel& channel) {
 bool FrameLines::Write(int32_t index, FILE* out) {
   if (index < 0 || static_cast<size_t>(index) >= channels_.size()) return true;
   Channel& channel = channels_[static_cast<size_t>(index)];
+  {
+    std::unique_lock lock(mutex_);
+    formatted_.wait(lock, [&channel] { return !channel.formatting; });
+  }
+  Format(channel, channel.chunk.get(), channel.filled);  // what the sink gathered last
+  channel.filled = 0;
   if (channel.failed) return false;
   if (channel.spill) {
     std::rewind(channel.spill);

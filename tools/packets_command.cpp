@@ -22,6 +22,7 @@
 #include "host/graph_runner.h"
 #include "host/input_streams.h"
 #include "host/plugin_loader.h"
+#include "host/thread_placement.h"
 #include "stream/mkvvstream.h"
 #include "tools/command_line.h"
 #include "tools/commands.h"
@@ -284,7 +285,9 @@ int RunPackets(int argc, char** argv) {
   // Plain playback in lines streams the frame lines instead of keeping every frame.
   std::unique_ptr<FrameLines> lines;
   if (!options.json && options.run.actions.empty() && !tracks.empty()) {
-    lines = std::make_unique<FrameLines>(tracks, options.run.checksum);
+    // The channels' core is kept for the channels; the lines are formatted beside the streamer's reader.
+    const int cpu = options.run.channels_share_core ? host::PlaceChannelsTogether().reader_cpu : -1;
+    lines = std::make_unique<FrameLines>(tracks, options.run.checksum, cpu);
     options.run.on_frames = FrameLines::OnFrames;
     options.run.user = lines.get();
     options.run.keep_frames = false;

@@ -1,0 +1,90 @@
+// The packets tool's frame lines: each sink thread hands its frames over in
+// chunks, a thread of their own formats them and spills full blocks to a
+// temporary file, and each channel's lines come out whole and in order at
+// the end. Long runs of frames on several threads at once go through every
+// hand-over and spill, and each line is checked against printf's.
+
+#include <cinttypes>
+#include <cstdio>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "tools/frame_lines.h"
+
+namespace {
+
+// Frames whose times cross whole seconds at odd places and reach 20 digits,
+// with sizes of every length: channel k's frame i.
+host::RunFrame FrameOf(size_t k, size_t i) {
+  host::RunFrame frame;
+  frame.time_us = i % 997 == 3 ? UINT64_MAX - i : i * 33'367 + k * 1'000'001;
+  frame.size = static_cast<uint32_t>(i % 11 == 0 ? 4'000'000'000u - i : (i * 7919) % 100'000);
+  frame.adler32 = static_cast<uint32_t>(i * 2'654'435'761u);
+  return frame;
+}
+
+std::string Expected(size_t k, uint64_t track, size_t count, bool hash) {
+  std::string text;
+  char line[128];
+  for (size_t i = 0; i < count; ++i) {
+    const host::RunFrame frame = FrameOf(k, i);
+    int n = std::snprintf(line, sizeof line, "%zu %" PRIu64 " %" PRIu64 " %" PRIu32, k, track, frame.time_us, frame.size);
+    if (hash) n += std::snprintf(line + n, sizeof line - static_cast<size_t>(n), " %08" PRIx32, frame.adler32);
+    text.append(line, static_cast<size_t>(n)).push_back('\n');
+  }
+  return text;
+}
+
+std::string Written(FrameLines& lines, int32_t channel) {
+  std::FILE* out = std::tmpfile();
+  EXPECT_NE(out, nullptr);
+  EXPECT_TRUE(lines.Write(channel, out));
+  std::string text(static_cast<size_t>(std::ftell(out)), '\0');
+  std::rewind(out);
+  EXPECT_EQ(std::fread(text.data(), 1, text.size(), out), text.size());
+  std::fclose(out);
+  return text;
+}
+
+TEST(FrameLinesTest, EveryChannelsLinesComeOutWholeAndInOrder) {
+  struct Case {
+    const char* name;
+    bool hash;
+    std::vector<size_t> frames;  // per channel
+    size_t batch;                // frames per call, as a sink hands over one output buffer's
+  };
+  const Case cases[] = {
+      {"one short channel", false, {5}, 256},
+      {"four channels through many chunks and blocks", false, {40'000, 9'000, 2'048, 0}, 256},
+      {"with checksums, one frame at a time", true, {7'000, 6'001}, 1},
+      {"batches larger than a chunk", true, {30'000}, 5'000},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    std::vector<uint64_t> tracks;
+    for (size_t k = 0; k < c.frames.size(); ++k) tracks.push_back(10 + k * 300);
+    FrameLines lines(tracks, c.hash);
+    std::vector<std::thread> sinks;
+    for (size_t k = 0; k < c.frames.size(); ++k) {
+      sinks.emplace_back([&, k] {
+        std::vector<host::RunFrame> batch;
+        for (size_t i = 0; i < c.frames[k]; ++i) {
+          batch.push_back(FrameOf(k, i));
+          if (batch.size() == c.batch || i + 1 == c.frames[k]) {
+            FrameLines::OnFrames(&lines, static_cast<int32_t>(k), batch.data(), batch.size());
+            batch.clear();
+          }
+        }
+      });
+    }
+    for (std::thread& sink : sinks) sink.join();
+    for (size_t k = 0; k < c.frames.size(); ++k) {
+      EXPECT_EQ(Written(lines, static_cast<int32_t>(k)), Expected(k, tracks[k], c.frames[k], c.hash)) << "channel " << k;
+    }
+  }
+}
+
+}  // namespace
