@@ -163,9 +163,9 @@ void FrameLines::OnFrames(void* user, int32_t index, const host::RunFrame* frame
   }
 }
 
-// Waits until the channel's chunk handed over before is formatted (its sink
-// fills chunks faster only when the formatter is far behind), then hands
-// this one over and gives the sink the other.
+// Waits until the chunk the channel handed over before is formatted (it is,
+// unless the formatter has fallen a whole chunk behind), then hands this one
+// over and gives the sink the other.
 void FrameLines::Hand(Channel& channel) {
   std::unique_lock lock(mutex_);
   formatted_.wait(lock, [&channel] { return !channel.formatting; });
