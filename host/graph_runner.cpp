@@ -67,10 +67,13 @@ class Sink {
         config_pool_(config_pool),
         prefix_pool_(prefix_pool),
         on_frames_(options.on_frames),
+        frame_room_(options.frame_room),
         user_(options.user),
         index_(run->index),
         checksum_(options.checksum),
-        keep_frames_(options.keep_frames) {}
+        keep_frames_(options.keep_frames) {
+    NextRoom();
+  }
   Sink(const Sink&) = delete;  // it points into itself
   Sink& operator=(const Sink&) = delete;
 
@@ -183,6 +186,7 @@ class Sink {
     uint64_t time = time_;
     bool marked = marked_;
     RunFrame* out = batch_end_;
+    RunFrame* limit = batch_limit_;
     uint64_t foreign = 0;
     for (; element != end; ++element) {
       if (element->kind == kMmfElementProperty) {
@@ -195,10 +199,11 @@ class Sink {
       foreign += ZeroCopy(element->handle) ? 0 : 1;
       *out++ = RunFrame{time, element->size, 0, marked};
       marked = false;
-      if (out == batch_ + kFrameBatch) {
+      if (out == limit) {
         batch_end_ = out;
         PassFrames();
         out = batch_end_;
+        limit = batch_limit_;
       }
     }
     time_ = time;
@@ -225,23 +230,36 @@ class Sink {
   // sink is between two output buffers.
   void Deliver(const RunFrame& frame) {
     *batch_end_++ = frame;
-    if (batch_end_ == batch_ + kFrameBatch) PassFrames();
+    if (batch_end_ == batch_limit_) PassFrames();
   }
 
   void PassFrames() {
-    if (batch_end_ == batch_) return;
-    const size_t count = static_cast<size_t>(batch_end_ - batch_);
+    if (batch_end_ == batch_begin_) return;
+    const size_t count = static_cast<size_t>(batch_end_ - batch_begin_);
     run_->frame_count += count;
     run_->last_time_us = batch_end_[-1].time_us;
-    if (keep_frames_) run_->frames.insert(run_->frames.end(), batch_, batch_end_);
-    if (on_frames_) on_frames_(user_, index_, batch_, count);
-    batch_end_ = batch_;
+    if (keep_frames_) run_->frames.insert(run_->frames.end(), batch_begin_, batch_end_);
+    if (on_frames_) on_frames_(user_, index_, batch_begin_, count);
+    NextRoom();
+  }
+
+  // The consumer's room for the next frames, else the sink's own batch.
+  void NextRoom() {
+    size_t room = 0;
+    RunFrame* at = frame_room_ ? frame_room_(user_, index_, &room) : nullptr;
+    if (!at || room == 0) {
+      at = batch_;
+      room = kFrameBatch;
+    }
+    batch_begin_ = batch_end_ = at;
+    batch_limit_ = at + room;
   }
 
   ChannelRun* run_;
   MmfMemoryPool* config_pool_;
   MmfMemoryPool* prefix_pool_;
   void (*on_frames_)(void* user, int32_t channel, const RunFrame* frames, size_t count);
+  RunFrame* (*frame_room_)(void* user, int32_t channel, size_t* room);
   void* user_;
   int32_t index_;
   bool checksum_;
@@ -254,7 +272,9 @@ class Sink {
   RunFrame frame_;
   Adler32 adler_;
   RunFrame batch_[kFrameBatch];
+  RunFrame* batch_begin_ = batch_;  // where the frames passed next are gathered
   RunFrame* batch_end_ = batch_;
+  RunFrame* batch_limit_ = batch_ + kFrameBatch;
 };
 
 // A channel that fails stops the graph, as a player does when one of its

@@ -147,12 +147,25 @@ FrameLines::FrameChunk FrameLines::MakeChunk() {
   return FrameChunk(static_cast<host::RunFrame*>(::operator new(kChunkFrames * sizeof(host::RunFrame))));
 }
 
-// On the sink's thread: the frames go into the channel's chunk, and a full
-// chunk to the formatter.
+host::RunFrame* FrameLines::Room(void* user, int32_t index, size_t* room) {
+  auto* lines = static_cast<FrameLines*>(user);
+  if (static_cast<uint32_t>(index) >= lines->channel_count_) return nullptr;
+  Channel& channel = lines->channels_[static_cast<size_t>(index)];
+  *room = kChunkFrames - channel.filled;
+  return channel.chunk.get() + channel.filled;
+}
+
+// On the sink's thread: the frames go into the channel's chunk (where the
+// sink gathered them, as a rule), and a full chunk to the formatter.
 void FrameLines::OnFrames(void* user, int32_t index, const host::RunFrame* frames, size_t count) {
   auto* lines = static_cast<FrameLines*>(user);
   if (static_cast<uint32_t>(index) >= lines->channel_count_) return;  // not an offered channel (negative ones wrap)
   Channel& channel = lines->channels_[static_cast<size_t>(index)];
+  if (frames == channel.chunk.get() + channel.filled && count <= kChunkFrames - channel.filled) {
+    channel.filled += count;
+    if (channel.filled == kChunkFrames) lines->Hand(channel);
+    return;
+  }
   while (count > 0) {
     const size_t taken = std::min(count, kChunkFrames - channel.filled);
     std::memcpy(channel.chunk.get() + channel.filled, frames, taken * sizeof *frames);

@@ -1,7 +1,7 @@
 #pragma once
 // `kelvane packets` lines of one channel's frames, written as the frames come
-// in rather than kept. Each sink thread only copies its frames' times and
-// sizes into its channel's chunk; a full chunk goes to a thread of its own,
+// in rather than kept. Each sink thread only gathers its frames' times and
+// sizes in its channel's chunk; a full chunk goes to a thread of its own,
 // which formats the lines into the channel's block and writes a full block
 // to an unnamed temporary file. So a long file costs no memory per frame, the
 // sink threads (which take turns with the demuxer) spend next to nothing on
@@ -29,7 +29,11 @@ class FrameLines {
   FrameLines(const FrameLines&) = delete;
   FrameLines& operator=(const FrameLines&) = delete;
 
-  // host::RunnerOptions::on_frames, with `user` this object.
+  // host::RunnerOptions::frame_room, with `user` this object: the rest of
+  // the channel's chunk, where its sink then gathers its frames in place.
+  static host::RunFrame* Room(void* user, int32_t channel, size_t* room);
+  // host::RunnerOptions::on_frames, with `user` this object. Frames gathered
+  // in the room given are taken as they lie; any others are copied in.
   static void OnFrames(void* user, int32_t channel, const host::RunFrame* frames, size_t count);
 
   // Writes channel `channel`'s lines to `out`, once its sink has stopped;

@@ -289,6 +289,7 @@ int RunPackets(int argc, char** argv) {
     const int cpu = options.run.channels_share_core ? host::PlaceChannelsTogether().reader_cpu : -1;
     lines = std::make_unique<FrameLines>(tracks, options.run.checksum, cpu);
     options.run.on_frames = FrameLines::OnFrames;
+    options.run.frame_room = FrameLines::Room;
     options.run.user = lines.get();
     options.run.keep_frames = false;
   }

@@ -5,8 +5,11 @@
 // empty frames or bytes after their last frame, more input properties than an
 // output buffer has room for, a decoder configuration too large).
 
+#include <algorithm>
 #include <cstdio>
 #include <fstream>
+#include <iterator>
+#include <memory>
 #include <string>
 #include <tuple>
 #include <vector>
@@ -57,9 +60,28 @@ TEST_P(PlaybackFixtureTest, EveryTrackDeliversTheListedFramesAtEveryBufferSize) 
 INSTANTIATE_TEST_SUITE_P(Fixtures, PlaybackFixtureTest, testing::ValuesIn(testing_support::FixtureNames()),
                          [](const testing::TestParamInfo<std::string>& info) { return info.param; });
 
+// A consumer's room for the sinks' frames: a few at a time, so that the
+// sinks run into its end often. Every frame must come back in place.
+struct FrameRooms {
+  static constexpr size_t kRoom = 5;
+  host::RunFrame room[8][kRoom];
+  std::vector<host::RunFrame> passed[8];
+  bool elsewhere = false;  // frames came from anywhere but the room
+
+  static host::RunFrame* Room(void* user, int32_t channel, size_t* room) {
+    *room = kRoom;
+    return static_cast<FrameRooms*>(user)->room[channel];
+  }
+  static void OnFrames(void* user, int32_t channel, const host::RunFrame* frames, size_t count) {
+    auto* rooms = static_cast<FrameRooms*>(user);
+    rooms->elsewhere |= frames != rooms->room[channel] || count > kRoom;
+    rooms->passed[channel].insert(rooms->passed[channel].end(), frames, frames + count);
+  }
+};
+
 // The tool plays without checksums another way: sinks take whole frames on a
-// short path, the channels share a core and the streamer reads ahead. What
-// each channel gets is the same.
+// short path and gather them in the tool's own room, the channels share a
+// core and the streamer reads ahead. What each channel gets is the same.
 TEST_P(PlaybackFixtureTest, WithoutChecksumsTheToolsWayDeliversTheSameFrames) {
   const std::string name = GetParam();
   for (uint32_t size : {1000u, 65536u}) {
@@ -70,8 +92,13 @@ TEST_P(PlaybackFixtureTest, WithoutChecksumsTheToolsWayDeliversTheSameFrames) {
     tool.checksum = false;
     tool.read_ahead = true;
     tool.channels_share_core = true;
+    auto rooms = std::make_unique<FrameRooms>();
+    tool.user = rooms.get();
+    tool.frame_room = FrameRooms::Room;
+    tool.on_frames = FrameRooms::OnFrames;
     const host::RunResult expected = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), plain);
     const host::RunResult got = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), tool);
+    EXPECT_FALSE(rooms->elsewhere);
     ASSERT_EQ(got.ok, expected.ok) << got.error;
     ASSERT_EQ(got.channels.size(), expected.channels.size());
     for (size_t k = 0; k < got.channels.size(); ++k) {
@@ -82,6 +109,13 @@ TEST_P(PlaybackFixtureTest, WithoutChecksumsTheToolsWayDeliversTheSameFrames) {
         ASSERT_EQ(std::make_tuple(a.frames[i].time_us, a.frames[i].size, a.frames[i].marked, a.frames[i].adler32),
                   std::make_tuple(b.frames[i].time_us, b.frames[i].size, b.frames[i].marked, 0u))
             << "frame " << i;
+      }
+      ASSERT_LT(k, std::size(rooms->passed));
+      EXPECT_EQ(rooms->passed[k].size(), a.frames.size());
+      for (size_t i = 0; i < std::min(rooms->passed[k].size(), a.frames.size()); ++i) {
+        ASSERT_EQ(std::make_tuple(rooms->passed[k][i].time_us, rooms->passed[k][i].size, rooms->passed[k][i].marked),
+                  std::make_tuple(a.frames[i].time_us, a.frames[i].size, a.frames[i].marked))
+            << "frame " << i << " as passed";
       }
       EXPECT_EQ(a.frame_count, b.frame_count);
       EXPECT_EQ(a.last_time_us, b.last_time_us);

@@ -1,10 +1,12 @@
 // The packets tool's frame lines: each sink thread hands its frames over in
-// chunks, a thread of their own formats them and spills full blocks to a
+// chunks (gathered in place or copied in), a thread of their own formats them and spills full blocks to a
 // temporary file, and each channel's lines come out whole and in order at
 // the end. Long runs of frames on several threads at once go through every
 // hand-over and spill, and each line is checked against printf's.
 
+#include <algorithm>
 #include <cinttypes>
+#include <cstdint>
 #include <cstdio>
 #include <string>
 #include <thread>
@@ -55,12 +57,15 @@ TEST(FrameLinesTest, EveryChannelsLinesComeOutWholeAndInOrder) {
     bool hash;
     std::vector<size_t> frames;  // per channel
     size_t batch;                // frames per call, as a sink hands over one output buffer's
+    bool in_place;               // gathered in the room FrameLines gives, as the runner's sinks do
   };
   const Case cases[] = {
-      {"one short channel", false, {5}, 256},
-      {"four channels through many chunks and blocks", false, {40'000, 9'000, 2'048, 0}, 256},
-      {"with checksums, one frame at a time", true, {7'000, 6'001}, 1},
-      {"batches larger than a chunk", true, {30'000}, 5'000},
+      {"one short channel", false, {5}, 256, false},
+      {"four channels through many chunks and blocks", false, {40'000, 9'000, 2'048, 0}, 256, false},
+      {"with checksums, one frame at a time", true, {7'000, 6'001}, 1, false},
+      {"batches larger than a chunk", true, {30'000}, 5'000, false},
+      {"in place, four channels", false, {40'000, 9'000, 2'049, 1}, 256, true},
+      {"in place, with checksums, as much as the room takes", true, {12'345, 3}, SIZE_MAX, true},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
@@ -70,11 +75,23 @@ TEST(FrameLinesTest, EveryChannelsLinesComeOutWholeAndInOrder) {
     std::vector<std::thread> sinks;
     for (size_t k = 0; k < c.frames.size(); ++k) {
       sinks.emplace_back([&, k] {
+        const auto channel = static_cast<int32_t>(k);
+        if (c.in_place) {
+          for (size_t i = 0; i < c.frames[k];) {
+            size_t room = 0;
+            host::RunFrame* at = FrameLines::Room(&lines, channel, &room);
+            const size_t n = std::min({room, c.batch, c.frames[k] - i});
+            for (size_t j = 0; j < n; ++j) at[j] = FrameOf(k, i + j);
+            FrameLines::OnFrames(&lines, channel, at, n);
+            i += n;
+          }
+          return;
+        }
         std::vector<host::RunFrame> batch;
         for (size_t i = 0; i < c.frames[k]; ++i) {
           batch.push_back(FrameOf(k, i));
           if (batch.size() == c.batch || i + 1 == c.frames[k]) {
-            FrameLines::OnFrames(&lines, static_cast<int32_t>(k), batch.data(), batch.size());
+            FrameLines::OnFrames(&lines, channel, batch.data(), batch.size());
             batch.clear();
           }
         }
