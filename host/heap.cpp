@@ -121,6 +121,18 @@ struct ThreadCache {
   FreeBlock* lists[kClasses];
   ChunkRest rests[kClasses];
   bool registered;
+
+  // The first block of class c's list, taken off it, or null.
+  FreeBlock* Pop(uint32_t c) {
+    FreeBlock* block = lists[c];
+    if (block) lists[c] = block->next;
+    return block;
+  }
+  void Push(uint32_t c, void* block) {
+    auto* free_block = static_cast<FreeBlock*>(block);
+    free_block->next = lists[c];
+    lists[c] = free_block;
+  }
 };
 
 #else
@@ -209,10 +221,7 @@ bool AdoptOrphans(ThreadCache& cache, uint32_t c) {
 void* TakeBlock(ThreadCache& cache, uint32_t c) {
   const size_t block_bytes = size_t{c} * kGranule;
   for (;;) {
-    if (FreeBlock* block = cache.lists[c]) {
-      cache.lists[c] = block->next;
-      return block;
-    }
+    if (FreeBlock* block = cache.Pop(c)) return block;
     ChunkRest& rest = cache.rests[c];
     if (rest.next != rest.end) {
       void* block = rest.next;
@@ -258,8 +267,7 @@ void DeleteBlock(void* block) {
     pthread_mutex_unlock(&orphans_lock);
     return;
   }
-  free_block->next = cache.lists[c];
-  cache.lists[c] = free_block;
+  cache.Push(c, block);
 }
 
 #else
@@ -370,8 +378,7 @@ extern "C" void* SysAlloc(size_t size) {
   ThreadHeap& heap = thread_heap;
   if (size <= kLargestSmall && heap.cache.registered && !failure_armed.load(std::memory_order_relaxed)) [[likely]] {
     const uint32_t c = ClassOf(size);
-    if (FreeBlock* block = heap.cache.lists[c]) [[likely]] {
-      heap.cache.lists[c] = block->next;
+    if (FreeBlock* block = heap.cache.Pop(c)) [[likely]] {
       AddOwn(heap.counts.allocations, uint64_t{1});
       AddOwn(heap.counts.live, int64_t{1});
       return block;
@@ -386,9 +393,7 @@ extern "C" void SysFree(void* block) {
   ThreadHeap& heap = thread_heap;
   const uint32_t c = small_blocks.ClassOfBlock(block);
   if (c != 0 && heap.cache.registered) [[likely]] {
-    auto* free_block = static_cast<FreeBlock*>(block);
-    free_block->next = heap.cache.lists[c];
-    heap.cache.lists[c] = free_block;
+    heap.cache.Push(c, block);
     AddOwn(heap.counts.live, int64_t{-1});
     return;
   }

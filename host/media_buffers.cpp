@@ -63,14 +63,17 @@ const Element* Find(MmfMra* mra, uint32_t index) {
   return &Host(mra)->elements[index];
 }
 
+// Whether the element is a buffer element with a pool buffer reference of its own.
+inline bool HoldsReference(const Element& element) {
+  return element.kind == kMmfElementBuffer && element.type == host::kOwnReference;
+}
+
 // Gives back the pool buffer reference a buffer element holds of its own (a
 // buffer element always has a handle: the setter refuses a null one). The
 // element's bytes are left as they are: nothing reads an element at or past
 // ElementCount.
 inline void DropReference(const Element& element) {
-  if (element.kind == kMmfElementBuffer && element.type == host::kOwnReference) {
-    host::DropBufferReference(element.handle);
-  }
+  if (HoldsReference(element)) host::DropBufferReference(element.handle);
 }
 
 // Counts in the element at index when it is the next one and there is room
@@ -93,7 +96,7 @@ inline bool Append(MmfMra* mra, uint32_t index) {
   HostMra* host_mra = Host(mra);
   Element* element = &host_mra->elements[index];
   if (value.kind == kMmfElementBuffer) host::ReferenceBuffer(value.handle);
-  if (element->kind == kMmfElementBuffer && element->type == host::kOwnReference) {
+  if (HoldsReference(*element)) {
     Element* const end = host_mra->elements + mra->ElementCount;
     Element* sharer = element + 1;
     while (sharer != end && !(sharer->kind == kMmfElementBuffer && sharer->handle == element->handle &&
