@@ -1,6 +1,10 @@
 #include "tools/frame_lines.h"
 
+#include <sys/sendfile.h>
+#include <sys/stat.h>
+
 #include <algorithm>
+#include <cerrno>
 #include <cstring>
 #include <utility>
 
@@ -288,6 +292,32 @@ void FrameLines::Spill(Channel& channel) {
   channel.used = 0;
 }
 
+namespace {
+
+// The temporary file's lines, after what `out` already holds. The kernel
+// moves them from the page cache straight to the output where it can (a
+// file, a pipe, /dev/null); elsewhere they go through a buffer.
+bool CopyOut(FILE* spill, FILE* out) {
+  if (std::fflush(spill) != 0 || std::fflush(out) != 0) return false;
+  struct stat spilled;
+  if (fstat(fileno(spill), &spilled) != 0) return false;
+  off_t offset = 0;
+  const int out_fd = fileno(out);
+  while (out_fd >= 0 && offset < spilled.st_size) {
+    const ssize_t sent = sendfile(out_fd, fileno(spill), &offset, static_cast<size_t>(spilled.st_size - offset));
+    if (sent < 0 && errno == EINTR) continue;
+    if (sent <= 0) break;  // this output takes no sendfile: copy the rest
+  }
+  if (offset == spilled.st_size) return true;
+  if (fseeko(spill, offset, SEEK_SET) != 0) return false;
+  char chunk[65536];
+  size_t n;
+  while ((n = std::fread(chunk, 1, sizeof chunk, spill)) > 0) std::fwrite(chunk, 1, n, out);
+  return !std::ferror(spill);
+}
+
+}  // namespace
+
 bool FrameLines::Write(int32_t index, FILE* out) {
   if (index < 0 || static_cast<size_t>(index) >= channels_.size()) return true;
   Channel& channel = channels_[static_cast<size_t>(index)];
@@ -298,13 +328,7 @@ bool FrameLines::Write(int32_t index, FILE* out) {
   Format(channel, channel.chunk.get(), channel.filled);  // what the sink gathered last
   channel.filled = 0;
   if (channel.failed) return false;
-  if (channel.spill) {
-    std::rewind(channel.spill);
-    char chunk[65536];
-    size_t n;
-    while ((n = std::fread(chunk, 1, sizeof chunk, channel.spill)) > 0) std::fwrite(chunk, 1, n, out);
-    if (std::ferror(channel.spill)) return false;
-  }
+  if (channel.spill && !CopyOut(channel.spill, out)) return false;
   std::fwrite(channel.block.get(), 1, channel.used, out);
   return true;
 }
