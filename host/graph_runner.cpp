@@ -317,8 +317,12 @@ void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun
     }
     short_inputs = 0;
     ++run->buffers;
+    const uint64_t frames_before = run->frame_count;
     sink.Consume(mra);
-    if (playback && run->frame_count && playback->Consumed(run->last_time_us)) restart();
+    // Only a frame completed here moves the clock. A buffer cut short by a
+    // control sequence's Stop may hold none, and the last frame before it may
+    // be from before a seek: reported now, it would set the clock back.
+    if (playback && run->frame_count != frames_before && playback->Consumed(run->last_time_us)) restart();
     if (options.on_buffer) options.on_buffer(options.user, run->index, mra);
     (void)MmfReleaseMra(mra);
     if (delay_us) std::this_thread::sleep_for(std::chrono::microseconds(delay_us));
