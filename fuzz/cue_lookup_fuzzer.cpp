@@ -5,7 +5,7 @@
 // (GetCueingPosition both ways, ConvertToPosition, ConvertToTime, Seek, the
 // byte-rate estimate, a channel's acquisition toggled) with fuzzed times and
 // positions. A small model of the search rules gives the one answer each
-// query may have; the filter's answer must be exactly that.
+// query may have, and the messages it logs; the filter's must be exactly those.
 //
 // Input: flags (bit 0: the file has Cues, bit 1: EnablePreroll), timecode
 // scale, Segment data position, first Cluster position, channel count (0-4)
@@ -16,6 +16,7 @@
 #include <cstdint>
 #include <cstdlib>
 #include <memory>
+#include <string>
 #include <vector>
 
 #include "core/memory.h"
@@ -27,6 +28,7 @@
 #include "fuzz/fuzz_input.h"
 #include "host/heap_control.h"
 #include "host/log_control.h"
+#include "tests/support/cue_rules.h"
 
 namespace {
 
@@ -36,6 +38,9 @@ constexpr int32_t kMaxChannels = 4;
 constexpr int kMaxQueries = 256;
 constexpr int kNoConversion = 4002;
 constexpr int kNoCueingData = 48;
+
+// What the filter logged during the current query, as "level text".
+std::vector<std::string> logged;
 
 void Check(bool condition) {
   if (!condition) std::abort();
@@ -53,7 +58,8 @@ struct ModelChannel {
   bool acquired;
 };
 
-// The search and conversion rules over plain vectors, in list order.
+// The search and conversion rules over plain vectors, in list order, and the
+// messages each logs.
 struct Model {
   bool has_cues = false;
   bool preroll = false;
@@ -62,6 +68,7 @@ struct Model {
   std::vector<ModelChannel> channels;
   bool validated = false, all_tracks = false;
   uint64_t last_position_time = 0;
+  std::vector<std::string> log;
 
   uint64_t Time(const ModelCue& cue) const { return cue.ticks * (scale / 1000); }
 
@@ -85,25 +92,20 @@ struct Model {
   }
 
   int Search(uint64_t* time, bool forward, uint64_t* position) {
-    if (!has_cues) return kNoCueingData;
+    if (!has_cues) {
+      log.push_back("5 kelvane: GetCueingPosition no cueing data.");
+      return kNoCueingData;
+    }
     *position = kNoCuePosition;
     if (!validated) Validate();
     if (cues.empty()) return 0;
-    const auto target = static_cast<int64_t>(*time);
-    size_t i = 0;
-    while (i + 1 < cues.size() && static_cast<int64_t>(Time(cues[i])) <= target) ++i;
-    const ModelCue& found = cues[i];
-    const ModelCue& before = i > 0 ? cues[i - 1] : found;
-    const ModelCue* chosen = &found;
-    if (!forward) {
-      const bool last = i + 1 == cues.size();
-      chosen = last && target > static_cast<int64_t>(Time(found)) ? &found : &before;
-    }
-    *time = Time(*chosen);
-    for (const ModelPosition& p : chosen->positions) {
-      if (!Counts(p)) continue;
+    std::vector<uint64_t> times;
+    for (const ModelCue& cue : cues) times.push_back(Time(cue));
+    const ModelCue& chosen = cues[testing_support::ChosenCue(times, *time, forward)];
+    *time = Time(chosen);
+    for (const ModelPosition& p : chosen.positions) {
       const uint64_t bytes = segment + p.cluster;
-      if (static_cast<int64_t>(bytes) < static_cast<int64_t>(*position)) *position = bytes;
+      if (Counts(p) && static_cast<int64_t>(bytes) < static_cast<int64_t>(*position)) *position = bytes;
     }
     return 0;
   }
@@ -117,6 +119,22 @@ struct Model {
     return 0;
   }
 
+  // The first counting position at or after `position`: its cue's time and
+  // position, and the time of the cue before (0 before the first); null: none.
+  const ModelPosition* AtOrAfter(uint64_t position, uint64_t* time, uint64_t* previous) {
+    *previous = 0;
+    for (const ModelCue& cue : cues) {
+      for (const ModelPosition& p : cue.positions) {
+        if (Counts(p) && static_cast<int64_t>(segment + p.cluster) >= static_cast<int64_t>(position)) {
+          *time = Time(cue);
+          return &p;
+        }
+      }
+      *previous = Time(cue);
+    }
+    return nullptr;
+  }
+
   int ToTime(uint64_t position, uint64_t* time) {
     if (last_position_time != 0 && preroll) {
       *time = last_position_time;
@@ -124,35 +142,33 @@ struct Model {
       return 0;
     }
     *time = 0;
-    if (!has_cues) return position == first_cluster ? 0 : kNoConversion;
-    if (!validated) Validate();
-    uint64_t previous = 0;
-    for (const ModelCue& cue : cues) {
-      for (const ModelPosition& p : cue.positions) {
-        if (!Counts(p)) continue;
-        const uint64_t bytes = segment + p.cluster;
-        if (bytes == position) {
-          *time = Time(cue);
-          return 0;
-        }
-        if (static_cast<int64_t>(bytes) > static_cast<int64_t>(position)) {
-          *time = previous;
-          return 0;
-        }
-      }
-      previous = Time(cue);
+    if (!has_cues) {
+      log.push_back("5 kelvane: ConvertToTime() no cueing data.");
+      return position == first_cluster ? 0 : kNoConversion;
     }
+    if (!validated) Validate();
+    uint64_t cue_time = 0, previous = 0;
+    if (const ModelPosition* p = AtOrAfter(position, &cue_time, &previous)) *time = segment + p->cluster == position ? cue_time : previous;
     return 0;
+  }
+
+  void Seek(uint64_t position) {
+    uint64_t time = 0, previous = 0;
+    const ModelPosition* p = has_cues ? AtOrAfter(position, &time, &previous) : nullptr;
+    if (p && p->track & 1) log.push_back("5 kelvane: Non-zero codec state on cue = 1");  // the filter's table gets track & 1
   }
 
   int32_t ByteRate() {
     uint64_t first_time = 0, last_time = INT64_MAX, first_position = 0, last_position = 0;
-    if (Search(&first_time, false, &first_position) != 0 || Search(&last_time, false, &last_position) != 0) return 0;
-    if (first_position == kNoCuePosition || last_position == kNoCuePosition) return 0;
-    const auto dt = static_cast<int64_t>(last_time - first_time);
-    const auto dpos = static_cast<int64_t>(last_position - first_position);
-    if (dt <= 0 || dpos <= 0 || dt / 1000000 <= 0) return 0;
-    return static_cast<int32_t>(dpos / (dt / 1000000));
+    int32_t rate = 0;
+    if (Search(&first_time, false, &first_position) == 0 && Search(&last_time, false, &last_position) == 0 &&
+        first_position != kNoCuePosition && last_position != kNoCuePosition) {
+      const auto dt = static_cast<int64_t>(last_time - first_time);
+      const auto dpos = static_cast<int64_t>(last_position - first_position);
+      if (dt > 0 && dpos > 0 && dt / 1000000 > 0) rate = static_cast<int32_t>(dpos / (dt / 1000000));
+    }
+    if (rate == 0) log.push_back("3 kelvane: CalcOverallByteRate cueing points weren't enough to estimate the bytes per second.");
+    return rate;
   }
 };
 
@@ -240,6 +256,8 @@ void RunQueries(fuzz_input::Reader& in, Model& model, FilterUnderTest& under_tes
   MkvFilter* filter = under_test.filter();
   MkvContext* context = under_test.context();
   for (int q = 0; q < kMaxQueries && !in.empty(); ++q) {
+    logged.clear();
+    model.log.clear();
     const uint8_t op = in.Byte();
     const uint64_t value = in.Number();
     switch (op % 7) {
@@ -269,6 +287,7 @@ void RunQueries(fuzz_input::Reader& in, Model& model, FilterUnderTest& under_tes
       }
       case 4: {
         Check(Seek(filter, value, value ^ 0x55) == 0);
+        model.Seek(value ^ 0x55);
         for (size_t k = 0; k < model.channels.size(); ++k) {
           if (!model.preroll || !model.channels[k].acquired) continue;
           Check(under_test.state(k).PrerollTime == value && under_test.state(k).PrerollPending == 1);
@@ -291,6 +310,7 @@ void RunQueries(fuzz_input::Reader& in, Model& model, FilterUnderTest& under_tes
         break;
       }
     }
+    Check(logged == model.log);
     const uint32_t flags = context->CueTableFlags;
     Check(((flags & kCueTableValidated) != 0) == model.validated);
     Check(!model.validated || ((flags & kCueTableAllTracksCount) != 0) == model.all_tracks);
@@ -301,6 +321,7 @@ void RunQueries(fuzz_input::Reader& in, Model& model, FilterUnderTest& under_tes
 
 extern "C" int LLVMFuzzerInitialize(int*, char***) {
   host::SetLogThreshold(0);
+  host::SetLogCapture([](int level, const std::string& text) { logged.push_back(std::to_string(level) + " " + text); });
   return 0;
 }
 

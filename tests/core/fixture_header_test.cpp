@@ -1,23 +1,29 @@
 // Every real file through the header parse, against what mkvinfo and ffprobe
-// report about it: Info, the track records, cues, tags, the FLAC configuration
-// and the metadata list. (The frames of the track stored with header removal
-// are compared, prefix put back, in the plug-in's playback test.)
+// report about it: Info, the track records, the picture the framework's
+// decoder-configuration parser sees in each AVC and MPEG-4 track, the FLAC
+// configuration, cues, tags and the metadata list. (The frames of the track
+// stored with header removal are compared, prefix put back, in the plug-in's
+// playback test.)
 
 #include <gtest/gtest.h>
 
 #include <cstring>
 #include <filesystem>
 #include <memory>
+#include <numeric>
 #include <set>
 #include <string>
 #include <tuple>
 #include <vector>
 
+#include "core/codec_table.h"
 #include "core/flac_config.h"
 #include "core/header/element_walker.h"
 #include "core/memory.h"
 #include "core/metadata_list.h"
 #include "core/status.h"
+#include "platform/decoder_config.h"
+#include "tests/support/cluster_driver.h"
 #include "tests/support/fixtures.h"
 #include "tests/support/header_parse.h"
 
@@ -49,7 +55,16 @@ uint64_t field_or(const ExpectedTrack& track, const char* key, uint64_t absent) 
   return it == track.fields.end() ? absent : std::stoull(it->second);
 }
 
-void expect_track_matches(const mkv_track_info& track, const ExpectedTrack& want) {
+// ffprobe takes the pixel shape from the container, not from the codec's
+// configuration, when a display size in pixels differs from the picture.
+bool shape_from_container(const ExpectedTrack& t) {
+  const uint64_t width = field_or(t, "display_width", 0), height = field_or(t, "display_height", 0);
+  return field_or(t, "display_unit", 0) == 0 && width && height && (width != t.width || height != t.height);
+}
+
+// The pixel shape the framework reads from an AVC or MPEG-4 part 2
+// configuration (1:1 for any other track), checked against ffprobe's picture.
+std::pair<int64_t, int64_t> expect_track_matches(const mkv_track_info& track, const ExpectedTrack& want) {
   SCOPED_TRACE("track " + std::to_string(want.number));
   EXPECT_EQ(track.track_number, want.number);
   EXPECT_EQ(track.track_uid, want.uid);
@@ -74,11 +89,28 @@ void expect_track_matches(const mkv_track_info& track, const ExpectedTrack& want
   }
   if (want.codec == "A_FLAC") {
     mkv_flac_config config{};
-    ASSERT_EQ(parse_flac_stream_header(track.codec_private, track.codec_private_size, &config), kStatusOk);
+    EXPECT_EQ(parse_flac_stream_header(track.codec_private, track.codec_private_size, &config), kStatusOk);
     EXPECT_EQ(config.sample_rate, want.flac_sample_rate);
     EXPECT_EQ(config.channels, want.flac_channels);
     EXPECT_EQ(config.bits_per_sample, want.flac_bits);
   }
+  const uint32_t fourcc = lookup_codec_fourcc(track.codec_id);
+  if (want.type != "video" || (fourcc != fourcc_value("AVC1") && fourcc != fourcc_value("MP4V")) || !track.codec_private) return {1, 1};
+  MmDecoderConfigInfo config = {0, 0, 1, 1};
+  EXPECT_EQ(MmParseDecoderConfig(track.codec_private, track.codec_private_size, fourcc, &config, 0), 0);
+  EXPECT_EQ(config.Width, want.width);
+  EXPECT_EQ(config.Height, want.height);
+  const uint32_t divisor = std::gcd(config.PixelAspectWidth, config.PixelAspectHeight);
+  const int64_t num = config.PixelAspectWidth / divisor, den = config.PixelAspectHeight / divisor;
+  if (shape_from_container(want)) {  // which mkvmerge derived from the codec's
+    EXPECT_EQ(field_or(want, "display_height", 0), want.height);
+    EXPECT_EQ(field_or(want, "display_width", 0), (want.width * uint64_t(num) + uint64_t(den) / 2) / uint64_t(den));
+  } else {
+    EXPECT_NE(want.sar_num, 0u) << "ffprobe reported no aspect ratio";
+    const uint32_t theirs = std::gcd(want.sar_num, want.sar_den);
+    EXPECT_EQ(std::make_pair(num, den), std::make_pair(int64_t(want.sar_num / theirs), int64_t(want.sar_den / theirs)));
+  }
+  return {config.PixelAspectWidth, config.PixelAspectHeight};
 }
 
 using Cue = std::tuple<uint64_t, uint64_t, uint64_t, uint64_t>;  // time, track, cluster position, block
@@ -108,7 +140,8 @@ std::vector<int64_t> numbers(const mkv_metadata_list& list, const char* key) {
   return out;
 }
 
-void expect_metadata_matches(const mkv_metadata_list& list, const FixtureExpectation& expected) {
+void expect_metadata_matches(const mkv_metadata_list& list, const FixtureExpectation& expected,
+                             const std::vector<std::pair<int64_t, int64_t>>& shapes) {
   // First the offered tags, in file order, without a NUL.
   const char* offered[][2] = {{"TITLE", "Name"}, {"ARTIST", "Artist"}, {"GENRE", "Genre"}, {"ALBUM", "Album"},
                               {"COMMENT", "Comment"}};
@@ -127,7 +160,6 @@ void expect_metadata_matches(const mkv_metadata_list& list, const FixtureExpecta
 
   // Then nine entries per audio or video track, with the tools' figures.
   std::vector<int64_t> widths, heights, channels, rates, fourcc_zero;
-  std::vector<std::pair<int64_t, int64_t>> shapes;  // -1: not compared
   for (const auto& track : expected.tracks) {
     if (track.type != "video" && track.type != "audio") continue;
     bool video = track.type == "video";
@@ -138,16 +170,6 @@ void expect_metadata_matches(const mkv_metadata_list& list, const FixtureExpecta
                           : static_cast<int64_t>(track.sampling_frequency ? track.sampling_frequency : 8000.0));
     // An unsupported codec parses like any other but gets no four-character code.
     fourcc_zero.push_back(track.codec == "A_OPUS" || track.codec.rfind("V_VP", 0) == 0);
-    // The framework reads the pixel shape from AVC and MPEG-4 part 2
-    // configurations only. ffprobe takes it from the container instead when a
-    // display size in pixels differs from the picture: such a track is not compared.
-    bool shaped = video && track.sar_num != 0 && (track.codec == "V_MPEG4/ISO/AVC" || track.codec == "V_MPEG4/ISO/ASP");
-    bool from_container = field_or(track, "display_unit", 0) == 0 && field_or(track, "display_width", 0) != 0 &&
-                          (field_or(track, "display_width", 0) != track.width ||
-                           field_or(track, "display_height", 0) != track.height);
-    shapes.emplace_back(!shaped ? std::pair<int64_t, int64_t>{1, 1}
-                        : from_container ? std::pair<int64_t, int64_t>{-1, -1}
-                                         : std::pair<int64_t, int64_t>{track.sar_num, track.sar_den});
   }
   EXPECT_EQ(list.entry_count, static_cast<int32_t>(offered_expected.size() + 2 + 9 * widths.size()));
   EXPECT_EQ(numbers(list, "Width"), widths);
@@ -156,15 +178,10 @@ void expect_metadata_matches(const mkv_metadata_list& list, const FixtureExpecta
   EXPECT_EQ(numbers(list, "SampleRate"), rates);
   std::vector<int64_t> fourccs = numbers(list, "Fourcc"), pixel_widths = numbers(list, "PixelWidth"),
                        pixel_heights = numbers(list, "PixelHeight"), durations = numbers(list, "Duration");
-  ASSERT_EQ(fourccs.size(), widths.size());
-  ASSERT_EQ(pixel_widths.size(), widths.size());
-  ASSERT_EQ(pixel_heights.size(), widths.size());
-  ASSERT_EQ(durations.size(), widths.size());
+  for (const auto* listed : {&fourccs, &pixel_widths, &pixel_heights, &durations}) ASSERT_EQ(listed->size(), widths.size());
   for (size_t i = 0; i < widths.size(); ++i) {
     EXPECT_EQ(fourccs[i] == 0, fourcc_zero[i] != 0) << "track " << i;
-    if (shapes[i].first >= 0) {
-      EXPECT_EQ(std::make_pair(pixel_widths[i], pixel_heights[i]), shapes[i]) << "track " << i;
-    }
+    EXPECT_EQ(std::make_pair(pixel_widths[i], pixel_heights[i]), shapes[i]) << "track " << i;
     // mkvinfo prints nanoseconds rounded from the same double.
     EXPECT_NEAR(static_cast<double>(durations[i]), static_cast<double>(expected.duration_ns / 1000), 1.0);
   }
@@ -177,7 +194,8 @@ TEST_P(FixtureHeaderTest, AgreesWithMkvinfoAndFfprobe) {
   std::unique_ptr<mkv_metadata_list, void (*)(mkv_metadata_list*)> list(mem_new_zeroed<mkv_metadata_list>(),
                                                                         FreeMetadata);
   ASSERT_NE(list, nullptr);
-  HeaderParse parse(testing_support::ReadFixtureBytes(GetParam()), {.metadata = list.get()});
+  const std::vector<uint8_t> bytes = testing_support::ReadFixtureBytes(GetParam());
+  HeaderParse parse(bytes, {.metadata = list.get()});
   ASSERT_EQ(parse.Parse(), kParseSucceeded);
   const mkv_file_info& info = parse.info();
 
@@ -189,12 +207,15 @@ TEST_P(FixtureHeaderTest, AgreesWithMkvinfoAndFfprobe) {
   EXPECT_EQ(text(info.muxing_app), expected.muxing_app);
   EXPECT_EQ(text(info.writing_app), expected.writing_app);
 
+  EXPECT_EQ(info.first_cluster_position, testing_support::FirstClusterOffset(bytes.data(), bytes.size()));
   ASSERT_EQ(info.track_count, expected.tracks.size());
   uint32_t video = 0, audio = 0;
+  std::vector<std::pair<int64_t, int64_t>> shapes;  // of the video and audio tracks
   for (uint32_t i = 0; i < info.track_count; ++i) {
-    expect_track_matches(info.tracks[i], expected.tracks[i]);
+    std::pair<int64_t, int64_t> shape = expect_track_matches(info.tracks[i], expected.tracks[i]);
     video += expected.tracks[i].type == "video";
     audio += expected.tracks[i].type == "audio";
+    if (expected.tracks[i].type == "video" || expected.tracks[i].type == "audio") shapes.push_back(shape);
   }
   EXPECT_EQ(info.video_track_count, video);
   EXPECT_EQ(info.audio_track_count, audio);
@@ -209,7 +230,7 @@ TEST_P(FixtureHeaderTest, AgreesWithMkvinfoAndFfprobe) {
   for (uint32_t i = 0; i < info.tag_count; ++i) tags.emplace_back(text(info.tags[i].name), text(info.tags[i].string));
   EXPECT_EQ(tags, expected.tags);
 
-  expect_metadata_matches(*list, expected);
+  expect_metadata_matches(*list, expected, shapes);
 }
 
 INSTANTIATE_TEST_SUITE_P(Fixtures, FixtureHeaderTest, testing::ValuesIn(testing_support::FixtureNames()),
