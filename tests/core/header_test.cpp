@@ -217,9 +217,10 @@ Bytes cues() { return master(kCues, {point(0, position(1, 300, ref(1))), point(4
 Bytes trap() { return Bytes{0x00, 0x00, 0x00}; }
 
 // EBML header, then a Segment of a SeekHead listing each part under the given
-// ID (0: not listed) and the parts in order. Seek positions are written 8 bytes
-// wide, so the SeekHead's size never depends on them; `tail` ends the SeekHead.
-Bytes indexed(const std::vector<std::pair<Bytes, uint32_t>>& parts, const Bytes& tail = {}) {
+// ID (0: not listed) and the parts in order, the Segment's size ending after
+// the first `inside` parts. Seek positions are written 8 bytes wide, so the
+// SeekHead's size never depends on them; `tail` ends the SeekHead.
+Bytes indexed(const std::vector<std::pair<Bytes, uint32_t>>& parts, const Bytes& tail = {}, size_t inside = SIZE_MAX) {
   auto seek_head = [&](uint64_t start) {
     Bytes payload;
     for (const auto& [bytes, listed_as] : parts) {
@@ -228,19 +229,19 @@ Bytes indexed(const std::vector<std::pair<Bytes, uint32_t>>& parts, const Bytes&
     }
     return element(kSeekHead, cat({payload, tail}), 8);
   };
-  Bytes segment = seek_head(seek_head(0).size());
-  for (const auto& part : parts) segment = cat({segment, part.first});
-  return cat({ebml_header(), element(kSegment, segment, 8)});
+  Bytes segment = seek_head(seek_head(0).size()), outside;
+  for (size_t i = 0; i < parts.size(); ++i) (i < inside ? segment : outside) = cat({i < inside ? segment : outside, parts[i].first});
+  return cat({ebml_header(), element(kSegment, segment, 8), outside});
 }
 // Info, Tracks, two Clusters, Tags MIDDLE, a trap, a Cluster, Cues and Tags END,
 // listed as given: what was read behind the trap was jumped to.
-Bytes jumps(std::vector<uint32_t> listed, const Bytes& tail = {}) {
+Bytes jumps(std::vector<uint32_t> listed, const Bytes& tail = {}, size_t inside = SIZE_MAX) {
   listed.resize(9);
   const Bytes parts[] = {info_with_title("t"), tracks(1), cluster(0, 2000), cluster(1, 2000), tags("MIDDLE"),
                          trap(), cluster(3, 2000), cues(), tags("END")};
   std::vector<std::pair<Bytes, uint32_t>> listed_parts;
   for (size_t i = 0; i < 9; ++i) listed_parts.emplace_back(parts[i], listed[i]);
-  return indexed(listed_parts, tail);
+  return indexed(listed_parts, tail, inside);
 }
 // Info, Tracks, `clusters` Clusters of 64 KiB, Cues, Tags, listed or not.
 Bytes long_file(int clusters, bool listed) {
@@ -449,6 +450,9 @@ TEST(HeaderParseTest, ElementsAreStoredAnsweredAndLogged) {
        "tracks 1/1/0 #1 seek heads 1 (2) cues 0 tags 1 MIDDLE title t mux -"},
       {"jump: damaged SeekHead", kParse, jumps({0, 0, 0, 0, 0, 0, 0, kCues, kTags}, Bytes{0x00, 0x00}), kParseSucceeded,
        "tracks 1/1/0 #1 seek heads 0 cues 0 tags 1 MIDDLE title t mux -"},
+      // A Segment that ends after the first Cluster: the jump is made between top-level elements.
+      {"jump: behind a Segment that ends early", kParse, jumps({0, 0, 0, 0, 0, 0, 0, kCues, kTags}, {}, 3), kParseSucceeded,
+       "tracks 1/1/0 #1 seek heads 1 (2) cues 2 tags 1 END title t mux -"},
       {"jump: 10 MiB of clusters cost nothing", kParse, long_file(160, true), kParseSucceeded,
        "tracks 1/1/0 #1 seek heads 1 (4) cues 2 tags 1 END title t mux -", {}, 0, {}, 4096},
       // Without the SeekHead's entries every Cluster header costs a buffer refill.
