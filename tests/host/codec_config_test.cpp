@@ -7,15 +7,58 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdint>
 #include <string>
 #include <vector>
 
 #include "host/bit_reader.h"
-#include "tests/support/bit_writer.h"
 
 namespace {
 
 using Bytes = std::vector<uint8_t>;
+
+// Codec headers written bit by bit, most significant first.
+class BitWriter {
+ public:
+  BitWriter& Bits(unsigned count, uint64_t value) {
+    for (unsigned i = count; i-- > 0;) {
+      if (bit_count_ % 8 == 0) bytes_.push_back(0);
+      if ((value >> i) & 1) bytes_.back() |= static_cast<uint8_t>(0x80 >> (bit_count_ % 8));
+      ++bit_count_;
+    }
+    return *this;
+  }
+  BitWriter& Golomb(uint64_t value) {  // ue(v)
+    unsigned length = 0;
+    while (((value + 1) >> length) > 1) ++length;
+    return Bits(length, 0).Bits(length + 1, value + 1);
+  }
+  BitWriter& SignedGolomb(int64_t value) {  // se(v)
+    return Golomb(value > 0 ? 2 * static_cast<uint64_t>(value) - 1 : 2 * static_cast<uint64_t>(-value));
+  }
+  // The bits so far, the last byte padded with zeros.
+  const Bytes& bytes() const { return bytes_; }
+
+ private:
+  Bytes bytes_;
+  uint64_t bit_count_ = 0;
+};
+
+// An H.264 RBSP as a NAL unit payload: 03 after every 00 00 that precedes 00..03.
+Bytes EscapeRbsp(const Bytes& rbsp) {
+  Bytes out;
+  int zeros = 0;
+  for (uint8_t byte : rbsp) {
+    if (zeros >= 2 && byte <= 3) {
+      out.push_back(3);
+      zeros = 0;
+    }
+    out.push_back(byte);
+    zeros = byte == 0 ? zeros + 1 : 0;
+  }
+  return out;
+}
+
 constexpr uint32_t kAvc1 = 0x41564331, kMp4v = 0x4D503456;
 
 // An H.264 SPS; 320x240 unless cropped. aspect_idc -1: no aspect_ratio_info, -2: no VUI.
@@ -34,7 +77,7 @@ Bytes avc_record(const Bytes& sps) {
 }
 
 Bytes sps_nal(const Sps& s, uint8_t header = 0x67) {
-  testing_support::BitWriter w;
+  BitWriter w;
   w.Bits(8, header).Bits(8, 100).Bits(16, 40).Golomb(0).Golomb(s.chroma_format_idc);
   if (s.chroma_format_idc == 3) w.Bits(1, 0);
   w.Golomb(s.bit_depth_minus8).Golomb(s.bit_depth_minus8).Bits(1, 0).Bits(1, s.scaling_lists);
@@ -55,7 +98,7 @@ Bytes sps_nal(const Sps& s, uint8_t header = 0x67) {
   if (s.aspect_idc >= 0) w.Bits(8, static_cast<uint64_t>(s.aspect_idc));
   if (s.aspect_idc == 255) w.Bits(16, s.sar_width).Bits(16, s.sar_height);
   w.Bits(9, 1);  // the rest of the VUI absent, stop bit
-  return testing_support::EscapeRbsp(w.bytes());
+  return EscapeRbsp(w.bytes());
 }
 
 Bytes avc(const Sps& s) { return avc_record(sps_nal(s)); }
@@ -70,7 +113,7 @@ struct Vol {
 };
 
 Bytes vol(const Vol& v) {
-  testing_support::BitWriter w;
+  BitWriter w;
   w.Bits(24, 1).Bits(8, v.code).Bits(1, 0).Bits(8, v.object_type).Bits(1, v.verid != 0);
   if (v.verid) w.Bits(4, v.verid).Bits(3, 1);
   w.Bits(4, v.aspect);

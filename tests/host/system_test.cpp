@@ -1,3 +1,6 @@
+// The system library of the host: its heap, which keeps small blocks per
+// thread apart from malloc's, and the room left on the stack.
+
 #include <gtest/gtest.h>
 
 #include <cstddef>
@@ -84,6 +87,20 @@ TEST(HostHeapTest, BlocksGivenBackServeLaterRequestsOfTheirSize) {
 
   EXPECT_EQ(host::LiveBlockCount(), live_before);
   EXPECT_EQ(host::AllocationCount(), count_before + 7 * kLargest);
+}
+
+[[gnu::noinline]] size_t AvailableBelowABigFrame() {
+  volatile char big[8192];
+  big[0] = 1;
+  size_t available = SysStackAvail();
+  return available + big[0] - 1;
+}
+
+// The stream refuses to recurse on what this reports.
+TEST(HostStackTest, ReportsRoomBelowTheCaller) {
+  size_t here = SysStackAvail();
+  EXPECT_GT(here, 4224u);
+  EXPECT_LE(AvailableBelowABigFrame() + 8192, here);
 }
 
 }  // namespace
