@@ -1,7 +1,8 @@
 // Every real file through the header parse, against what mkvinfo and ffprobe
 // report about it: Info, the track records, the picture the framework's
 // decoder-configuration parser sees in each AVC and MPEG-4 track, the FLAC
-// configuration, cues, tags and the metadata list. (The frames of the track
+// configuration, cues and tags; the metadata list is built (its rules are
+// pinned on crafted files in the header test). (The frames of the track
 // stored with header removal are compared, prefix put back, in the plug-in's
 // playback test.)
 
@@ -62,9 +63,9 @@ bool shape_from_container(const ExpectedTrack& t) {
   return field_or(t, "display_unit", 0) == 0 && width && height && (width != t.width || height != t.height);
 }
 
-// The pixel shape the framework reads from an AVC or MPEG-4 part 2
-// configuration (1:1 for any other track), checked against ffprobe's picture.
-std::pair<int64_t, int64_t> expect_track_matches(const mkv_track_info& track, const ExpectedTrack& want) {
+// The track record against mkvinfo's; the picture the framework reads from an
+// AVC or MPEG-4 part 2 configuration against ffprobe's.
+void expect_track_matches(const mkv_track_info& track, const ExpectedTrack& want) {
   SCOPED_TRACE("track " + std::to_string(want.number));
   EXPECT_EQ(track.track_number, want.number);
   EXPECT_EQ(track.track_uid, want.uid);
@@ -95,7 +96,7 @@ std::pair<int64_t, int64_t> expect_track_matches(const mkv_track_info& track, co
     EXPECT_EQ(config.bits_per_sample, want.flac_bits);
   }
   const uint32_t fourcc = lookup_codec_fourcc(track.codec_id);
-  if (want.type != "video" || (fourcc != fourcc_value("AVC1") && fourcc != fourcc_value("MP4V")) || !track.codec_private) return {1, 1};
+  if (want.type != "video" || (fourcc != fourcc_value("AVC1") && fourcc != fourcc_value("MP4V")) || !track.codec_private) return;
   MmDecoderConfigInfo config = {0, 0, 1, 1};
   EXPECT_EQ(MmParseDecoderConfig(track.codec_private, track.codec_private_size, fourcc, &config, 0), 0);
   EXPECT_EQ(config.Width, want.width);
@@ -110,7 +111,6 @@ std::pair<int64_t, int64_t> expect_track_matches(const mkv_track_info& track, co
     const uint32_t theirs = std::gcd(want.sar_num, want.sar_den);
     EXPECT_EQ(std::make_pair(num, den), std::make_pair(int64_t(want.sar_num / theirs), int64_t(want.sar_den / theirs)));
   }
-  return {config.PixelAspectWidth, config.PixelAspectHeight};
 }
 
 using Cue = std::tuple<uint64_t, uint64_t, uint64_t, uint64_t>;  // time, track, cluster position, block
@@ -127,64 +127,6 @@ std::vector<Cue> cues_of(const mkv_file_info& info) {
     }
   }
   return out;
-}
-
-// The values of every entry under `key`, in list order, as numbers.
-std::vector<int64_t> numbers(const mkv_metadata_list& list, const char* key) {
-  std::vector<int64_t> out;
-  for (int i = 0; i < list.entry_count; ++i) {
-    if (std::strcmp(list.key[i], key) != 0) continue;
-    if (list.value_type[i] == kMetadataTypeNum8) out.push_back(*static_cast<const int64_t*>(list.value[i]));
-    else out.push_back(*static_cast<const uint32_t*>(list.value[i]));
-  }
-  return out;
-}
-
-void expect_metadata_matches(const mkv_metadata_list& list, const FixtureExpectation& expected,
-                             const std::vector<std::pair<int64_t, int64_t>>& shapes) {
-  // First the offered tags, in file order, without a NUL.
-  const char* offered[][2] = {{"TITLE", "Name"}, {"ARTIST", "Artist"}, {"GENRE", "Genre"}, {"ALBUM", "Album"},
-                              {"COMMENT", "Comment"}};
-  std::vector<std::pair<std::string, std::string>> offered_expected, offered_listed;
-  for (const auto& [tag_name, value] : expected.tags) {
-    for (const auto& row : offered) {
-      if (tag_name == row[0]) offered_expected.emplace_back(row[1], value);
-    }
-  }
-  for (int i = 0; i < list.entry_count && list.value_type[i] == kMetadataTypeUtf8; ++i) {
-    offered_listed.emplace_back(list.key[i], std::string(static_cast<const char*>(list.value[i]),
-                                                         static_cast<size_t>(list.value_size[i])));
-  }
-  EXPECT_EQ(offered_listed, offered_expected);
-  EXPECT_EQ(numbers(list, "Seekable"), std::vector<int64_t>{expected.cue_point_count > 0 ? 1 : 0});
-
-  // Then nine entries per audio or video track, with the tools' figures.
-  std::vector<int64_t> widths, heights, channels, rates, fourcc_zero;
-  for (const auto& track : expected.tracks) {
-    if (track.type != "video" && track.type != "audio") continue;
-    bool video = track.type == "video";
-    widths.push_back(video ? static_cast<int64_t>(track.width) : 0);
-    heights.push_back(video ? static_cast<int64_t>(track.height) : 0);
-    channels.push_back(video ? 0 : static_cast<int64_t>(track.channels ? track.channels : 1));
-    rates.push_back(video ? (track.default_duration ? (10000000000 / track.default_duration + 5) / 10 : 0)
-                          : static_cast<int64_t>(track.sampling_frequency ? track.sampling_frequency : 8000.0));
-    // An unsupported codec parses like any other but gets no four-character code.
-    fourcc_zero.push_back(track.codec == "A_OPUS" || track.codec.rfind("V_VP", 0) == 0);
-  }
-  EXPECT_EQ(list.entry_count, static_cast<int32_t>(offered_expected.size() + 2 + 9 * widths.size()));
-  EXPECT_EQ(numbers(list, "Width"), widths);
-  EXPECT_EQ(numbers(list, "Height"), heights);
-  EXPECT_EQ(numbers(list, "Channels"), channels);
-  EXPECT_EQ(numbers(list, "SampleRate"), rates);
-  std::vector<int64_t> fourccs = numbers(list, "Fourcc"), pixel_widths = numbers(list, "PixelWidth"),
-                       pixel_heights = numbers(list, "PixelHeight"), durations = numbers(list, "Duration");
-  for (const auto* listed : {&fourccs, &pixel_widths, &pixel_heights, &durations}) ASSERT_EQ(listed->size(), widths.size());
-  for (size_t i = 0; i < widths.size(); ++i) {
-    EXPECT_EQ(fourccs[i] == 0, fourcc_zero[i] != 0) << "track " << i;
-    EXPECT_EQ(std::make_pair(pixel_widths[i], pixel_heights[i]), shapes[i]) << "track " << i;
-    // mkvinfo prints nanoseconds rounded from the same double.
-    EXPECT_NEAR(static_cast<double>(durations[i]), static_cast<double>(expected.duration_ns / 1000), 1.0);
-  }
 }
 
 class FixtureHeaderTest : public testing::TestWithParam<std::string> {};
@@ -210,12 +152,10 @@ TEST_P(FixtureHeaderTest, AgreesWithMkvinfoAndFfprobe) {
   EXPECT_EQ(info.first_cluster_position, testing_support::FirstClusterOffset(bytes.data(), bytes.size()));
   ASSERT_EQ(info.track_count, expected.tracks.size());
   uint32_t video = 0, audio = 0;
-  std::vector<std::pair<int64_t, int64_t>> shapes;  // of the video and audio tracks
   for (uint32_t i = 0; i < info.track_count; ++i) {
-    std::pair<int64_t, int64_t> shape = expect_track_matches(info.tracks[i], expected.tracks[i]);
+    expect_track_matches(info.tracks[i], expected.tracks[i]);
     video += expected.tracks[i].type == "video";
     audio += expected.tracks[i].type == "audio";
-    if (expected.tracks[i].type == "video" || expected.tracks[i].type == "audio") shapes.push_back(shape);
   }
   EXPECT_EQ(info.video_track_count, video);
   EXPECT_EQ(info.audio_track_count, audio);
@@ -229,8 +169,6 @@ TEST_P(FixtureHeaderTest, AgreesWithMkvinfoAndFfprobe) {
   std::vector<std::pair<std::string, std::string>> tags;
   for (uint32_t i = 0; i < info.tag_count; ++i) tags.emplace_back(text(info.tags[i].name), text(info.tags[i].string));
   EXPECT_EQ(tags, expected.tags);
-
-  expect_metadata_matches(*list, expected, shapes);
 }
 
 INSTANTIATE_TEST_SUITE_P(Fixtures, FixtureHeaderTest, testing::ValuesIn(testing_support::FixtureNames()),

@@ -558,6 +558,12 @@ TEST(HeaderParseTest, MetadataListFollowsTheFile) {
       {"cues on a pipe", file({info_with_title("t"), subtitles, cues()}), 2, {"Seekable NUM4 0", "TrackCount NUM4 0"}, {.seekable = false}},
       {"cues without limits", file({info_with_title("t"), subtitles, cues()}), 2, {"Seekable NUM4 0", "TrackCount NUM4 0"}, {.with_limits = false}},
       {"cues emptied by a second Cues", file({info_with_title("t"), subtitles, cues(), master(kCues, {})}), 2, {"Seekable NUM4 0", "TrackCount NUM4 0"}},
+      // An x264 configuration of 200x90 pixels of 97:60.
+      {"pixel shape from the codec's configuration",
+       with_track(track(1, "V_MPEG4/ISO/AVC", {bin(kCodecPrivate, {0x01, 0x64, 0x00, 0x0B, 0xFF, 0xE1, 0x00, 0x1E, 0x67, 0x64, 0x00, 0x0B, 0xAC, 0xD9, 0x43, 0x4D,
+                                                                    0xE5, 0x93, 0xFF, 0x00, 0x61, 0x00, 0x3C, 0x10, 0x00, 0x00, 0x03, 0x00, 0x10, 0x00, 0x00, 0x03,
+                                                                    0x03, 0x20, 0xF1, 0x42, 0x99, 0x60, 0x01, 0x00, 0x06, 0x68, 0xEB, 0xE3, 0xCB, 0x22, 0xC0})})),
+       11, {"PixelWidth NUM4 97", "PixelHeight NUM4 60", "Duration NUM8 0", "Channels NUM4 0", "SampleRate NUM4 0"}},
       {"23.976 frames per second", with_track(video(41708333)), 11, {"SampleRate NUM4 24"}},
       {"no DefaultDuration", with_track(video(0)), 11, {"SampleRate NUM4 0"}},
       {"1 ns per frame", with_track(video(1)), 11, {"SampleRate NUM4 1000000000"}},
