@@ -210,7 +210,7 @@ Bytes track_entries(int count) {
   });
 }
 Bytes tracks(int count) { return element(kTracks, track_entries(count)); }
-Bytes tags(std::string_view name, int count = 1) { return master(kTags, {element(kTag, repeat(count, [&](int) { return simple_tag(name, "v"); }))}); }
+Bytes tags(std::string_view name, std::string_view value = "v") { return master(kTags, {element(kTag, simple_tag(name, value))}); }
 Bytes cluster(uint64_t timecode, size_t payload) { return master(kCluster, {uinteger(kTimecode, timecode), bin(kSimpleBlock, filler(payload))}); }
 Bytes cues() { return master(kCues, {point(0, position(1, 300, ref(1))), point(40, position(2, 300))}); }
 // A byte that cannot start an ID: reading it ends the walk of the Segment.
@@ -553,6 +553,11 @@ TEST(HeaderParseTest, MetadataListFollowsTheFile) {
         "PixelHeight NUM4 1", "Duration NUM8 5000000", "Channels NUM4 0", "SampleRate NUM4 24", "MediaType NUM4 2147483652",
         "Fourcc NUM4 1295270211", "Width NUM4 0", "Height NUM4 0", "PixelWidth NUM4 1", "PixelHeight NUM4 1", "Duration NUM8 5000000",
         "Channels NUM4 6", "SampleRate NUM4 44100"}},
+      // A value of up to 32768 bytes, also of none, is kept; a longer one ends the list.
+      {"empty title", file({info_with_title("t"), subtitles, tags("TITLE", "")}), 3, {"Name UTF8 ", "Seekable NUM4 0", "TrackCount NUM4 0"}},
+      {"title of 32768 bytes", file({info_with_title("t"), subtitles, tags("TITLE", std::string(32768, 'n'))}), 3,
+       {"Name UTF8 " + std::string(32768, 'n'), "Seekable NUM4 0", "TrackCount NUM4 0"}, {.with_limits = false}},
+      {"title of 32769 bytes", file({info_with_title("t"), subtitles, tags("TITLE", std::string(32769, 'n'))}), 0, {}, {.with_limits = false}},
       {"cues", file({info_with_title("t"), subtitles, cues()}), 2, {"Seekable NUM4 1", "TrackCount NUM4 0"}},
       {"no cues", file({info_with_title("t"), subtitles}), 2, {"Seekable NUM4 0", "TrackCount NUM4 0"}},
       {"cues on a pipe", file({info_with_title("t"), subtitles, cues()}), 2, {"Seekable NUM4 0", "TrackCount NUM4 0"}, {.seekable = false}},
