@@ -173,25 +173,20 @@ struct Model {
 };
 
 // The filter's records around the same table.
-class FilterUnderTest {
- public:
+struct FilterUnderTest {
   explicit FilterUnderTest(const Model& model)
-      : context_(std::make_unique<MkvContext>()),
-        channels_(model.channels.size()),
-        states_(model.channels.size()),
-        tracks_(model.channels.size()) {
-    filter_.Context = context_.get();
-    filter_.OutputChannels = channels_.data();
-    context_->OutputChannelCount = static_cast<int32_t>(model.channels.size());
-    context_->EnablePreroll = model.preroll ? 1 : 0;
+      : channels(model.channels.size()), states(model.channels.size()), tracks(model.channels.size()) {
+    filter.Context = context.get();
+    filter.OutputChannels = channels.data();
+    context->OutputChannelCount = static_cast<int32_t>(model.channels.size());
+    context->EnablePreroll = model.preroll ? 1 : 0;
     for (size_t k = 0; k < model.channels.size(); ++k) {
-      tracks_[k].track_number = model.channels[k].track;
-      states_[k].Track = &tracks_[k];
-      states_[k].Acquired = model.channels[k].acquired ? 1 : 0;
-      channels_[k].State = &states_[k];
-      channels_[k].Flags = model.channels[k].acquired ? kChannelAcquired : 0;
+      tracks[k].track_number = model.channels[k].track;
+      states[k].Track = &tracks[k];
+      channels[k].State = &states[k];
+      Acquire(k, model.channels[k].acquired);
     }
-    mkv_file_info& info = context_->FileInfo;
+    mkv_file_info& info = context->FileInfo;
     info.timecode_scale = model.scale;
     info.segment_data_position = model.segment;
     info.first_cluster_position = model.first_cluster;
@@ -203,27 +198,23 @@ class FilterUnderTest {
       for (const ModelPosition& p : row.positions) {
         auto* position = mem_new_zeroed<mkv_cue_track_position>();
         Check(position != nullptr);
-        position->cue_track = p.track;
-        position->cue_cluster_position = p.cluster;
-        position->cue_codec_state = p.track & 1;
+        *position = {p.track, p.cluster, 0, p.track & 1, {}};
         Check(mkv_queue_append(&cue->track_positions, position));
       }
       Check(mkv_queue_append(&info.cue_points, cue));
     }
   }
-  ~FilterUnderTest() { free_cue_points(&context_->FileInfo.cue_points); }
+  ~FilterUnderTest() { free_cue_points(&context->FileInfo.cue_points); }
+  void Acquire(size_t k, bool acquired) {
+    states[k].Acquired = acquired ? 1 : 0;
+    channels[k].Flags = acquired ? kChannelAcquired : 0;
+  }
 
-  MkvFilter* filter() { return &filter_; }
-  MkvContext* context() { return context_.get(); }
-  MkvChannelState& state(size_t k) { return states_[k]; }
-  MkvChannel& channel(size_t k) { return channels_[k]; }
-
- private:
-  MkvFilter filter_{};
-  std::unique_ptr<MkvContext> context_;
-  std::vector<MkvChannel> channels_;
-  std::vector<MkvChannelState> states_;
-  std::vector<mkv_track_info> tracks_;
+  MkvFilter filter{};
+  std::unique_ptr<MkvContext> context = std::make_unique<MkvContext>();
+  std::vector<MkvChannel> channels;
+  std::vector<MkvChannelState> states;
+  std::vector<mkv_track_info> tracks;
 };
 
 Model ReadModel(fuzz_input::Reader& in) {
@@ -253,8 +244,8 @@ Model ReadModel(fuzz_input::Reader& in) {
 }
 
 void RunQueries(fuzz_input::Reader& in, Model& model, FilterUnderTest& under_test) {
-  MkvFilter* filter = under_test.filter();
-  MkvContext* context = under_test.context();
+  MkvFilter* filter = &under_test.filter;
+  MkvContext* context = under_test.context.get();
   for (int q = 0; q < kMaxQueries && !in.empty(); ++q) {
     logged.clear();
     model.log.clear();
@@ -290,7 +281,7 @@ void RunQueries(fuzz_input::Reader& in, Model& model, FilterUnderTest& under_tes
         model.Seek(value ^ 0x55);
         for (size_t k = 0; k < model.channels.size(); ++k) {
           if (!model.preroll || !model.channels[k].acquired) continue;
-          Check(under_test.state(k).PrerollTime == value && under_test.state(k).PrerollPending == 1);
+          Check(under_test.states[k].PrerollTime == value && under_test.states[k].PrerollPending == 1);
         }
         break;
       }
@@ -305,8 +296,7 @@ void RunQueries(fuzz_input::Reader& in, Model& model, FilterUnderTest& under_tes
         if (model.channels.empty()) break;
         const size_t k = value % model.channels.size();
         model.channels[k].acquired = !model.channels[k].acquired;
-        under_test.state(k).Acquired = model.channels[k].acquired ? 1 : 0;
-        under_test.channel(k).Flags = model.channels[k].acquired ? kChannelAcquired : 0;
+        under_test.Acquire(k, model.channels[k].acquired);
         break;
       }
     }
