@@ -65,7 +65,7 @@ constexpr uint32_t kAvc1 = 0x41564331, kMp4v = 0x4D503456;
 struct Sps {
   uint32_t chroma_format_idc = 1;
   bool scaling_lists = false;
-  uint32_t bit_depth_minus8 = 0, poc_type = 0, poc_cycle = 3, crop_right = 0, width_in_mbs = 20;
+  uint32_t bit_depth_minus8 = 0, poc_type = 0, poc_cycle = 3, crop_right = 0, width_in_mbs = 20, level = 40;
   int aspect_idc = 14;
   uint32_t sar_width = 0, sar_height = 0;
 };
@@ -78,7 +78,7 @@ Bytes avc_record(const Bytes& sps) {
 
 Bytes sps_nal(const Sps& s, uint8_t header = 0x67) {
   BitWriter w;
-  w.Bits(8, header).Bits(8, 100).Bits(16, 40).Golomb(0).Golomb(s.chroma_format_idc);
+  w.Bits(8, header).Bits(8, 100).Bits(8, 0).Bits(8, s.level).Golomb(0).Golomb(s.chroma_format_idc);
   if (s.chroma_format_idc == 3) w.Bits(1, 0);
   w.Golomb(s.bit_depth_minus8).Golomb(s.bit_depth_minus8).Bits(1, 0).Bits(1, s.scaling_lists);
   for (int i = 0; s.scaling_lists && i < (s.chroma_format_idc == 3 ? 12 : 8); ++i) {
@@ -177,6 +177,7 @@ TEST(DecoderConfigTest, ConfigurationsGiveTheirPictureShape) {
       {"twelve scaling lists, 10 bits", avc({.chroma_format_idc = 3, .scaling_lists = true, .bit_depth_minus8 = 2}), kAvc1, true, {320, 240, 4, 3}},
       {"picture order type 1 with a cycle", avc({.poc_type = 1}), kAvc1, true, {320, 240, 4, 3}},
       {"picture order type 2", avc({.poc_type = 2}), kAvc1, true, {320, 240, 4, 3}},
+      {"level 3: a 03 byte after a single zero stays", avc({.level = 3}), kAvc1, true, {320, 240, 4, 3}},
       {"4:2:0 crop counts chroma samples", avc({.crop_right = 3}), kAvc1, true, {314, 240, 4, 3}},
       {"aspect idc 13", avc({.aspect_idc = 13}), kAvc1, true, {320, 240, 160, 99}},
       {"reserved aspect idc 17", avc({.aspect_idc = 17}), kAvc1, true, {320, 240, 33, 44}},
