@@ -208,6 +208,8 @@ TEST(DecoderConfigTest, ConfigurationsGiveTheirPictureShape) {
       {"fixed rate, resolution 32769", vol({.time_resolution = 32769, .increment_bits = 16}), kMp4v, true, {352, 288, 10, 11}},
       {"binary shape has no size", vol({.shape = 1}), kMp4v, true, {0, 0, 10, 11}},
       {"grayscale shape, version 2", vol({.verid = 2, .shape = 3}), kMp4v, true, {0, 0, 10, 11}},
+      // Ending with its time increment: the shape extension of version 2 would read past the end.
+      {"grayscale shape, version 1", vol({.verid = 1, .shape = 3, .time_resolution = 16, .increment_bits = 4}), kMp4v, true, {0, 0, 10, 11}},
       {"behind a BITMAPINFOHEADER", behind(bitmap_info(), vol({})), kMp4v, true, {352, 288, 10, 11}},
       {"last layer start code 0x2F", vol({.code = 0x2F}), kMp4v, true, {352, 288, 10, 11}},
       {"start code 0x30 is no layer", vol({.code = 0x30}), kMp4v, false, {11, 22, 33, 44}},
