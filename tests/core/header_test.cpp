@@ -230,7 +230,10 @@ Bytes indexed(const std::vector<std::pair<Bytes, uint32_t>>& parts, const Bytes&
     return element(kSeekHead, cat({payload, tail}), 8);
   };
   Bytes segment = seek_head(seek_head(0).size()), outside;
-  for (size_t i = 0; i < parts.size(); ++i) (i < inside ? segment : outside) = cat({i < inside ? segment : outside, parts[i].first});
+  for (size_t i = 0; i < parts.size(); ++i) {
+    Bytes& into = i < inside ? segment : outside;
+    into = cat({into, parts[i].first});
+  }
   return cat({ebml_header(), element(kSegment, segment, 8), outside});
 }
 // Info, Tracks, two Clusters, Tags MIDDLE, a trap, a Cluster, Cues and Tags END,
