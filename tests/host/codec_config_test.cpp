@@ -82,8 +82,8 @@ Bytes sps_nal(const Sps& s, uint8_t header = 0x67) {
   if (s.chroma_format_idc == 3) w.Bits(1, 0);
   w.Golomb(s.bit_depth_minus8).Golomb(s.bit_depth_minus8).Bits(1, 0).Bits(1, s.scaling_lists);
   for (int i = 0; s.scaling_lists && i < (s.chroma_format_idc == 3 ? 12 : 8); ++i) {
-    w.Bits(1, i != 2);  // list 2 absent, odd lists ended early by a zero scale
-    for (int j = 0; i != 2 && j < (i % 2 ? 1 : i < 6 ? 16 : 64); ++j) w.SignedGolomb(i % 2 ? -8 : j % 3 - 1);
+    w.Bits(1, i != 2);  // list 2 absent, odd lists ended early by a scale of 8 - 4 - 4
+    for (int j = 0; i != 2 && j < (i % 2 ? 2 : i < 6 ? 16 : 64); ++j) w.SignedGolomb(i % 2 ? -4 : j % 3 - 1);
   }
   w.Golomb(0).Golomb(s.poc_type);
   if (s.poc_type == 0) w.Golomb(2);
