@@ -280,7 +280,7 @@ Walk PropertyElement(Call& call) {
     if (ConvertToPosition(call.filter, value, &position) == 0) (void)ConvertToTime(call.filter, position, &start);
     state->StartTime = start;
     state->SendStartTime = 1;
-    state->ScanMode = call.context->TrickMode != 0;
+    state->ScanMode = LoadTrickMode(call.context) != 0;
     return Walk::kGoOn;
   }
   if (int error = SetOutProperty(state, type, value); error != 0) {
