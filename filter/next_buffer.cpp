@@ -186,11 +186,10 @@ Walk ParseBuffer(Call& call) {
       ApplySkip(state);
       continue;
     }
-    // Ran out with both views used up: the read resumes with the next buffer.
-    if ((parsed == kClusterChildShort || parsed == kClusterHeaderFailed) && state->inbuff2.buff_left == 0 &&
-        in.buff_left == 0) {
-      break;
-    }
+    // The parser waits for the bytes after inbuff1: the read goes on with the
+    // next buffer. (One that waits while inbuff1 still holds bytes, a CodecState
+    // longer than both views, cannot go on: -1 below.)
+    if (mkvcluster_answer(&state->Cluster, parsed) == cluster_answer::need_more_data && in.buff_left == 0) break;
     if (parsed == kClusterChildShort) {
       MoveOnAndFreeBuffer(state, call.filter);
       state->ReadBuffer = nullptr;
