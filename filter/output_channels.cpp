@@ -21,6 +21,23 @@ std::atomic_ref<int32_t> AcquiredCount(MkvContext* context) {
 
 }  // namespace
 
+bool RefusedWithoutTrack(const MkvChannel* channel, const char* operation) {
+  if (!channel || channel->Direction != kMmfDirectionOutput || !channel->State || channel->State->Track) return false;
+  const MkvFilter* filter = channel->Filter;
+  const MkvChannel* first = filter ? filter->OutputChannels : nullptr;
+  const int32_t count = filter && filter->Context ? filter->Context->OutputChannelCount : 0;
+  const bool listed = first && channel >= first && channel < first + count;
+  const int index = listed ? static_cast<int>(channel - first) : -1;
+  const uint32_t track = channel->State->LeftOutTrack;
+  if (listed && track != 0 && track <= kMaxTracks && filter->Context->FileInfo.tracks[track - 1].encrypted) {
+    AoLog(kAoLogFailure, "kelvane: %s channel %d has no track: track %d is encrypted.", operation, index,
+          static_cast<int>(track - 1));
+  } else {
+    AoLog(kAoLogFailure, "kelvane: %s channel %d has no track.", operation, index);
+  }
+  return true;
+}
+
 MkvChannel* IterateOutputChannels(MkvFilter* filter, int32_t* iterator) {
   if (!filter || !iterator || !filter->Context) return nullptr;
   int32_t index = *iterator;
