@@ -50,6 +50,8 @@ struct MraPoolState {
   bool closed = false;  // freed by its owner; deleted with the last media buffer
 };
 
+thread_local uint64_t acquired_on_this_thread = 0;
+
 constexpr int kInvalid = 22;
 constexpr int kOutOfRange = 28;
 constexpr int kNoneFree = 11;
@@ -141,6 +143,8 @@ MmfMraPool* MakeMraPool(uint32_t count, uint32_t capacity) {
 
 const MraElement* MraElements(MmfMra* mra) { return Host(mra)->elements; }
 
+uint64_t MrasAcquiredOnThisThread() { return acquired_on_this_thread; }
+
 uint32_t MraPoolFreeCount(MmfMraPool* pool) {
   std::lock_guard lock(State(pool)->mutex);
   return static_cast<uint32_t>(State(pool)->free.size());
@@ -151,7 +155,7 @@ uint32_t MraPoolFreeCount(MmfMraPool* pool) {
 extern "C" int MmfAllocateMraPool(MmfMraPool** pool, MmfChannel* channel, uint32_t capacity) {
   if (!pool || !channel || capacity == 0) return kInvalid;
   uint32_t count = channel->Format.buffer_count ? channel->Format.buffer_count : 1;
-  MmfMraPool* made = host::MakeMraPool(count, capacity);
+  MmfMraPool* made = host::MakeMraPool(count, capacity < host::kOutputBufferElements ? capacity : host::kOutputBufferElements);
   if (!made) return kNoMemory;
   *pool = made;
   return 0;
@@ -184,6 +188,7 @@ extern "C" int MmfAcquireMra(MmfMraPool* pool, MmfMra** mra, uint32_t flags) {
   taken->in_use = 1;
   taken->record.ElementCount = 0;
   ++state->in_use;
+  ++acquired_on_this_thread;
   *mra = &taken->record;
   return 0;
 }
