@@ -6,6 +6,7 @@
 #include <memory>
 #include <thread>
 
+#include "host/damage_recovery.h"
 #include "host/file_streamer.h"
 #include "host/graph_clock.h"
 #include "host/graph_setup.h"
@@ -14,6 +15,7 @@
 #include "host/thread_placement.h"
 #include "platform/media_buffer.h"
 #include "platform/mmf_status.h"
+#include "platform/mra_pool.h"
 
 namespace host {
 namespace {
@@ -77,14 +79,21 @@ class Sink {
   Sink(const Sink&) = delete;  // it points into itself
   Sink& operator=(const Sink&) = delete;
 
-  void Consume(MmfMra* mra) {
+  // Takes the buffer's frames; answers the buffer as a consumer of whole
+  // buffers is to see it: the same, or while catching up a copy without the
+  // frames passed on before (given back with MmfReleaseMra).
+  MmfMra* Consume(MmfMra* mra) {
     const MraElement* element = MraElements(mra);
     const MraElement* const end = element + mra->ElementCount;
+    consumed_ = element;
+    consumed_count_ = mra->ElementCount;
+    frame_first_ = element;  // of a frame begun in an earlier buffer, the part in this one
     while (element != end) {
-      if (config_left_ == 0 && !in_parts_ && !checksum_) {
+      if (config_left_ == 0 && !in_parts_ && !checksum_ && skip_before_ == 0) {
         element = TakeWholeFrames(element, end);
         if (element == end) break;
       }
+      current_ = element;
       if (element->kind == kMmfElementBuffer) {
         Buffer(*element);
       } else if (element->kind == kMmfElementProperty) {
@@ -92,7 +101,13 @@ class Sink {
       }
       ++element;
     }
+    NoteFrameEnd();
     PassFrames();
+    return dropped_.empty() ? mra : WithoutDropped(mra);
+  }
+
+  ~Sink() {
+    if (copies_) (void)MmfFreeMraPool(copies_);
   }
 
   void Finish() { run_->incomplete_frame = in_parts_; }
@@ -104,7 +119,43 @@ class Sink {
     marked_ = false;
   }
 
+  // After the runner went back to a point before frames it already passed on
+  // (to let a channel catch up): frames that start before `offset` are dropped.
+  void SkipBefore(uint64_t offset) { skip_before_ = offset; }
+
  private:
+  MmfMra* WithoutDropped(MmfMra* mra) {
+    MmfMra* copy = nullptr;
+    if (!copies_) copies_ = MakeMraPool(1, mra->Capacity);
+    if (copies_ && MmfAcquireMra(copies_, &copy, kMmfAcquireNoWait) == 0) {
+      uint32_t n = 0;
+      for (uint32_t i = 0; i < consumed_count_; ++i) {
+        const MraElement& e = consumed_[i];
+        if (dropped_[i]) continue;
+        (void)(e.kind == kMmfElementBuffer ? MmfSetMraBufferElement(copy, n++, e.handle, e.address, e.size)
+                                           : MmfSetMraPropertyElement(copy, n++, e.type, e.low, e.high));
+      }
+    }
+    dropped_.clear();
+    return copy ? copy : mra;
+  }
+
+  // Where the last frame passed on ends in the file: its element's place in
+  // the input buffer that the last file-offset property named.
+  void NoteFrameEnd() {
+    if (!last_frame_) return;
+    run_->frame_end = file_offset_ + static_cast<uint64_t>(last_frame_->address + last_frame_->size -
+                                                           last_frame_->handle->Data);
+    last_frame_ = nullptr;
+  }
+
+  // Whether a frame whose first input piece is `element` was passed on before a catch-up.
+  bool PassedBefore(const MraElement& element) {
+    if (file_offset_ + static_cast<uint64_t>(element.address - element.handle->Data) < skip_before_) return true;
+    skip_before_ = 0;  // a channel's frames come in file order: the rest are new
+    return false;
+  }
+
   void Property(const MraElement& element) {
     const uint32_t type = element.type;
     // A time comes with every frame: tested before the rest, without a jump table.
@@ -113,6 +164,10 @@ class Sink {
       return;
     }
     switch (type) {
+      case kMmfPropFileOffset:
+        NoteFrameEnd();
+        file_offset_ = MmfPropertyValue(element.low, element.high);
+        break;
       case kMmfPropTimeMarker:
         ++run_->time_markers;
         marked_ = true;
@@ -126,11 +181,13 @@ class Sink {
       case kMmfPropFramePart:
         if (!in_parts_) StartFrame();
         in_parts_ = true;
+        if (dropping_) Drop(current_);
         break;
       case kMmfPropFrameEnd:
         if (!in_parts_) StartFrame();
         in_parts_ = true;
         last_part_ = true;
+        if (dropping_) Drop(current_);
         break;
       default:
         break;
@@ -141,6 +198,15 @@ class Sink {
     frame_ = RunFrame{time_, 0, 0, marked_};
     marked_ = false;
     adler_ = Adler32{};
+    dropping_ = false;
+    placed_ = false;
+    frame_first_ = current_;
+  }
+
+  // While catching up: the consumer of whole buffers does not see this element.
+  void Drop(const MraElement* element) {
+    if (dropped_.empty()) dropped_.resize(consumed_count_);
+    dropped_[static_cast<size_t>(element - consumed_)] = true;
   }
 
   // Whether a frame element's bytes are the input's own (zero copy). Its
@@ -161,21 +227,30 @@ class Sink {
       return;
     }
     if (!ZeroCopy(element.handle)) ++run_->foreign_elements;
+    const bool from_input = element.handle->Pool != prefix_pool_;
     if (!in_parts_) {
       // A frame of its own: passed on at once, with nothing to put together.
       const RunFrame frame{time_, element.size, checksum_ ? Checksum(element) : 0, marked_};
       marked_ = false;
+      if (skip_before_ != 0 && PassedBefore(element)) return Drop(current_);
+      last_frame_ = &element;
       Deliver(frame);
       return;
     }
+    if (skip_before_ != 0 && from_input && !placed_ && (dropping_ = PassedBefore(element))) {
+      for (const MraElement* e = frame_first_; e < current_; ++e) Drop(e);
+    }
+    placed_ = placed_ || from_input;
+    if (dropping_) Drop(current_);
     frame_.size += element.size;
     if (checksum_) adler_.Update(element.address, element.size);
     if (!last_part_) return;
+    if (!dropping_) last_frame_ = &element;  // only a whole frame counts as passed on
     frame_.adler32 = checksum_ ? adler_.Value() : 0;
     in_parts_ = false;
     last_part_ = false;
     const RunFrame frame = frame_;
-    Deliver(frame);
+    if (!dropping_) Deliver(frame);
   }
 
   // Nearly every element is a frame's time or a whole frame: without
@@ -188,6 +263,7 @@ class Sink {
     RunFrame* out = batch_end_;
     RunFrame* limit = batch_limit_;
     uint64_t foreign = 0;
+    const MraElement* last = nullptr;
     for (; element != end; ++element) {
       if (element->kind == kMmfElementProperty) {
         const uint32_t type = element->type;
@@ -197,6 +273,7 @@ class Sink {
       }
       if (element->kind != kMmfElementBuffer) break;
       foreign += ZeroCopy(element->handle) ? 0 : 1;
+      last = element;
       *out++ = RunFrame{time, element->size, 0, marked};
       marked = false;
       if (out == limit) {
@@ -210,6 +287,7 @@ class Sink {
     marked_ = marked;
     batch_end_ = out;
     run_->foreign_elements += foreign;
+    if (last) last_frame_ = last;
     return element;
   }
 
@@ -269,6 +347,17 @@ class Sink {
   bool in_parts_ = false;   // a frame announced by property 7 is being put together
   bool last_part_ = false;  // property 8 came: the next buffer element ends the frame
   bool marked_ = false;     // a time marker came since the last frame started
+  const MraElement* consumed_ = nullptr;  // the elements of the buffer being consumed
+  uint32_t consumed_count_ = 0;
+  const MraElement* current_ = nullptr;      // the element being taken
+  const MraElement* frame_first_ = nullptr;  // the first element of the frame being put together
+  std::vector<bool> dropped_;  // while catching up: elements of frames passed on before
+  MmfMraPool* copies_ = nullptr;
+  bool placed_ = false;     // the frame being put together has had a piece from the input
+  bool dropping_ = false;   // that piece showed it was passed on before a catch-up
+  uint64_t file_offset_ = 0;               // of the input buffer that the last file-offset property named
+  const MraElement* last_frame_ = nullptr;  // last input piece of a frame in the buffer being consumed
+  uint64_t skip_before_ = 0;               // frames that start before this offset are dropped; 0: none
   RunFrame frame_;
   Adler32 adler_;
   RunFrame batch_[kFrameBatch];
@@ -277,55 +366,70 @@ class Sink {
   RunFrame* batch_limit_ = batch_ + kFrameBatch;
 };
 
-// A channel that fails stops the graph, as a player does when one of its
-// decoders' inputs breaks: the other channels may be waiting for ring room
-// that only the failed channel's reads would free, and Stop wakes them.
 constexpr int kControlStopped = 16;  // the control state a channel answers once the graph is stopped
+constexpr int kFailed = 1;           // NextBuffer's error, and the control state it leaves
 
-struct GraphStopper {
+// What a sink thread works with.
+struct SinkLinks {
+  const MmfMediaOutputOps* output;
+  MmfChannel* channel;
+  ChannelRun* run;
+  size_t index;  // among the sinks
+  uint32_t delay_us;
+  MmfMemoryPool* config_pool;
+  MmfMemoryPool* prefix_pool;
+  PlaybackControl* playback;  // null: none
+  bool controlled;            // actions or a script: checkpoints, and the clock follows the frames
   const MmfMediaControlOps* control;
   MmfFilterHandle* handle;
-  void StopAfter(int result) const {
-    if (result != kMmfEndOfStream && result != kControlStopped && result != kMmfBufferDelivered) {
-      (void)control->Stop(handle);
-    }
-  }
 };
 
-void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun* run, const RunnerOptions& options,
-                uint32_t delay_us, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool, PlaybackControl* playback,
-                GraphStopper stopper) {
-  Sink sink(run, options, config_pool, prefix_pool);
+void SinkThread(const SinkLinks links, const RunnerOptions& options) {
+  ChannelRun* run = links.run;
+  PlaybackControl* playback = links.playback;
+  Sink sink(run, options, links.config_pool, links.prefix_pool);
   auto restart = [&] {
     if (playback->Flushed()) sink.Restart();
-    run->seeks.push_back(static_cast<size_t>(run->frame_count));
+    if (playback->Marked()) {
+      run->seeks.push_back(static_cast<size_t>(run->frame_count));
+    } else {
+      sink.SkipBefore(run->frame_end);
+    }
   };
   int short_inputs = 0;
   for (;;) {
-    if (playback && playback->Checkpoint()) restart();
+    if (links.controlled && playback->Checkpoint()) restart();
     MmfMra* mra = nullptr;
-    int result = output->NextBuffer(channel, &mra);
+    const uint64_t taken = MrasAcquiredOnThisThread();
+    int result = links.output->NextBuffer(links.channel, &mra);
     run->end_result = result;
     if (result == 4 && ++short_inputs < kMaxShortInputRetries) continue;  // delivery goes on
     if (result != kMmfBufferDelivered || !mra) {
-      if (playback && playback->AfterEnd()) {
+      // A call that took no output buffer and failed only answered the state
+      // another channel's failure had left. A channel that fails stops the
+      // graph, as a player does when one of its decoders' inputs breaks: the
+      // others may wait for ring room that only its reads would free.
+      const bool stopped = result == kControlStopped || (result == kFailed && MrasAcquiredOnThisThread() == taken);
+      run->failed = !stopped && result != kMmfEndOfStream;
+      if (run->failed) (void)links.control->Stop(links.handle);
+      if (playback && playback->AfterEnd(links.index)) {
         restart();
         continue;
       }
-      stopper.StopAfter(result);
       break;
     }
     short_inputs = 0;
     ++run->buffers;
     const uint64_t frames_before = run->frame_count;
-    sink.Consume(mra);
+    MmfMra* shown = sink.Consume(mra);
     // Only a frame completed here moves the clock. A buffer cut short by a
     // control sequence's Stop may hold none, and the last frame before it may
     // be from before a seek: reported now, it would set the clock back.
-    if (playback && run->frame_count != frames_before && playback->Consumed(run->last_time_us)) restart();
-    if (options.on_buffer) options.on_buffer(options.user, run->index, mra);
+    if (links.controlled && run->frame_count != frames_before && playback->Consumed(run->last_time_us)) restart();
+    if (options.on_buffer) options.on_buffer(options.user, run->index, shown);
+    if (shown != mra) (void)MmfReleaseMra(shown);
     (void)MmfReleaseMra(mra);
-    if (delay_us) std::this_thread::sleep_for(std::chrono::microseconds(delay_us));
+    if (links.delay_us) std::this_thread::sleep_for(std::chrono::microseconds(links.delay_us));
   }
   sink.Finish();
 }
@@ -426,14 +530,19 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
     streamer.ConnectListMaker(list_maker, handle->InputChannel);
   }
   const int64_t first_cluster = rating_stream->Tell();
+  out.first_cluster = first_cluster > 0 ? static_cast<uint64_t>(first_cluster) : 0;
 
+  // A framework connects only the channels that offer a format.
   std::vector<int32_t> wanted = options.channels;
   if (wanted.empty()) {
-    for (size_t k = 0; k < graph.outputs().size(); ++k) wanted.push_back(static_cast<int32_t>(k));
+    for (size_t k = 0; k < graph.outputs().size(); ++k) {
+      if (graph.outputs()[k].formats_offered > 0) wanted.push_back(static_cast<int32_t>(k));
+    }
   }
   std::vector<MmfChannel*> acquired;
   for (int32_t k : wanted) {
-    if (k < 0 || static_cast<size_t>(k) >= graph.outputs().size()) {
+    if (k < 0 || static_cast<size_t>(k) >= graph.outputs().size() ||
+        graph.outputs()[static_cast<size_t>(k)].formats_offered == 0) {
       out.error = "no output channel " + std::to_string(k);
       break;
     }
@@ -462,15 +571,17 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
     (void)control->Start(handle);
     if (!own_upstream) (void)streamer.Seek(static_cast<uint64_t>(first_cluster), 0);
     std::unique_ptr<PlaybackControl> playback;
-    if (!own_upstream && (!options.actions.empty() || options.script)) {
+    const bool controlled = !options.actions.empty() || options.script;
+    if (!own_upstream && (controlled || options.catch_up)) {
       playback = std::make_unique<PlaybackControl>(ControlTablesOf(plugin), handle, &streamer, &clock, acquired.size());
     }
     std::vector<std::thread> sinks;
     for (size_t i = 0; i < acquired.size(); ++i) {
-      uint32_t delay = i < options.sink_delay_us.size() ? options.sink_delay_us[i] : 0;
+      const uint32_t delay = i < options.sink_delay_us.size() ? options.sink_delay_us[i] : 0;
+      const SinkLinks links{output,         acquired[i],  &out.channels[i],         i,       delay,  config_pool.handle(),
+                            prefix_pool.handle(), playback.get(), playback && controlled, control, handle};
       // By pointer: a Thumb function's address is odd, and a reference bound to it reads as misaligned.
-      sinks.emplace_back(&SinkThread, output, acquired[i], &out.channels[i], std::cref(options), delay,
-                         config_pool.handle(), prefix_pool.handle(), playback.get(), GraphStopper{control, handle});
+      sinks.emplace_back(&SinkThread, links, std::cref(options));
       if (placement.channels_cpu >= 0) {
         KeepOnCpu(sinks.back(), placement.channels_cpu);
         WaitForTurnOnCore(sinks.back());
@@ -483,6 +594,10 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
           options.script(*playback);
         } else {
           out.control_results = playback->Run(options.actions);
+        }
+        if (options.catch_up) {
+          const RecoveryLinks links{output, plugin.converter(), handle, config_pool.handle(), playback.get()};
+          RecoverFromDamage(links, acquired, &out.channels, options.recoveries);
         }
         playback->Finish();
       });
