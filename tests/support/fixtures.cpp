@@ -107,6 +107,7 @@ bool ParseExpectedLine(std::string_view line, FixtureExpectation* fx) {
   else if (key == "timecode_scale") return ParseNumber(rest, &fx->timecode_scale);
   else if (key == "file_size") return ParseNumber(rest, &fx->file_size);
   else if (key == "cue_points") return ParseNumber(rest, &fx->cue_point_count);
+  else if (key == "damaged_at") return ParseNumber(rest, &fx->damaged_at);
   else if (key == "duration_ns") return fx->has_duration = ParseNumber(rest, &fx->duration_ns);
   else if (key == "tag") {
     size_t name_end = rest.find(' ');
