@@ -21,6 +21,7 @@
 #include "platform/media_format.h"
 #include "tools/command_line.h"
 #include "tools/commands.h"
+#include "tools/damage_report.h"
 #include "tools/extract/channel_extractor.h"
 #include "tools/extract/track_facts.h"
 #include "tools/extract/writer_choice.h"
@@ -48,6 +49,11 @@ const std::string kExtractHelp =
     "When standard error is a terminal a progress bar shows the bytes and frames\n"
     "written, the rate and the time left. Standard output gets one line per file.\n"
     "\n"
+    "On damaged input every frame delivered is written all the same, and playback goes on\n"
+    "past the damage from the next cue point, as 'kelvane packets' does; standard error\n"
+    "says where frames are missing. A track the plug-in sets up no channel for (an\n"
+    "encrypted one) is named on standard error and left out.\n"
+    "\n"
     "options:\n"
     "  -t, --track TRACK  extract this track (repeatable, or TRACK,TRACK...);\n"
     "                     default: every track the plug-in offers\n"
@@ -55,11 +61,13 @@ const std::string kExtractHelp =
     "  -q, --quiet        no progress bar\n"
     "  --buffer-size BYTES  bytes per input buffer (default 65536); small ones split\n"
     "                     frames across buffers, which must not change the files\n"
+    "  --no-recover       stop where the channels fail, rather than going on past the damage\n"
     "  --plugin PATH      the plug-in to load (default: kelvane.so beside this program)\n"
     "  -h, --help         this text\n"
     "\n"
-    "exit codes: 0 every file written; 1 the file cannot be read, the plug-in refused it,\n"
-    "or a file could not be written; 2 usage, or a track the file does not offer\n"
+    "exit codes: 0 every file written; 1 the file cannot be read, the plug-in refused it, it\n"
+    "is damaged (what was delivered is written), or a file could not be written; 2 usage,\n"
+    "or a track the file does not offer\n"
     "\n"
     "examples:\n"
     "  kelvane extract movie.mkv -o tracks\n"
@@ -71,8 +79,11 @@ struct Options {
   std::vector<uint64_t> tracks;
   std::string plugin = host::PluginBesideExecutable();
   bool quiet = false;
+  bool recover = true;
   uint32_t buffer_size = host::RunnerOptions{}.input_buffer_size;
 };
+
+constexpr int kRecoveries = 4;  // times a file may be played on past damage, as packets does
 
 bool ParseTracks(const char* text, std::vector<uint64_t>* tracks) {
   std::string list(text);
@@ -118,6 +129,8 @@ int ParseOptions(int argc, char** argv, Options* options) {
       options->buffer_size = static_cast<uint32_t>(size);
     } else if (!std::strcmp(arg, "-q") || !std::strcmp(arg, "--quiet")) {
       options->quiet = true;
+    } else if (!std::strcmp(arg, "--no-recover")) {
+      options->recover = false;
     } else if (int code = TakeFile(kCommand, arg, &options->file); code != kExitOk) {
       return code;
     }
@@ -141,6 +154,11 @@ int DescribeChannels(const host::Plugin& plugin, const char* path, std::vector<C
   size_t next_track = 0;
   for (size_t k = 0; k < graph.outputs().size(); ++k) {
     const MmfMediaFormat& format = graph.outputs()[k].offered;
+    if (graph.outputs()[k].formats_offered == 0) {
+      std::fprintf(stderr, "kelvane %s: %s: channel %zu is not set up, its track is left out: %s\n", kCommand, path, k,
+                   graph.outputs()[k].not_set_up.c_str());
+      continue;
+    }
     if (format.fourcc == 0) continue;  // a channel record the plug-in left unused
     if (next_track >= tracks.size()) return Failure(kCommand, "%s: more channels than tracks", path);
     const TrackFacts& track = tracks[next_track++];
@@ -246,6 +264,8 @@ int RunExtract(int argc, char** argv) {
   host::RunnerOptions run;
   run.checksum = false;
   run.read_ahead = true;
+  run.catch_up = true;
+  run.recoveries = options.recover ? kRecoveries : 0;
   run.input_buffer_size = options.buffer_size;
   for (const ChannelFacts& facts : channels) {
     auto extraction = std::make_unique<Extraction>();
@@ -277,6 +297,11 @@ int RunExtract(int argc, char** argv) {
                 facts.codec_id.c_str(), path.c_str(), extraction->chosen.index_path.empty() ? "" : " + ",
                 extraction->chosen.index_path.c_str(), extraction->extractor->frames(), extraction->file.size());
   }
-  if (!result.ok) return Failure(kCommand, "%s: %s", options.file, result.error.c_str());
-  return code;
+  if (result.channels.empty()) return Failure(kCommand, "%s: %s", options.file, result.error.c_str());
+  std::vector<uint64_t> tracks;
+  for (const ChannelFacts& facts : channels) {
+    if (tracks.size() <= size_t(facts.channel)) tracks.resize(size_t(facts.channel) + 1);
+    tracks[size_t(facts.channel)] = facts.track;
+  }
+  return ReportDamage(kCommand, options.file, result, tracks) ? kExitFailed : code;
 }

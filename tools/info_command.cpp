@@ -69,9 +69,10 @@ const char* TrackTypeName(uint64_t type) {
   }
 }
 
-// The plug-in's four-character code for the track's codec, empty when it offers none.
+// The plug-in's four-character code for the track's codec, empty when it
+// offers none: for a codec it does not know, or an encrypted track.
 std::string OfferedFourcc(const mkv_track_info& track) {
-  uint32_t fourcc = lookup_codec_fourcc(track.codec_id);
+  uint32_t fourcc = track.encrypted ? 0 : lookup_codec_fourcc(track.codec_id);
   if (!fourcc) return {};
   std::string code;
   for (int shift = 24; shift >= 0; shift -= 8) code += static_cast<char>(fourcc >> shift);

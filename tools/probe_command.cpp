@@ -27,6 +27,8 @@ const char kProbeHelp[] =
     "each output channel (one per track with a codec it supports) with its format: the\n"
     "four-character code, the picture size and frame rate or the channels and sample rate,\n"
     "the size of the codec's extra data, and the answers of acquiring and configuring it.\n"
+    "A channel counted for a track that the plug-in then left out (an encrypted one) offers\n"
+    "no format: it is shown as not set up, with the reason the plug-in logged.\n"
     "The decoder-configuration packets are delivered at playback: see 'kelvane packets'.\n"
     "\n"
     "FILE may be - for standard input, an input that cannot seek.\n"
@@ -98,6 +100,10 @@ void PrintChannelText(const host::OutputChannelSetup& setup, size_t index) {
   const MmfMediaFormat& format = channel.Format;
   std::printf("  channel %zu:\n", index);
   std::printf("    name: %s\n", channel.Name ? channel.Name : "");
+  if (setup.formats_offered == 0) {
+    std::printf("    set_up: no\n    reason: %s\n", setup.not_set_up.c_str());
+    return;
+  }
   std::printf("    fourcc: %s\n", FourCc(format.fourcc).c_str());
   std::printf("    stream_type: 0x%08" PRIX32 "\n", format.stream_type);
   if (IsVideo(format)) {
@@ -137,6 +143,12 @@ void WriteChannelJson(JsonWriter& out, const host::OutputChannelSetup& setup, si
   out.BeginObject();
   out.Field("index", index);
   out.Field("name", channel.Name ? channel.Name : "");
+  out.Field("set_up", setup.formats_offered > 0);
+  if (setup.formats_offered == 0) {
+    out.Field("reason", setup.not_set_up);
+    out.EndObject();
+    return;
+  }
   out.Field("fourcc", FourCc(format.fourcc));
   out.Field("stream_type", format.stream_type);
   out.Field("media", IsVideo(format) ? "video" : "audio");

@@ -63,6 +63,7 @@ table=$(cat <<'EOF'
 2|err|kelvane packets: FILE cannot be standard input|packets -
 1|err|kelvane packets: cannot open $missing: No such file or directory|packets $missing
 1|err|kelvane packets: $not_mkv: the plug-in refused it: rating 0|packets $not_mkv
+1|out|"error": "the plug-in refused the file"|packets --json $not_mkv
 0|out|0 1 0 2300 66fcf3ed|packets $mkv
 0|out|usage: kelvane metadata [--json] [--plugin PATH] FILE|metadata --help
 0|out|NUM4|metadata -h
@@ -136,7 +137,8 @@ if command -v python3 >/dev/null; then
       "${kelvane[@]}" "$command" --json "${extra[@]}" "$file" >"$json" 2>/dev/null
       status=$?
       [[ $file == "$odd" && $status != 0 ]] && fail "$command --json on the oddly named file: exit code $status"
-      if [[ $status == 0 || ($command == probe && $status == 1) ]]; then
+      # A refused or damaged file still gets its document from probe and packets.
+      if [[ $status == 0 || ($command == probe || $command == packets) && $status == 1 ]]; then
         documents+=("$command" "$file" "$json")
       fi
     done
