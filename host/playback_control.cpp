@@ -109,6 +109,10 @@ int PlaybackControl::ScanEnd() {
   });
 }
 
+int PlaybackControl::ScanWhilePlaying(bool forward, uint32_t speed) {
+  return forward ? tables_.trick->ScanForward(handle_, speed) : tables_.trick->ScanBackward(handle_, speed);
+}
+
 int PlaybackControl::Pause() { return tables_.control->Pause(handle_); }
 
 int PlaybackControl::Resume() { return tables_.control->Resume(handle_); }

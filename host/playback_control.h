@@ -55,6 +55,9 @@ class PlaybackControl {
   int Pause();
   int Resume();
   int Stop();
+  // A scan started while the channels play, as a framework's other thread may
+  // start one: no Stop and no flush; the filter switches the streamer itself.
+  int ScanWhilePlaying(bool forward, uint32_t speed);
   // Runs the actions in order, each when its time has come; their answers in order.
   std::vector<int> Run(const std::vector<ControlAction>& actions);
   // No sequence follows: sinks that have ended may finish.
