@@ -21,8 +21,7 @@ std::atomic_ref<int32_t> AcquiredCount(MkvContext* context) {
 
 }  // namespace
 
-bool RefusedWithoutTrack(const MkvChannel* channel, const char* operation) {
-  if (!channel || channel->Direction != kMmfDirectionOutput || !channel->State || channel->State->Track) return false;
+bool LogWithoutTrack(const MkvChannel* channel, const char* operation) {
   const MkvFilter* filter = channel->Filter;
   const MkvChannel* first = filter ? filter->OutputChannels : nullptr;
   const int32_t count = filter && filter->Context ? filter->Context->OutputChannelCount : 0;

@@ -12,7 +12,11 @@
 // encrypted one) has no track and cannot play: every operation on it answers
 // 4044, "not available", logged, and touches nothing. True, after logging,
 // when `channel` (which may be null) is such a record.
-[[nodiscard]] bool RefusedWithoutTrack(const MkvChannel* channel, const char* operation);
+bool LogWithoutTrack(const MkvChannel* channel, const char* operation);
+[[nodiscard]] inline bool RefusedWithoutTrack(const MkvChannel* channel, const char* operation) {
+  if (!channel || channel->Direction != kMmfDirectionOutput || !channel->State || channel->State->Track) return false;
+  return LogWithoutTrack(channel, operation);
+}
 
 // The channel at *iterator, advancing it; null for a null argument or past the end.
 MkvChannel* IterateOutputChannels(MkvFilter* filter, int32_t* iterator);
