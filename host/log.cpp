@@ -10,7 +10,7 @@ namespace {
 std::mutex log_mutex;
 int log_threshold = kAoLogDegraded;
 host::LogCapture log_capture;
-thread_local host::ThreadLog* thread_log = nullptr;
+[[gnu::tls_model("initial-exec")]] thread_local host::ThreadLog* thread_log = nullptr;
 
 }  // namespace
 
