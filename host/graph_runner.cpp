@@ -64,7 +64,8 @@ class Adler32 {
 // own.
 class Sink {
  public:
-  Sink(ChannelRun* run, const RunnerOptions& options, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool)
+  Sink(ChannelRun* run, const RunnerOptions& options, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool,
+       bool pass_each_buffer)
       : run_(run),
         config_pool_(config_pool),
         prefix_pool_(prefix_pool),
@@ -73,7 +74,8 @@ class Sink {
         user_(options.user),
         index_(run->index),
         checksum_(options.checksum),
-        keep_frames_(options.keep_frames) {
+        keep_frames_(options.keep_frames),
+        pass_each_buffer_(pass_each_buffer) {
     NextRoom();
   }
   Sink(const Sink&) = delete;  // it points into itself
@@ -102,15 +104,31 @@ class Sink {
       ++element;
     }
     NoteFrameEnd();
-    PassFrames();
+    if (pass_each_buffer_) PassFrames();
     return dropped_.empty() ? mra : WithoutDropped(mra);
+  }
+
+  // The frames gathered so far go to the consumer, and the counts are up to
+  // date: each buffer's when a controller follows them, else when the batch
+  // is full and whenever the sink stops.
+  void PassFrames() {
+    if (batch_end_ == batch_begin_) return;
+    const size_t count = static_cast<size_t>(batch_end_ - batch_begin_);
+    run_->frame_count += count;
+    run_->last_time_us = batch_end_[-1].time_us;
+    if (keep_frames_) run_->frames.insert(run_->frames.end(), batch_begin_, batch_end_);
+    if (on_frames_) on_frames_(user_, index_, batch_begin_, count);
+    NextRoom();
   }
 
   ~Sink() {
     if (copies_) (void)MmfFreeMraPool(copies_);
   }
 
-  void Finish() { run_->incomplete_frame = in_parts_; }
+  void Finish() {
+    PassFrames();
+    run_->incomplete_frame = in_parts_;
+  }
 
   // After a seek or a scan took effect: a frame being put together is lost to the flush.
   void Restart() {
@@ -303,22 +321,10 @@ class Sink {
     run->config.push_back(RunFrame{0, element.size, checksum ? Checksum(element) : 0, false});
   }
 
-  // Frames are gathered and counted a batch at a time (at least once per
-  // output buffer): the count and the last time are up to date whenever the
-  // sink is between two output buffers.
+  // Frames are gathered and counted a batch at a time.
   void Deliver(const RunFrame& frame) {
     *batch_end_++ = frame;
     if (batch_end_ == batch_limit_) PassFrames();
-  }
-
-  void PassFrames() {
-    if (batch_end_ == batch_begin_) return;
-    const size_t count = static_cast<size_t>(batch_end_ - batch_begin_);
-    run_->frame_count += count;
-    run_->last_time_us = batch_end_[-1].time_us;
-    if (keep_frames_) run_->frames.insert(run_->frames.end(), batch_begin_, batch_end_);
-    if (on_frames_) on_frames_(user_, index_, batch_begin_, count);
-    NextRoom();
   }
 
   // The consumer's room for the next frames, else the sink's own batch.
@@ -342,6 +348,7 @@ class Sink {
   int32_t index_;
   bool checksum_;
   bool keep_frames_;
+  bool pass_each_buffer_;
   uint64_t time_ = 0;
   uint32_t config_left_ = 0;
   bool in_parts_ = false;   // a frame announced by property 7 is being put together
@@ -387,7 +394,7 @@ struct SinkLinks {
 void SinkThread(const SinkLinks links, const RunnerOptions& options) {
   ChannelRun* run = links.run;
   PlaybackControl* playback = links.playback;
-  Sink sink(run, options, links.config_pool, links.prefix_pool);
+  Sink sink(run, options, links.config_pool, links.prefix_pool, links.controlled);
   auto restart = [&] {
     if (playback->Flushed()) sink.Restart();
     if (playback->Marked()) {
@@ -412,6 +419,7 @@ void SinkThread(const SinkLinks links, const RunnerOptions& options) {
       const bool stopped = result == kControlStopped || (result == kFailed && MrasAcquiredOnThisThread() == taken);
       run->failed = !stopped && result != kMmfEndOfStream;
       if (run->failed) (void)links.control->Stop(links.handle);
+      sink.PassFrames();  // the recovery reads the counts while the sink waits
       if (playback && playback->AfterEnd(links.index)) {
         restart();
         continue;

@@ -43,10 +43,12 @@ struct RunnerOptions {
   void (*on_buffer)(void* user, int32_t channel, MmfMra* buffer) = nullptr;
   void* user = nullptr;
   // Called on a sink's thread with the whole frames (not decoder-configuration
-  // packets) completed in each output buffer it consumed, in order, at most
-  // kFrameBatch (or frame_room's room) at a time and before on_buffer. With
-  // keep_frames off, ChannelRun::frames stays empty, so a long file costs no
-  // memory per frame.
+  // packets) completed in the output buffers it consumed, in order, at most
+  // kFrameBatch (or frame_room's room) at a time: when that room is full,
+  // when NextBuffer answers anything but a delivery, and, under playback
+  // control, after each output buffer (before on_buffer). With keep_frames
+  // off, ChannelRun::frames stays empty, so a long file costs no memory per
+  // frame.
   void (*on_frames)(void* user, int32_t channel, const RunFrame* frames, size_t count) = nullptr;
   // Where a sink gathers the frames it passes to on_frames next, and in
   // *room how many fit there: the consumer's own storage, so that it need not
