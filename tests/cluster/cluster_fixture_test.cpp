@@ -50,10 +50,11 @@ std::vector<std::string> Driven(const std::vector<uint8_t>& file, const DriveOpt
 
 class ClusterFixtureTest : public testing::TestWithParam<std::string> {};
 
-// A damaged fixture is read up to its damage as mkvinfo lists it, and ends
-// with the parser's answer there: a cut file inside the block it cuts short
-// (waiting for more data), zeroed bytes with an error. mkvinfo's next block
-// after those opens the Cluster of a cue point.
+// A damaged fixture is read as mkvinfo lists it, whole when the damage reads
+// as elements to pass over (a block size that claims too much), else up to
+// the damage, ending with the parser's answer there: a cut file inside the
+// block it cuts short (waiting for more data), zeroed bytes with an error.
+// mkvinfo's next block after those opens the Cluster of a cue point.
 TEST_P(ClusterFixtureTest, EveryBufferSizeGivesTheMkvinfoBlockList) {
   const testing_support::FixtureExpectation fx = testing_support::LoadFixture(GetParam());
   auto file = testing_support::ReadFixtureBytes(GetParam());
@@ -67,7 +68,7 @@ TEST_P(ClusterFixtureTest, EveryBufferSizeGivesTheMkvinfoBlockList) {
       options.buffer_sizes = {size};
       options.read_group_tail = group_tail;
       std::vector<std::string> driven = Driven(file, options), listed = Listed(fx.blocks, group_tail);
-      if (fx.damaged_at) {
+      if (fx.damaged_at && driven.back() != "complete") {
         ASSERT_EQ(driven.back(), cut ? "ended inside an element" : "failed with -2");
         driven.erase(driven.end() - (cut ? 2 : 1), driven.end());
         const size_t read = driven.size();
