@@ -95,7 +95,7 @@ void RecoverFromDamage(const RecoveryLinks& links, const std::vector<MmfChannel*
   };
   uint64_t gone_past = 0;  // the furthest damage recovered from
   for (;;) {
-    links.playback->WaitIdle();
+    if (!links.playback->WaitIdle()) return;
     std::vector<bool> ended(runs->size());
     uint64_t lacking = UINT64_MAX, hint = UINT64_MAX, furthest = gone_past;
     bool failed = false, lagging = false;

@@ -16,7 +16,6 @@
 #include "host/thread_placement.h"
 #include "platform/media_buffer.h"
 #include "platform/mmf_status.h"
-#include "platform/mra_pool.h"
 
 namespace host {
 namespace {

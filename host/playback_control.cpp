@@ -65,9 +65,10 @@ int PlaybackControl::Seek(uint64_t time_us) {
   return Sequence([&] { return SeekWork(time_us); });
 }
 
-void PlaybackControl::WaitIdle() {
+bool PlaybackControl::WaitIdle() {
   std::unique_lock lock(mutex_);
-  changed_.wait(lock, [this] { return idle_ == sinks_; });
+  changed_.wait(lock, [this] { return idle_ == sinks_ || finished_; });
+  return !finished_;
 }
 
 int PlaybackControl::Reposition(uint64_t time_us, const std::vector<bool>& held, const std::function<void()>& prepare) {

@@ -64,10 +64,11 @@ class PlaybackControl {
   void Finish();
 
   // The runner's own sequences, once a channel has failed. WaitIdle blocks
-  // until every sink waits in AfterEnd. Reposition seeks as Seek does, after
+  // until every sink waits in AfterEnd (true) or Finish came (false; a script
+  // that stopped the graph). Reposition seeks as Seek does, after
   // `prepare` has run on the quiet graph; the sinks marked in `held` stay
   // parked, and the others do not count it as a seek (Marked).
-  void WaitIdle();
+  bool WaitIdle();
   int Reposition(uint64_t time_us, const std::vector<bool>& held, const std::function<void()>& prepare);
 
   // The sinks' side. Before each NextBuffer: parks while a sequence runs;
