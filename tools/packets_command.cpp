@@ -13,22 +13,15 @@
 #include <string>
 #include <vector>
 
-#include "core/codec_table.h"
-#include "core/file_model.h"
-#include "core/header/element_walker.h"
-#include "core/memory.h"
-#include "core/metadata_list.h"
-#include "core/status.h"
 #include "host/graph_runner.h"
-#include "host/input_streams.h"
 #include "host/plugin_loader.h"
 #include "host/thread_placement.h"
-#include "stream/mkvvstream.h"
 #include "tools/command_line.h"
 #include "tools/commands.h"
 #include "tools/control_options.h"
 #include "tools/frame_lines.h"
 #include "tools/json_writer.h"
+#include "tools/reading/header_reading.h"
 
 const char kPacketsHelp[] =
     "usage: kelvane packets [OPTIONS] FILE\n"
@@ -69,7 +62,6 @@ const char kPacketsHelp[] =
 
 namespace {
 
-constexpr int64_t kHeaderBufferSize = 480;
 constexpr int kSchemaVersion = 1;
 constexpr unsigned long kMaxBufferSize = 64ul << 20;
 
@@ -144,23 +136,11 @@ int ParseOptions(int argc, char** argv, Options* options) {
 // Track numbers of the offered tracks: the plug-in offers one channel per
 // track with a supported codec, in file order.
 std::vector<uint64_t> OfferedTracks(const char* path) {
+  std::vector<reading::TrackFacts> offered;
   std::vector<uint64_t> tracks;
-  auto input = host::OpenFileStream(path, true);
-  mkvvstream stream;
-  if (!input || mkvvstream_init(&stream, input->record(), kHeaderBufferSize, 1, kFillWithRead, 1) != 0) return tracks;
-  static mkv_file_info info;  // large: keep it off the stack
-  std::memset(&info, 0, sizeof info);
-  mkv_parse_limits limits{kDefaultMaxStringSize, 1};
-  info.parse_limits = &limits;
-  info.metadata = mem_new_zeroed<mkv_metadata_list>();
-  if (info.metadata && parse_mkvfile(&info, &stream) == kParseSucceeded) {
-    for (uint32_t i = 0; i < info.track_count && i < kMaxTracks; ++i) {
-      if (lookup_codec_fourcc(info.tracks[i].codec_id) != 0) tracks.push_back(info.tracks[i].track_number);
-    }
+  if (reading::ReadOfferedTracks(path, &offered)) {
+    for (const reading::TrackFacts& track : offered) tracks.push_back(track.number);
   }
-  if (info.metadata) FreeMetadata(info.metadata);
-  destroy_mkv_file_info(&info);
-  mkvvstream_destroy(&stream);
   return tracks;
 }
 
