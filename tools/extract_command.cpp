@@ -162,7 +162,8 @@ int DescribeChannels(const host::Plugin& plugin, const char* path, std::vector<C
   host::FilterGraph graph(plugin, *input, setup);
   if (!graph.rated()) return RefusedFile(kCommand, path, graph.rating());
   std::vector<reading::TrackFacts> tracks;
-  if (!reading::ReadOfferedTracks(path, &tracks)) return Failure(kCommand, "%s: cannot read its track entries", path);
+  uint64_t timecode_scale = 0;
+  if (!reading::ReadOfferedTracks(path, &tracks, &timecode_scale)) return Failure(kCommand, "%s: cannot read its track entries", path);
   size_t next_track = 0;
   for (size_t k = 0; k < graph.outputs().size(); ++k) {
     const MmfMediaFormat& format = graph.outputs()[k].offered;
@@ -175,6 +176,7 @@ int DescribeChannels(const host::Plugin& plugin, const char* path, std::vector<C
     facts.codec_id = track.codec_id;
     facts.fourcc = format.fourcc;
     facts.default_duration_ns = track.default_duration_ns;
+    facts.timecode_scale_ns = timecode_scale;
     for (const reading::ContentEncodingFacts& encoding : track.content_encodings) {
       if (!encoding.compression || encoding.comp_algo != reading::kCompressionZlib) continue;
       facts.zlib_frames = facts.zlib_frames || (encoding.scope & 1);
@@ -277,7 +279,8 @@ int RunExtract(int argc, char** argv) {
     if (options.timestamps) {
       extraction->chosen.writer = std::make_unique<TimestampRecorder>(
           &extraction->file, std::move(extraction->chosen.writer),
-          std::string(options.directory) + "/track" + std::to_string(facts.track) + ".timestamps.txt");
+          std::string(options.directory) + "/track" + std::to_string(facts.track) + ".timestamps.txt",
+          facts.default_duration_ns, facts.timecode_scale_ns);
     }
     if (!extraction->file.Open(extraction->chosen.path)) {
       return Failure(kCommand, "%s", extraction->file.error().c_str());

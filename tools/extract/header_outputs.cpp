@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
@@ -41,11 +42,6 @@ bool CopyRange(int from, uint64_t offset, uint64_t size, int to) {
     size -= static_cast<uint64_t>(got);
   }
   return true;
-}
-
-void Collect(const reading::ChapterFacts& chapter, std::vector<const reading::ChapterFacts*>* list) {
-  list->push_back(&chapter);
-  for (const reading::ChapterFacts& child : chapter.children) Collect(child, list);
 }
 
 }  // namespace
@@ -104,17 +100,14 @@ bool WriteAttachments(const char* command, const std::string& path, const readin
 }
 
 bool WriteSimpleChapters(const char* command, const reading::FileFacts& facts, const std::string& file) {
-  const reading::EditionFacts* edition = facts.editions.empty() ? nullptr : &facts.editions[0];
-  for (const reading::EditionFacts& candidate : facts.editions) {
-    if (candidate.is_default) {
-      edition = &candidate;
-      break;
-    }
-  }
+  // The format has no editions and no nesting: the top-level chapters of
+  // every edition, by start time, each with its first name.
   std::vector<const reading::ChapterFacts*> chapters;
-  if (edition) {
-    for (const reading::ChapterFacts& chapter : edition->chapters) Collect(chapter, &chapters);
+  for (const reading::EditionFacts& edition : facts.editions) {
+    for (const reading::ChapterFacts& chapter : edition.chapters) chapters.push_back(&chapter);
   }
+  std::stable_sort(chapters.begin(), chapters.end(),
+                   [](const auto* a, const auto* b) { return a->start_ns < b->start_ns; });
   FILE* out = std::fopen(file.c_str(), "w");
   if (!out) {
     Failure(command, "cannot write %s: %s", file.c_str(), std::strerror(errno));

@@ -13,8 +13,8 @@
 bool WriteAttachments(const char* command, const std::string& path, const reading::FileFacts& facts,
                       const std::string& directory);
 
-// Writes the chapters of the first edition (or of the default one), in file order
-// and with nested chapters after their parent, to `file`; false after reporting why.
+// Writes the top-level chapters of every edition, by start time, to `file`;
+// false after reporting why.
 bool WriteSimpleChapters(const char* command, const reading::FileFacts& facts, const std::string& file);
 
 // Reads the headers of `path` and writes its attachments to `attachments`

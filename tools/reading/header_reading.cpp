@@ -211,8 +211,9 @@ HeaderReading ReadHeaders(const std::string& path, const ReadOptions& options) {
   return out;
 }
 
-bool ReadOfferedTracks(const std::string& path, std::vector<TrackFacts>* tracks) {
+bool ReadOfferedTracks(const std::string& path, std::vector<TrackFacts>* tracks, uint64_t* timecode_scale) {
   HeaderReading reading = ReadHeaders(path, {true, false});
+  if (timecode_scale) *timecode_scale = reading.facts.info.timecode_scale;
   for (TrackFacts& track : reading.facts.tracks) {
     if (track.offered_fourcc) tracks->push_back(std::move(track));
   }

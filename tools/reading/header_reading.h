@@ -28,8 +28,8 @@ struct ReadOptions {
 HeaderReading ReadHeaders(const std::string& path, const ReadOptions& options);
 
 // The tracks the plug-in offers a channel for, in file order (the channels'
-// order); false when the headers cannot be parsed.
-bool ReadOfferedTracks(const std::string& path, std::vector<TrackFacts>* tracks);
+// order), and the file's TimecodeScale; false when the headers cannot be parsed.
+bool ReadOfferedTracks(const std::string& path, std::vector<TrackFacts>* tracks, uint64_t* timecode_scale = nullptr);
 
 // Why the plug-in would refuse a file, in the same words for every command:
 // "not a Matroska file", "DocType webm is not played...", "no track this
