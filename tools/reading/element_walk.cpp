@@ -31,7 +31,8 @@ class Walker {
 
   WalkEnd Run() {
     uint64_t next = 0;
-    if (Walk(0, length_, 0, nullptr, &next) && next < length_ && end_.complete) {
+    // The top level has no parent: an element that runs past the end of the file is cut short.
+    if (Walk(0, UINT64_MAX, 0, nullptr, &next) && next < length_ && end_.complete) {
       Stop(next, "no element");
     }
     return end_;
@@ -74,6 +75,7 @@ class Walker {
       }
     }
     *next = position < end ? position : end;
+    if (*next > length_) *next = length_;
     return true;
   }
 
