@@ -74,14 +74,16 @@ int CheckInputFile(const char* command, const char* path) {
 bool LogRequested() { return std::getenv("KELVANE_LOG") != nullptr; }
 
 int RefusedFile(const char* command, const char* path, int rating) {
+  return RefusedFile(command, path, "the plug-in rated it " + std::to_string(rating) + "; a file it plays rates " +
+                                        std::to_string(kAcceptedRating));
+}
+
+int RefusedFile(const char* command, const char* path, const std::string& plugin_answer) {
   struct stat status;
   const bool regular = std::strcmp(path, "-") && stat(path, &status) == 0 && S_ISREG(status.st_mode);
   std::string reason = regular ? reading::RefusalReason(path) : std::string();
   if (reason.empty()) reason = "not a Matroska file the plug-in plays";
-  if (LogRequested()) {
-    return Failure(command, "%s: %s (the plug-in rated it %d; a file it plays rates %d)", path, reason.c_str(),
-                   rating, kAcceptedRating);
-  }
+  if (LogRequested()) return Failure(command, "%s: %s (%s)", path, reason.c_str(), plugin_answer.c_str());
   return Failure(command, "%s: %s", path, reason.c_str());
 }
 

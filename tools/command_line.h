@@ -47,6 +47,8 @@ constexpr int kAcceptedRating = 80;
 // "FILE: not a Matroska file" and the like: why the plug-in refused it, in the
 // same words from every command (the rating too with KELVANE_LOG).
 int RefusedFile(const char* command, const char* path, int rating);
+// The same, with the plug-in's own answer (shown with KELVANE_LOG) in other words.
+int RefusedFile(const char* command, const char* path, const std::string& plugin_answer);
 
 // Takes `arg` as the command's one FILE ("-" for standard input), or reports
 // an unknown option or a second FILE; answers kExitOk or kExitUsage.

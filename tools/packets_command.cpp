@@ -19,6 +19,7 @@
 #include "tools/command_line.h"
 #include "tools/commands.h"
 #include "tools/control_options.h"
+#include "tools/playback_limits.h"
 #include "tools/frame_lines.h"
 #include "tools/json_writer.h"
 #include "tools/reading/header_reading.h"
@@ -49,6 +50,7 @@ const char kPacketsHelp[] =
     "  -h, --help          this text\n"
     "playback control:\n"
     "%s"
+    "%s"
     "\n"
     "exit codes: 0 every channel played to its end; 1 the plug-in refused the file, it cannot\n"
     "be read, or a channel ended with an error; 2 usage, including a channel the file does not\n"
@@ -58,7 +60,8 @@ const char kPacketsHelp[] =
     "  kelvane packets movie.mkv\n"
     "  kelvane packets --channels 1 --no-hash movie.mkv\n"
     "  kelvane packets --seek 10@2 --preroll movie.mkv       # seek to 10 s once playback reaches 2 s\n"
-    "  kelvane packets --ff 400@1 --trick-time 500 movie.mkv # fast forward from 1 s\n";
+    "  kelvane packets --ff 400@1 --trick-time 500 movie.mkv # fast forward from 1 s\n"
+    "  kelvane packets --seek 600 --frames 3 movie.mkv        # where a seek to 10 min lands\n";
 
 namespace {
 
@@ -67,6 +70,7 @@ constexpr unsigned long kMaxBufferSize = 64ul << 20;
 
 struct Options {
   host::RunnerOptions run;
+  LimitOptions limits;
   bool json = false;
   const char* file = nullptr;
   std::string plugin_path = host::PluginBesideExecutable();
@@ -93,11 +97,13 @@ int ParseOptions(int argc, char** argv, Options* options) {
   for (int i = 0; i < argc; ++i) {
     const char* arg = argv[i];
     if (IsHelpOption(arg)) {
-      std::printf(kPacketsHelp, kControlUsage);
+      std::printf(kPacketsHelp, kControlUsage, kLimitUsage);
       return kExitOk;
     }
     std::string error;
-    if (int taken = ParseControlOption(argc, argv, &i, &options->run, &error); taken != 0) {
+    int taken = ParseControlOption(argc, argv, &i, &options->run, &error);
+    if (taken == 0) taken = ParseLimitOption(argc, argv, &i, &options->limits, &error);
+    if (taken != 0) {
       if (taken < 0) return UsageError("packets", "%s", error.c_str());
       continue;
     }
@@ -273,7 +279,14 @@ int RunPackets(int argc, char** argv) {
     options.run.user = lines.get();
     options.run.keep_frames = false;
   }
+  std::vector<int32_t> playing = options.run.channels;
+  if (playing.empty()) {
+    for (size_t k = 0; k < tracks.size(); ++k) playing.push_back(static_cast<int32_t>(k));
+  }
+  PlaybackLimits limits(options.limits, playing);
+  limits.Apply(&options.run);
   host::RunResult result = host::RunGraph(*plugin, file, options.run);
+  limits.Settle(&result);
   if (!result.ok) {
     if (result.rating != kAcceptedRating) return RefusedFile("packets", file, result.rating);
     if (result.error.rfind("no output channel ", 0) == 0) {
@@ -281,11 +294,7 @@ int RunPackets(int argc, char** argv) {
     }
     return Failure("packets", "%s: %s", file, result.error.c_str());
   }
-  for (size_t k = 0; k < result.control_results.size(); ++k) {
-    if (result.control_results[k] != 0) {
-      std::fprintf(stderr, "kelvane packets: control action %zu answered %d\n", k + 1, result.control_results[k]);
-    }
-  }
+  ReportControlResults("packets", file, options.run.actions, result.control_results);
   options.json ? WriteJson(file, result, tracks, options.run.checksum)
                : PrintLines(result, tracks, options.run.checksum);  // with `lines`: only the configurations
   for (const host::ChannelRun& run : result.channels) {
