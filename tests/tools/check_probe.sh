@@ -36,7 +36,7 @@ for expected in "$fixtures"/*.expected; do
   expect "$name exit code" 0 "$status"
   want=""
   while read -r track; do
-    code=$(fourcc_of "$(key codec "$track")")
+    code=$(fourcc_of "$(key codec "$track")")$(key vfw_fourcc "$track")
     [[ -z $code ]] && continue
     if [[ $(key type "$track") == video ]]; then
       want+="$code $(key width "$track")x$(key height "$track");"
