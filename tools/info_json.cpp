@@ -9,7 +9,7 @@ using namespace reading;
 
 namespace {
 
-constexpr int kSchemaVersion = 1;
+constexpr int kSchemaVersion = 2;
 
 void Maybe(JsonWriter& out, const char* key, const std::optional<std::string>& value) {
   out.FieldOrNull(key, value ? value->c_str() : nullptr);

@@ -15,7 +15,7 @@ using namespace reading;
 
 namespace {
 
-constexpr int kSchemaVersion = 1;
+constexpr int kSchemaVersion = 2;
 
 std::string Hex(uint64_t value) {
   char text[24];

@@ -155,7 +155,7 @@ args, bad = sys.argv[1:], 0
 for command, name, path in zip(args[0::3], args[1::3], args[2::3]):
     try:
         doc = json.load(open(path, "rb"), parse_constant=refuse)
-        assert doc["schema_version"] == 1, "schema_version"
+        assert doc["schema_version"] == (2 if command == "info" else 1), "schema_version"
         assert doc["command"] == command, "command"
         want = name.encode("utf-8", "surrogateescape").decode("utf-8", "replace")
         assert doc["file"] == want, "file %r, expected %r" % (doc["file"], want)
