@@ -17,6 +17,7 @@
 #include "tools/command_line.h"
 #include "tools/commands.h"
 #include "tools/json_writer.h"
+#include "tools/probe_notes.h"
 
 const char kProbeHelp[] =
     "usage: kelvane probe [--json] [--plugin PATH] FILE\n"
@@ -250,5 +251,6 @@ int RunProbe(int argc, char** argv) {
     report.channels = graph.outputs();
   }
   json ? WriteJson(report) : PrintText(report);
+  if (!json && report.rated && !from_stream) PrintCompressionNotes(file);
   return report.rated ? kExitOk : RefusedFile("probe", file, report.rating);
 }

@@ -53,6 +53,7 @@ table=$(cat <<'EOF'
 1|out|rating: 0|probe $not_mkv
 1|err|kelvane probe: cannot load the plug-in $missing|probe --plugin $missing $mkv
 0|out|fourcc: AVC1|probe $mkv
+0|out|channel 1 (track 2) is stored with zlib compression|probe $fixtures/rich_headers.mkv
 0|out|usage: kelvane packets [OPTIONS] FILE|packets --help
 0|out|--channels K,K,...|packets -h
 0|out|--buffer-size BYTES|packets -h

@@ -35,6 +35,8 @@ late=$(awk 'NR == FNR { cues[++n] = $1; next }
 
 err=$("${kelvane[@]}" packets --seek 5@0.5 "$fixtures/no_cues.mkv" 2>&1 >/dev/null) || fail "no_cues: exit code $?"
 grep -q "the plug-in refused --seek 5@0.5" <<<"$err" || fail "no_cues: the refused seek is not reported"
+err=$("${kelvane[@]}" packets --seek 100@0.5 "$fixtures/long_cues.mkv" 2>&1 >/dev/null)
+[[ $err == *"--seek 100@0.5 is past the end"* ]] || fail "a seek past the end is not reported: $err"
 
 for bad in "--seek x" "--seek 1@y" "--ff -3" "--trick-time 0" "--scan-end"; do
   # shellcheck disable=SC2086
