@@ -36,7 +36,7 @@ class FactCollector : public ElementVisitor {
         facts_->info.date_utc_ns.reset();
         break;
       case ids::kTrackEntry: track_number_ = 0; language_ietf_.reset(); break;
-      case ids::kTag: facts_->tags.emplace_back(); simple_depth_ = -1; break;
+      case ids::kTag: facts_->tags.emplace_back(); break;
       case ids::kSimpleTag:
         if (!facts_->tags.empty()) {
           facts_->tags.back().simple_tags.emplace_back();
@@ -146,7 +146,6 @@ class FactCollector : public ElementVisitor {
   FileFacts* facts_;
   uint64_t track_number_ = 0;
   std::optional<std::string> language_ietf_;
-  int simple_depth_ = -1;
   std::vector<size_t> open_simple_;          // the SimpleTags being read, outermost first
   std::vector<ChapterFacts*> open_chapters_;  // the ChapterAtoms being read, outermost first
 };
