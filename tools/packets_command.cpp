@@ -19,9 +19,9 @@
 #include "tools/command_line.h"
 #include "tools/commands.h"
 #include "tools/control_options.h"
-#include "tools/playback_limits.h"
 #include "tools/frame_lines.h"
 #include "tools/json_writer.h"
+#include "tools/playback_limits.h"
 #include "tools/reading/header_reading.h"
 
 const char kPacketsHelp[] =
