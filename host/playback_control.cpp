@@ -131,6 +131,15 @@ bool PlaybackControl::Due(const ControlAction& action) {
   return backward_ ? now <= action.at_us : now >= action.at_us;
 }
 
+bool PlaybackControl::WaitUntil(const std::function<bool()>& reached) {
+  std::unique_lock lock(mutex_);
+  while (!reached()) {
+    if (idle_ == sinks_) return false;
+    changed_.wait_for(lock, kPoll);
+  }
+  return true;
+}
+
 std::vector<int> PlaybackControl::Run(const std::vector<ControlAction>& actions) {
   std::vector<int> results;
   for (const ControlAction& action : actions) {

@@ -60,6 +60,9 @@ class PlaybackControl {
   int ScanWhilePlaying(bool forward, uint32_t speed);
   // Runs the actions in order, each when its time has come; their answers in order.
   std::vector<int> Run(const std::vector<ControlAction>& actions);
+  // Waits until `reached` answers true (true) or every sink has ended (false).
+  // `reached` is asked every few milliseconds.
+  bool WaitUntil(const std::function<bool()>& reached);
   // No sequence follows: sinks that have ended may finish.
   void Finish();
 

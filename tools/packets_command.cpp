@@ -13,23 +13,17 @@
 #include <string>
 #include <vector>
 
-#include "core/codec_table.h"
-#include "core/file_model.h"
-#include "core/header/element_walker.h"
-#include "core/memory.h"
-#include "core/metadata_list.h"
-#include "core/status.h"
 #include "host/graph_runner.h"
-#include "host/input_streams.h"
 #include "host/plugin_loader.h"
 #include "host/thread_placement.h"
-#include "stream/mkvvstream.h"
 #include "tools/command_line.h"
 #include "tools/commands.h"
 #include "tools/control_options.h"
 #include "tools/damage_report.h"
 #include "tools/frame_lines.h"
 #include "tools/json_writer.h"
+#include "tools/playback_limits.h"
+#include "tools/reading/header_reading.h"
 
 const char kPacketsHelp[] =
     "usage: kelvane packets [OPTIONS] FILE\n"
@@ -66,6 +60,7 @@ const char kPacketsHelp[] =
     "  -h, --help          this text\n"
     "playback control:\n"
     "%s"
+    "%s"
     "\n"
     "exit codes: 0 every channel played to its end; 1 the plug-in refused the file, it cannot\n"
     "be read, or it is damaged (a channel failed or stopped, or the file ends inside a Cluster:\n"
@@ -76,17 +71,18 @@ const char kPacketsHelp[] =
     "  kelvane packets movie.mkv\n"
     "  kelvane packets --channels 1 --no-hash movie.mkv\n"
     "  kelvane packets --seek 10@2 --preroll movie.mkv       # seek to 10 s once playback reaches 2 s\n"
-    "  kelvane packets --ff 400@1 --trick-time 500 movie.mkv # fast forward from 1 s\n";
+    "  kelvane packets --ff 400@1 --trick-time 500 movie.mkv # fast forward from 1 s\n"
+    "  kelvane packets --seek 600 --frames 3 movie.mkv        # where a seek to 10 min lands\n";
 
 namespace {
 
-constexpr int64_t kHeaderBufferSize = 480;
 constexpr int kSchemaVersion = 1;
 constexpr int kRecoveries = 4;  // times a file may be played on past damage
 constexpr unsigned long kMaxBufferSize = 64ul << 20;
 
 struct Options {
   host::RunnerOptions run;
+  LimitOptions limits;
   bool json = false;
   const char* file = nullptr;
   std::string plugin_path = host::PluginBesideExecutable();
@@ -113,11 +109,13 @@ int ParseOptions(int argc, char** argv, Options* options) {
   for (int i = 0; i < argc; ++i) {
     const char* arg = argv[i];
     if (IsHelpOption(arg)) {
-      std::printf(kPacketsHelp, kControlUsage);
+      std::printf(kPacketsHelp, kControlUsage, kLimitUsage);
       return kExitOk;
     }
     std::string error;
-    if (int taken = ParseControlOption(argc, argv, &i, &options->run, &error); taken != 0) {
+    int taken = ParseControlOption(argc, argv, &i, &options->run, &error);
+    if (taken == 0) taken = ParseLimitOption(argc, argv, &i, &options->limits, &error);
+    if (taken != 0) {
       if (taken < 0) return UsageError("packets", "%s", error.c_str());
       continue;
     }
@@ -160,29 +158,17 @@ int ParseOptions(int argc, char** argv, Options* options) {
 // encrypted ones are said on standard error.
 std::vector<uint64_t> OfferedTracks(const char* path) {
   std::vector<uint64_t> tracks;
-  auto input = host::OpenFileStream(path, true);
-  mkvvstream stream;
-  if (!input || mkvvstream_init(&stream, input->record(), kHeaderBufferSize, 1, kFillWithRead, 1) != 0) return tracks;
-  static mkv_file_info info;  // large: keep it off the stack
-  std::memset(&info, 0, sizeof info);
-  mkv_parse_limits limits{kDefaultMaxStringSize, 1};
-  info.parse_limits = &limits;
-  info.metadata = mem_new_zeroed<mkv_metadata_list>();
-  if (info.metadata && parse_mkvfile(&info, &stream) == kParseSucceeded) {
-    for (uint32_t i = 0; i < info.track_count && i < kMaxTracks; ++i) {
-      const mkv_track_info& track = info.tracks[i];
-      if (lookup_codec_fourcc(track.codec_id) == 0) continue;
-      if (!track.encrypted) {
-        tracks.push_back(track.track_number);
-      } else {
+  reading::HeaderReading reading = reading::ReadHeaders(path, {true, false});
+  if (reading.ok) {
+    for (const reading::TrackFacts& track : reading.facts.tracks) {
+      if (track.offered_fourcc) {
+        tracks.push_back(track.number);
+      } else if (track.encrypted) {
         std::fprintf(stderr, "kelvane packets: %s: track %" PRIu64 " (%s) is left out: it is encrypted\n", path,
-                     track.track_number, track.codec_id);
+                     track.number, track.codec_id.c_str());
       }
     }
   }
-  if (info.metadata) FreeMetadata(info.metadata);
-  destroy_mkv_file_info(&info);
-  mkvvstream_destroy(&stream);
   return tracks;
 }
 
@@ -356,7 +342,14 @@ int RunPackets(int argc, char** argv) {
     options.run.user = lines.get();
     options.run.keep_frames = false;
   }
+  std::vector<int32_t> playing = options.run.channels;
+  if (playing.empty()) {
+    for (size_t k = 0; k < tracks.size(); ++k) playing.push_back(static_cast<int32_t>(k));
+  }
+  PlaybackLimits limits(options.limits, playing);
+  limits.Apply(&options.run);
   result = host::RunGraph(*plugin, file, options.run);
+  limits.Settle(&result);
   if (result.rating != kAcceptedRating) {
     return failed(RefusedFile("packets", file, result.rating), "the plug-in refused the file");
   }
@@ -367,11 +360,7 @@ int RunPackets(int argc, char** argv) {
   if (result.channels.empty()) {
     return failed(Failure("packets", "%s: %s", file, result.error.c_str()), result.error.c_str());
   }
-  for (size_t k = 0; k < result.control_results.size(); ++k) {
-    if (result.control_results[k] != 0) {
-      std::fprintf(stderr, "kelvane packets: control action %zu answered %d\n", k + 1, result.control_results[k]);
-    }
-  }
+  ReportControlResults("packets", file, options.run.actions, result.control_results);
   options.json ? WriteJson(file, result, tracks, options.run.checksum)
                : PrintLines(result, tracks, options.run.checksum, !lines);
   for (const host::ChannelRun& run : result.channels) {

@@ -17,6 +17,7 @@
 #include "tools/command_line.h"
 #include "tools/commands.h"
 #include "tools/json_writer.h"
+#include "tools/probe_notes.h"
 
 const char kProbeHelp[] =
     "usage: kelvane probe [--json] [--plugin PATH] FILE\n"
@@ -31,7 +32,7 @@ const char kProbeHelp[] =
     "no format: it is shown as not set up, with the reason the plug-in logged.\n"
     "The decoder-configuration packets are delivered at playback: see 'kelvane packets'.\n"
     "\n"
-    "FILE may be - for standard input, an input that cannot seek.\n"
+    "FILE may be - for standard input, or a pipe or FIFO: an input that cannot seek.\n"
     "\n"
     "options:\n"
     "  --json           one JSON document instead of text (docs/json.md, section probe)\n"
@@ -225,11 +226,11 @@ int RunProbe(int argc, char** argv) {
     }
   }
   if (!file) return UsageError("probe", "no FILE given");
-  if (int code = CheckInputFile("probe", file); code != kExitOk) return code;
+  bool from_stream = false;  // standard input, a FIFO or a pipe: read once, never seeks
+  if (int code = CheckInput("probe", file, InputUse::kOnce, &from_stream); code != kExitOk) return code;
   std::unique_ptr<host::Plugin> plugin = LoadPlugin("probe", plugin_path);
   if (!plugin) return kExitFailed;
-  const bool from_stdin = !std::strcmp(file, "-");
-  auto stream = host::OpenFileStream(file, !from_stdin);
+  auto stream = host::OpenFileStream(file, !from_stream);
   if (!stream) return Failure("probe", "cannot open %s", file);
 
   // The input channel is connected to a file streamer over the same input,
@@ -262,5 +263,6 @@ int RunProbe(int argc, char** argv) {
     report.channels = graph.outputs();
   }
   json ? WriteJson(report) : PrintText(report);
+  if (!json && report.rated && !from_stream) PrintCompressionNotes(file);
   return report.rated ? kExitOk : RefusedFile("probe", file, report.rating);
 }

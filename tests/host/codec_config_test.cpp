@@ -233,7 +233,8 @@ TEST(DecoderConfigTest, FixtureTracksMatchFfprobe) {
       const mkv_track_info& track = parse.info().tracks[i];
       const testing_support::ExpectedTrack& want = expected.tracks[i];
       uint32_t fourcc = lookup_codec_fourcc(track.codec_id);
-      if ((fourcc != kAvc1 && fourcc != kMp4v) || !track.codec_private) continue;
+      // A Video for Windows track's CodecPrivate is a BITMAPINFOHEADER, which the framework's parser does not read.
+      if ((fourcc != kAvc1 && fourcc != kMp4v) || !track.codec_private || want.codec == "V_MS/VFW/FOURCC") continue;
       std::string label = name + " track " + std::to_string(want.number);
       MmDecoderConfigInfo info = {0, 0, 1, 1};
       ASSERT_EQ(MmParseDecoderConfig(track.codec_private, track.codec_private_size, fourcc, &info, 0), 0) << label;

@@ -36,7 +36,9 @@ late=$(awk 'NR == FNR { cues[++n] = $1; next }
 [[ -z "$late" ]] || fail "ff: frames later than TrickTime after their cue point: $late"
 
 err=$("${kelvane[@]}" packets --seek 5@0.5 "$fixtures/no_cues.mkv" 2>&1 >/dev/null) || fail "no_cues: exit code $?"
-grep -q "control action 1 answered 4002" <<<"$err" || fail "no_cues: the refused seek is not reported"
+grep -q "the plug-in refused --seek 5@0.5" <<<"$err" || fail "no_cues: the refused seek is not reported"
+err=$("${kelvane[@]}" packets --seek 100@0.5 "$fixtures/long_cues.mkv" 2>&1 >/dev/null)
+[[ $err == *"--seek 100@0.5 is past the end"* ]] || fail "a seek past the end is not reported: $err"
 
 # A seek and a scan beside a channel record without a track; damage without recovery.
 "${kelvane[@]}" packets --seek 0.5@0.2 --ff 200@0.6 "$fixtures/encrypted_aac.mkv" >/dev/null 2>&1 || fail "encrypted_aac: exit code $?"

@@ -37,7 +37,7 @@ for expected in "$fixtures"/*.expected; do
   # An encrypted track's channel comes after the others, not set up.
   want="" unset=""
   while read -r track; do
-    code=$(fourcc_of "$(key codec "$track")")
+    code=$(fourcc_of "$(key codec "$track")")$(key vfw_fourcc "$track")
     [[ -z $code ]] && continue
     if [[ -n $(key encryption "$track") ]]; then
       unset+="not set up;"
