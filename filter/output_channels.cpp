@@ -29,8 +29,9 @@ bool LogWithoutTrack(const MkvChannel* channel, const char* operation) {
   const int index = listed ? static_cast<int>(channel - first) : -1;
   const uint32_t track = channel->State->LeftOutTrack;
   if (listed && track != 0 && track <= kMaxTracks && filter->Context->FileInfo.tracks[track - 1].encrypted) {
-    AoLog(kAoLogFailure, "kelvane: %s channel %d has no track: track %d is encrypted.", operation, index,
-          static_cast<int>(track - 1));
+    // The track as the file numbers it (TrackNumber), as players and tools name it.
+    AoLog(kAoLogFailure, "kelvane: %s channel %d has no track: track %llu is encrypted.", operation, index,
+          static_cast<unsigned long long>(filter->Context->FileInfo.tracks[track - 1].track_number));
   } else {
     AoLog(kAoLogFailure, "kelvane: %s channel %d has no track.", operation, index);
   }

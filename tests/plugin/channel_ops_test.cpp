@@ -83,7 +83,7 @@ TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {
         const char* names[] = {"AcquireOutputChannel", "ReleaseOutputChannel", "SetOutputFormat",
                                "SetOutputChannelMemoryPool", "NextBuffer", "GetNextReadList"};
         EXPECT_TRUE(log.Contains(2, std::string("kelvane: ") + names[int(step.op)] +
-                                        " channel 1 has no track: track 1 is encrypted."))
+                                        " channel 1 has no track: track 2 is encrypted."))
             << "step " << i;
         EXPECT_EQ(mra == nullptr, step.op == Op::kNextBuffer) << "step " << i;
         EXPECT_EQ(c.context()->RingHead, 0) << "the ring is not touched";
