@@ -23,21 +23,29 @@ namespace {
 
 bool IsFilter(const MmfFilterHandle* handle) { return handle && handle->Kind == kMmfFilterKind; }
 
+// A channel record that ended its set-up without a track cannot play: 4044.
+constexpr int kNoTrack = kMmfNotAvailable;
+bool NoTrack(MmfChannel* channel, const char* operation) { return RefusedWithoutTrack(AsMkvChannel(channel), operation); }
+
 // MediaFilter
 MmfFilterHandle* OpCreate() { return AsFrameworkHandle(Create()); }
 int OpDestroy(MmfFilterHandle* handle) { return handle ? Destroy(AsMkvFilter(handle)) : kMmfInvalidArgument; }
 
 // MediaInput
 int OpRateInputFormat(MmfChannel* channel, MmfMediaFormat* format, uint32_t request, uint32_t* claim) {
+  if (NoTrack(channel, "RateInputFormat")) return kRatingRefused;
   return RateInputFormat(AsMkvChannel(channel), format, request, claim);
 }
 int OpSetInputFormat(MmfChannel* channel, const MmfMediaFormat* format) {
+  if (NoTrack(channel, "SetInputFormat")) return kNoTrack;
   return SetInputFormat(AsMkvChannel(channel), format);
 }
 int OpSetMediaOutput(MmfChannel* channel, const MmfMediaOutputOps* upstream) {
+  if (NoTrack(channel, "SetMediaOutput")) return kNoTrack;
   return SetMediaOutput(AsMkvChannel(channel), upstream);
 }
 int OpSetInputChannelMemoryPool(MmfChannel* channel, const MmfMemoryPoolOps* pool, MmfMemoryPool* param) {
+  if (NoTrack(channel, "SetInputChannelMemoryPool")) return kNoTrack;
   return SetInputChannelMemoryPool(AsMkvChannel(channel), pool, param);
 }
 
@@ -45,22 +53,36 @@ int OpSetInputChannelMemoryPool(MmfChannel* channel, const MmfMemoryPoolOps* poo
 MmfChannel* OpIterateOutputChannels(MmfFilterHandle* handle, int32_t* iterator) {
   return AsFrameworkChannel(handle ? IterateOutputChannels(AsMkvFilter(handle), iterator) : nullptr);
 }
-int OpAcquireOutputChannel(MmfChannel* channel) { return AcquireOutputChannel(AsMkvChannel(channel)); }
-int OpReleaseOutputChannel(MmfChannel* channel) { return ReleaseOutputChannel(AsMkvChannel(channel)); }
+int OpAcquireOutputChannel(MmfChannel* channel) {
+  if (NoTrack(channel, "AcquireOutputChannel")) return kNoTrack;
+  return AcquireOutputChannel(AsMkvChannel(channel));
+}
+int OpReleaseOutputChannel(MmfChannel* channel) {
+  if (NoTrack(channel, "ReleaseOutputChannel")) return kNoTrack;
+  return ReleaseOutputChannel(AsMkvChannel(channel));
+}
 int OpIterateOutputFormats(MmfChannel* channel, MmfMediaFormat* format, int32_t* iterator) {
+  if (NoTrack(channel, "IterateOutputFormats")) return kNoTrack;
   return IterateOutputFormats(AsMkvChannel(channel), format, iterator);
 }
 int OpVerifyOutputFormat(MmfChannel* channel, const MmfMediaFormat* a, const MmfMediaFormat* b) {
+  if (NoTrack(channel, "VerifyOutputFormat")) return 0;  // its only answer besides a match
   return VerifyOutputFormat(AsMkvChannel(channel), a, b);
 }
 int OpSetOutputFormat(MmfChannel* channel, const MmfMediaFormat* format) {
+  if (NoTrack(channel, "SetOutputFormat")) return kNoTrack;
   return SetOutputFormat(AsMkvChannel(channel), format);
 }
 int OpNextBuffer(MmfChannel* channel, MmfMra** buffer) {
   if (!channel || !buffer || !channel->Filter || !channel->State) return kMmfInvalidArgument;
+  if (NoTrack(channel, "NextBuffer")) {
+    *buffer = nullptr;
+    return kNoTrack;
+  }
   return NextBuffer(AsMkvChannel(channel), buffer);
 }
 int OpSetOutputChannelMemoryPool(MmfChannel* channel, const MmfMemoryPoolOps* pool, MmfMemoryPool* param) {
+  if (NoTrack(channel, "SetOutputChannelMemoryPool")) return kNoTrack;
   return SetOutputChannelMemoryPool(AsMkvChannel(channel), pool, param);
 }
 
@@ -126,6 +148,7 @@ int OpScanEnd(MmfFilterHandle* handle) { return IsFilter(handle) ? ScanEnd(AsMkv
 // MediaListMaker
 int OpGetNextReadList(MmfChannel* channel, MmfReadListEntry** entry, MmfReadListEntry* previous) {
   if (!channel || !entry || !channel->Filter) return kMmfInvalidArgument;
+  if (NoTrack(channel, "GetNextReadList")) return kNoTrack;
   return GetNextReadList(AsMkvChannel(channel), entry, previous);
 }
 

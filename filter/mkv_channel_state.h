@@ -56,4 +56,7 @@ struct MkvChannelState {
   // 1 when the output filled up in the middle of inbuff1: the next call goes on
   // parsing inbuff1 before it walks on to the element after ReadElement.
   uint8_t ParsePending;
+  // A record counted for a track that was then left out (an encrypted one)
+  // keeps no Track: the index of that track plus one; 0 when none is known.
+  uint32_t LeftOutTrack;
 };

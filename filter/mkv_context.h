@@ -95,3 +95,12 @@ inline uint32_t LoadControlState(const MkvContext* context) {
 inline void StoreControlState(MkvContext* context, uint32_t state) {
   __atomic_store_n(&context->ControlState, state, __ATOMIC_RELAXED);
 }
+
+// TrickMode is written under ReadListLock, but read before that lock is taken
+// (GetNextReadList notes the lookup direction first) and by a channel meeting
+// a time marker, which holds only RingLock: every access is an atomic word
+// access, as for ControlState.
+inline uint32_t LoadTrickMode(const MkvContext* context) { return __atomic_load_n(&context->TrickMode, __ATOMIC_RELAXED); }
+inline void StoreTrickMode(MkvContext* context, uint32_t mode) {
+  __atomic_store_n(&context->TrickMode, mode, __ATOMIC_RELAXED);
+}

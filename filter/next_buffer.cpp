@@ -30,12 +30,9 @@ struct Call {
   bool fresh = false;           // the first buffer element of this pass is already in inbuff1
 };
 
-uint32_t ReadControlState(MkvContext* context) {
-  pthread_mutex_lock(&context->StateLock);
-  uint32_t state = context->ControlState;
-  pthread_mutex_unlock(&context->StateLock);
-  return state;
-}
+// ControlState is one word that every writer stores atomically: a load sees a
+// whole, recent value without taking StateLock, once per call and per input buffer.
+uint32_t ReadControlState(const MkvContext* context) { return LoadControlState(context); }
 
 // Step 14. End of stream is not stored: the other channels still deliver what
 // they have in the ring, and the upstream answers it again to each of them.
@@ -57,12 +54,15 @@ Walk Ending(Call& call, int result) {
   return Walk::kEnd;
 }
 
+// Once posted, the flag stays set: only a call that may still have to post
+// takes StateLock to decide.
 void PostMetadataEvent(MkvFilter* filter) {
   MkvContext* context = filter->Context;
-  pthread_mutex_lock(&context->StateLock);
   mkv_metadata_list* metadata = context->Metadata;
-  if (metadata && metadata->event_posted == 0) {
-    metadata->event_posted = 1;
+  if (!metadata || __atomic_load_n(&metadata->event_posted, __ATOMIC_ACQUIRE) != 0) return;
+  pthread_mutex_lock(&context->StateLock);
+  if (metadata->event_posted == 0) {
+    __atomic_store_n(&metadata->event_posted, 1, __ATOMIC_RELEASE);
     MmfEventPost post = context->EventPost;
     pthread_mutex_unlock(&context->StateLock);
     if (post) post(AsFrameworkHandle(filter), kMetadataEvent, metadata->event_data, sizeof metadata->event_data);
@@ -186,11 +186,10 @@ Walk ParseBuffer(Call& call) {
       ApplySkip(state);
       continue;
     }
-    // Ran out with both views used up: the read resumes with the next buffer.
-    if ((parsed == kClusterChildShort || parsed == kClusterHeaderFailed) && state->inbuff2.buff_left == 0 &&
-        in.buff_left == 0) {
-      break;
-    }
+    // The parser waits for the bytes after inbuff1: the read goes on with the
+    // next buffer. (One that waits while inbuff1 still holds bytes, a CodecState
+    // longer than both views, cannot go on: -1 below.)
+    if (mkvcluster_answer(&state->Cluster, parsed) == cluster_answer::need_more_data && in.buff_left == 0) break;
     if (parsed == kClusterChildShort) {
       MoveOnAndFreeBuffer(state, call.filter);
       state->ReadBuffer = nullptr;
@@ -280,7 +279,7 @@ Walk PropertyElement(Call& call) {
     if (ConvertToPosition(call.filter, value, &position) == 0) (void)ConvertToTime(call.filter, position, &start);
     state->StartTime = start;
     state->SendStartTime = 1;
-    state->ScanMode = call.context->TrickMode != 0;
+    state->ScanMode = LoadTrickMode(call.context) != 0;
     return Walk::kGoOn;
   }
   if (int error = SetOutProperty(state, type, value); error != 0) {

@@ -21,6 +21,23 @@ std::atomic_ref<int32_t> AcquiredCount(MkvContext* context) {
 
 }  // namespace
 
+bool LogWithoutTrack(const MkvChannel* channel, const char* operation) {
+  const MkvFilter* filter = channel->Filter;
+  const MkvChannel* first = filter ? filter->OutputChannels : nullptr;
+  const int32_t count = filter && filter->Context ? filter->Context->OutputChannelCount : 0;
+  const bool listed = first && channel >= first && channel < first + count;
+  const int index = listed ? static_cast<int>(channel - first) : -1;
+  const uint32_t track = channel->State->LeftOutTrack;
+  if (listed && track != 0 && track <= kMaxTracks && filter->Context->FileInfo.tracks[track - 1].encrypted) {
+    // The track as the file numbers it (TrackNumber), as players and tools name it.
+    AoLog(kAoLogFailure, "kelvane: %s channel %d has no track: track %llu is encrypted.", operation, index,
+          static_cast<unsigned long long>(filter->Context->FileInfo.tracks[track - 1].track_number));
+  } else {
+    AoLog(kAoLogFailure, "kelvane: %s channel %d has no track.", operation, index);
+  }
+  return true;
+}
+
 MkvChannel* IterateOutputChannels(MkvFilter* filter, int32_t* iterator) {
   if (!filter || !iterator || !filter->Context) return nullptr;
   int32_t index = *iterator;

@@ -8,6 +8,16 @@
 #include "filter/mkv_filter.h"
 #include "platform/interfaces.h"
 
+// A record counted for a track that was left out at the rating (an
+// encrypted one) has no track and cannot play: every operation on it answers
+// 4044, "not available", logged, and touches nothing. True, after logging,
+// when `channel` (which may be null) is such a record.
+bool LogWithoutTrack(const MkvChannel* channel, const char* operation);
+[[nodiscard]] inline bool RefusedWithoutTrack(const MkvChannel* channel, const char* operation) {
+  if (!channel || channel->Direction != kMmfDirectionOutput || !channel->State || channel->State->Track) return false;
+  return LogWithoutTrack(channel, operation);
+}
+
 // The channel at *iterator, advancing it; null for a null argument or past the end.
 MkvChannel* IterateOutputChannels(MkvFilter* filter, int32_t* iterator);
 

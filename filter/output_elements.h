@@ -9,7 +9,8 @@
 
 // Room kept free for one frame (prefix part, prefix, end part, frame) and the
 // properties that may head a block (two time markers, skip mark, preroll
-// time, timestamp).
+// time, timestamp): a block is begun only with this much room, and its first
+// frame then always fits.
 constexpr uint32_t kBlockElementReserve = 10;
 
 [[nodiscard]] inline int SetOutProperty(MkvChannelState* state, uint32_t type, uint64_t value) {

@@ -114,16 +114,20 @@ int ProcessBlock(MkvChannelState* state, MkvContext* context, uint32_t* count) {
   mkvcluster& c = state->Cluster;
   mkvinbuff& in = state->inbuff1;
   int result = 0;
+  // The caller saw room for the block's head and one frame (the reserve):
+  // only the frames after the first are weighed against the room left.
+  bool first = true;
   for (int32_t i = state->FrameIndex; i < c.frame_count; ++i) {
     auto size = static_cast<int32_t>(static_cast<uint32_t>(c.frame_sizes[i]));
     if (size < 1) {
       AoLog(kAoLogDegraded, "kelvane invalid sized frame:  %d", size);
       continue;
     }
-    if (OutputNearlyFull(state)) {
+    if (!first && OutputNearlyFull(state)) {
       state->FrameIndex = i;
       return 0;
     }
+    first = false;
     if (state->ConfigBuffer && state->FrameSplit == 0) {
       if ((result = SetOutProperty(state, kMmfPropFramePart, state->ConfigBufferSize)) != 0) {
         return FrameFailed(state, 1802, result, 0, false);

@@ -94,11 +94,22 @@ bool MakeOutputChannels(MkvFilter* filter, const MmfMediaFormat& format) {
     channel.Filter = filter;
     channel.Direction = kMmfDirectionOutput;
   }
+  // A track counted above but not set up (an encrypted one) leaves a record
+  // without a track; the records after the set-up ones note those tracks in order.
+  uint32_t left_out[kMaxTracks];
+  int32_t left_out_count = 0;
   int32_t k = 0;
-  for (uint32_t i = 0; i < context->FileInfo.track_count && k < count; ++i) {
+  const mkv_file_info& info = context->FileInfo;
+  for (uint32_t i = 0; i < info.track_count && i < kMaxTracks && k < count; ++i) {
     TrackSetup setup = SetUpTrackChannel(filter, format, i, &filter->OutputChannels[k]);
     if (setup == TrackSetup::kNoMemory) return false;
     if (setup == TrackSetup::kSetUp) ++k;
+    if (setup == TrackSetup::kSkipped && lookup_codec_fourcc(info.tracks[i].codec_id) != 0) {
+      left_out[left_out_count++] = i;
+    }
+  }
+  for (int32_t j = 0; j < left_out_count && k + j < count; ++j) {
+    filter->OutputChannels[k + j].State->LeftOutTrack = left_out[j] + 1;
   }
   return true;
 }

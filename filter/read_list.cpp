@@ -23,7 +23,7 @@ CueHit LookUp(MkvFilter* filter, uint64_t time, uint32_t forward) {
 int GetNextReadList(MkvChannel* input, MmfReadListEntry** out, MmfReadListEntry* previous) {
   MkvFilter* filter = input->Filter;
   MkvContext* context = filter->Context;
-  const uint32_t noted_mode = context->TrickMode;
+  const uint32_t noted_mode = LoadTrickMode(context);
   pthread_mutex_lock(&context->ReadListLock);
   if (!previous || previous != context->CurrentReadList) {
     *out = context->CurrentReadList;
@@ -41,7 +41,7 @@ int GetNextReadList(MkvChannel* input, MmfReadListEntry** out, MmfReadListEntry*
 
   const uint32_t skip = static_cast<uint32_t>(context->TrickTime) * (1000u * context->TrickSpeed) / 100u;
   uint64_t time = before.Time;
-  if (context->TrickMode == kTrickForward) {
+  if (LoadTrickMode(context) == kTrickForward) {
     time = before.Time + 1000u * static_cast<uint64_t>(static_cast<uint32_t>(context->TrickTime)) + skip;
   } else if (before.Time > skip) {
     time = before.Time - skip;
@@ -58,7 +58,7 @@ int GetNextReadList(MkvChannel* input, MmfReadListEntry** out, MmfReadListEntry*
   } else {
     while (hit.position == before.Position) {
       const uint64_t found = hit.time;
-      const uint64_t nudged = context->TrickMode == kTrickForward ? found + 1 : found - 1;
+      const uint64_t nudged = LoadTrickMode(context) == kTrickForward ? found + 1 : found - 1;
       hit = LookUp(filter, nudged, forward);
       if (hit.time == found) {
         request.Length = kMmfReadEndOfStream;

@@ -13,12 +13,8 @@ constexpr uint64_t kTrackTypeAudio = 2;
 constexpr uint32_t kListMode = 1;
 constexpr uint32_t kNormalStreaming = 0;
 
-// TrickMode is read before ReadListLock is taken (the direction of a lookup
-// is the mode noted then), so every access of ours is a relaxed atomic one.
-uint32_t NoteTrickMode(const MkvContext* context) { return __atomic_load_n(&context->TrickMode, __ATOMIC_RELAXED); }
-
 void SetTrick(MkvContext* context, uint32_t mode, uint32_t speed) {
-  __atomic_store_n(&context->TrickMode, mode, __ATOMIC_RELAXED);
+  StoreTrickMode(context, mode);
   context->TrickSpeed = speed;
 }
 
@@ -159,7 +155,7 @@ int ScanBackward(MkvFilter* filter, uint32_t speed) {
 
 int ScanEnd(MkvFilter* filter) {
   MkvContext* context = filter->Context;
-  const uint32_t noted_mode = NoteTrickMode(context);
+  const uint32_t noted_mode = LoadTrickMode(context);
   uint64_t now = 0;
   if (int result = CurrentTimeOrLog(filter, "ScanEnd", &now); result != kMmfOk) return result;
   pthread_mutex_lock(&context->ReadListLock);

@@ -6,7 +6,9 @@
 #include <memory>
 #include <thread>
 
+#include "host/damage_recovery.h"
 #include "host/file_streamer.h"
+#include "host/frame_sink.h"
 #include "host/graph_clock.h"
 #include "host/graph_setup.h"
 #include "host/input_streams.h"
@@ -32,300 +34,72 @@ constexpr uint32_t kMinInputBuffers = 48;
 constexpr uint32_t kMaxInputBuffers = 2048;
 constexpr int kMaxShortInputRetries = 1000;
 
-class Adler32 {
- public:
-  void Update(const uint8_t* data, size_t n) {
-    constexpr uint32_t kBase = 65521;
-    constexpr size_t kBlock = 5552;  // the longest run without overflow of b
-    while (n > 0) {
-      size_t run = n < kBlock ? n : kBlock;
-      n -= run;
-      for (size_t i = 0; i < run; ++i) {
-        a_ += data[i];
-        b_ += a_;
-      }
-      data += run;
-      a_ %= kBase;
-      b_ %= kBase;
-    }
-  }
-  uint32_t Value() const { return b_ << 16 | a_; }
 
- private:
-  uint32_t a_ = 1, b_ = 0;
-};
-
-// One output channel's consumer: whole frames out of output media buffers.
-// It runs for every element of every frame, so the options it needs per frame
-// are copied in, the element bounds that the setter checked are not checked
-// again, and a frame in one element (nearly all of them) takes a path of its
-// own.
-class Sink {
- public:
-  Sink(ChannelRun* run, const RunnerOptions& options, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool)
-      : run_(run),
-        config_pool_(config_pool),
-        prefix_pool_(prefix_pool),
-        on_frames_(options.on_frames),
-        frame_room_(options.frame_room),
-        user_(options.user),
-        index_(run->index),
-        checksum_(options.checksum),
-        keep_frames_(options.keep_frames) {
-    NextRoom();
-  }
-  Sink(const Sink&) = delete;  // it points into itself
-  Sink& operator=(const Sink&) = delete;
-
-  void Consume(MmfMra* mra) {
-    const MraElement* element = MraElements(mra);
-    const MraElement* const end = element + mra->ElementCount;
-    while (element != end) {
-      if (config_left_ == 0 && !in_parts_ && !checksum_) {
-        element = TakeWholeFrames(element, end);
-        if (element == end) break;
-      }
-      if (element->kind == kMmfElementBuffer) {
-        Buffer(*element);
-      } else if (element->kind == kMmfElementProperty) {
-        Property(*element);
-      }
-      ++element;
-    }
-    PassFrames();
-  }
-
-  void Finish() { run_->incomplete_frame = in_parts_; }
-
-  // After a seek or a scan took effect: a frame being put together is lost to the flush.
-  void Restart() {
-    in_parts_ = false;
-    last_part_ = false;
-    marked_ = false;
-  }
-
- private:
-  void Property(const MraElement& element) {
-    const uint32_t type = element.type;
-    // A time comes with every frame: tested before the rest, without a jump table.
-    if (type == kMmfPropVideoTime || type == kMmfPropAudioTime || type == kMmfPropSubtitleTime) {
-      time_ = MmfPropertyValue(element.low, element.high);
-      return;
-    }
-    switch (type) {
-      case kMmfPropTimeMarker:
-        ++run_->time_markers;
-        marked_ = true;
-        break;
-      case kMmfPropSkipMark:
-        ++run_->skip_marks;
-        break;
-      case kMmfPropConfigCount:
-        config_left_ = static_cast<uint32_t>(MmfPropertyValue(element.low, element.high));
-        break;
-      case kMmfPropFramePart:
-        if (!in_parts_) StartFrame();
-        in_parts_ = true;
-        break;
-      case kMmfPropFrameEnd:
-        if (!in_parts_) StartFrame();
-        in_parts_ = true;
-        last_part_ = true;
-        break;
-      default:
-        break;
-    }
-  }
-
-  void StartFrame() {
-    frame_ = RunFrame{time_, 0, 0, marked_};
-    marked_ = false;
-    adler_ = Adler32{};
-  }
-
-  // Whether a frame element's bytes are the input's own (zero copy). Its
-  // bounds need no test: MmfSetMraBufferElement refused any element outside
-  // its pool buffer, and a null handle. What is left is the pool: never an
-  // output pool buffer, and the filter's input pool only for the frame
-  // prefix, the one piece that is neither a whole frame nor a frame's last.
-  bool ZeroCopy(const MmfPoolBuffer* handle) const {
-    const MmfMemoryPool* pool = handle->Pool;
-    if (pool == config_pool_) return false;
-    return pool != prefix_pool_ || (in_parts_ && !last_part_);
-  }
-
-  void Buffer(const MraElement& element) {
-    if (config_left_ > 0) {
-      --config_left_;
-      AddConfig(run_, element, checksum_);
-      return;
-    }
-    if (!ZeroCopy(element.handle)) ++run_->foreign_elements;
-    if (!in_parts_) {
-      // A frame of its own: passed on at once, with nothing to put together.
-      const RunFrame frame{time_, element.size, checksum_ ? Checksum(element) : 0, marked_};
-      marked_ = false;
-      Deliver(frame);
-      return;
-    }
-    frame_.size += element.size;
-    if (checksum_) adler_.Update(element.address, element.size);
-    if (!last_part_) return;
-    frame_.adler32 = checksum_ ? adler_.Value() : 0;
-    in_parts_ = false;
-    last_part_ = false;
-    const RunFrame frame = frame_;
-    Deliver(frame);
-  }
-
-  // Nearly every element is a frame's time or a whole frame: without
-  // checksums those go straight into the batch, the sink's state held in
-  // locals, up to the first element of another kind (or the end), which is
-  // returned for the general steps.
-  const MraElement* TakeWholeFrames(const MraElement* element, const MraElement* end) {
-    uint64_t time = time_;
-    bool marked = marked_;
-    RunFrame* out = batch_end_;
-    RunFrame* limit = batch_limit_;
-    uint64_t foreign = 0;
-    for (; element != end; ++element) {
-      if (element->kind == kMmfElementProperty) {
-        const uint32_t type = element->type;
-        if (type != kMmfPropVideoTime && type != kMmfPropAudioTime && type != kMmfPropSubtitleTime) break;
-        time = MmfPropertyValue(element->low, element->high);
-        continue;
-      }
-      if (element->kind != kMmfElementBuffer) break;
-      foreign += ZeroCopy(element->handle) ? 0 : 1;
-      *out++ = RunFrame{time, element->size, 0, marked};
-      marked = false;
-      if (out == limit) {
-        batch_end_ = out;
-        PassFrames();
-        out = batch_end_;
-        limit = batch_limit_;
-      }
-    }
-    time_ = time;
-    marked_ = marked;
-    batch_end_ = out;
-    run_->foreign_elements += foreign;
-    return element;
-  }
-
-  static uint32_t Checksum(const MraElement& element) {
-    Adler32 adler;
-    adler.Update(element.address, element.size);
-    return adler.Value();
-  }
-
-  // Out of line: a channel's decoder configurations come once per run. A
-  // static function, so that the sink itself never escapes to a call.
-  [[gnu::noinline]] static void AddConfig(ChannelRun* run, const MraElement& element, bool checksum) {
-    run->config.push_back(RunFrame{0, element.size, checksum ? Checksum(element) : 0, false});
-  }
-
-  // Frames are gathered and counted a batch at a time (at least once per
-  // output buffer): the count and the last time are up to date whenever the
-  // sink is between two output buffers.
-  void Deliver(const RunFrame& frame) {
-    *batch_end_++ = frame;
-    if (batch_end_ == batch_limit_) PassFrames();
-  }
-
-  void PassFrames() {
-    if (batch_end_ == batch_begin_) return;
-    const size_t count = static_cast<size_t>(batch_end_ - batch_begin_);
-    run_->frame_count += count;
-    run_->last_time_us = batch_end_[-1].time_us;
-    if (keep_frames_) run_->frames.insert(run_->frames.end(), batch_begin_, batch_end_);
-    if (on_frames_) on_frames_(user_, index_, batch_begin_, count);
-    NextRoom();
-  }
-
-  // The consumer's room for the next frames, else the sink's own batch.
-  void NextRoom() {
-    size_t room = 0;
-    RunFrame* at = frame_room_ ? frame_room_(user_, index_, &room) : nullptr;
-    if (!at || room == 0) {
-      at = batch_;
-      room = kFrameBatch;
-    }
-    batch_begin_ = batch_end_ = at;
-    batch_limit_ = at + room;
-  }
-
-  ChannelRun* run_;
-  MmfMemoryPool* config_pool_;
-  MmfMemoryPool* prefix_pool_;
-  void (*on_frames_)(void* user, int32_t channel, const RunFrame* frames, size_t count);
-  RunFrame* (*frame_room_)(void* user, int32_t channel, size_t* room);
-  void* user_;
-  int32_t index_;
-  bool checksum_;
-  bool keep_frames_;
-  uint64_t time_ = 0;
-  uint32_t config_left_ = 0;
-  bool in_parts_ = false;   // a frame announced by property 7 is being put together
-  bool last_part_ = false;  // property 8 came: the next buffer element ends the frame
-  bool marked_ = false;     // a time marker came since the last frame started
-  RunFrame frame_;
-  Adler32 adler_;
-  RunFrame batch_[kFrameBatch];
-  RunFrame* batch_begin_ = batch_;  // where the frames passed next are gathered
-  RunFrame* batch_end_ = batch_;
-  RunFrame* batch_limit_ = batch_ + kFrameBatch;
-};
-
-// A channel that fails stops the graph, as a player does when one of its
-// decoders' inputs breaks: the other channels may be waiting for ring room
-// that only the failed channel's reads would free, and Stop wakes them.
 constexpr int kControlStopped = 16;  // the control state a channel answers once the graph is stopped
+constexpr int kFailed = 1;           // NextBuffer's error, and the control state it leaves
 
-struct GraphStopper {
+// What a sink thread works with.
+struct SinkLinks {
+  const MmfMediaOutputOps* output;
+  MmfChannel* channel;
+  ChannelRun* run;
+  size_t index;  // among the sinks
+  uint32_t delay_us;
+  MmfMemoryPool* config_pool;
+  MmfMemoryPool* prefix_pool;
+  PlaybackControl* playback;  // null: none
+  bool controlled;            // actions or a script: checkpoints, and the clock follows the frames
   const MmfMediaControlOps* control;
   MmfFilterHandle* handle;
-  void StopAfter(int result) const {
-    if (result != kMmfEndOfStream && result != kControlStopped && result != kMmfBufferDelivered) {
-      (void)control->Stop(handle);
-    }
-  }
 };
 
-void SinkThread(const MmfMediaOutputOps* output, MmfChannel* channel, ChannelRun* run, const RunnerOptions& options,
-                uint32_t delay_us, MmfMemoryPool* config_pool, MmfMemoryPool* prefix_pool, PlaybackControl* playback,
-                GraphStopper stopper) {
-  Sink sink(run, options, config_pool, prefix_pool);
+void SinkThread(const SinkLinks links, const RunnerOptions& options) {
+  ChannelRun* run = links.run;
+  PlaybackControl* playback = links.playback;
+  FrameSink sink(run, options, links.config_pool, links.prefix_pool, links.controlled);
   auto restart = [&] {
     if (playback->Flushed()) sink.Restart();
-    run->seeks.push_back(static_cast<size_t>(run->frame_count));
+    if (playback->Marked()) {
+      run->seeks.push_back(static_cast<size_t>(run->frame_count));
+    } else {
+      sink.SkipBefore(run->frame_end);
+    }
   };
   int short_inputs = 0;
   for (;;) {
-    if (playback && playback->Checkpoint()) restart();
+    if (links.controlled && playback->Checkpoint()) restart();
     MmfMra* mra = nullptr;
-    int result = output->NextBuffer(channel, &mra);
+    const uint64_t taken = MrasAcquiredOnThisThread();
+    int result = links.output->NextBuffer(links.channel, &mra);
     run->end_result = result;
     if (result == 4 && ++short_inputs < kMaxShortInputRetries) continue;  // delivery goes on
     if (result != kMmfBufferDelivered || !mra) {
-      if (playback && playback->AfterEnd()) {
+      // A call that took no output buffer and failed only answered the state
+      // another channel's failure had left. A channel that fails stops the
+      // graph, as a player does when one of its decoders' inputs breaks: the
+      // others may wait for ring room that only its reads would free.
+      const bool stopped = result == kControlStopped || (result == kFailed && MrasAcquiredOnThisThread() == taken);
+      run->failed = !stopped && result != kMmfEndOfStream;
+      if (run->failed) (void)links.control->Stop(links.handle);
+      sink.PassFrames();  // the recovery reads the counts while the sink waits
+      if (playback && playback->AfterEnd(links.index)) {
         restart();
         continue;
       }
-      stopper.StopAfter(result);
       break;
     }
     short_inputs = 0;
     ++run->buffers;
     const uint64_t frames_before = run->frame_count;
-    sink.Consume(mra);
+    MmfMra* shown = sink.Consume(mra);
     // Only a frame completed here moves the clock. A buffer cut short by a
     // control sequence's Stop may hold none, and the last frame before it may
     // be from before a seek: reported now, it would set the clock back.
-    if (playback && run->frame_count != frames_before && playback->Consumed(run->last_time_us)) restart();
-    if (options.on_buffer) options.on_buffer(options.user, run->index, mra);
+    if (links.controlled && run->frame_count != frames_before && playback->Consumed(run->last_time_us)) restart();
+    if (options.on_buffer) options.on_buffer(options.user, run->index, shown);
+    if (shown != mra) (void)MmfReleaseMra(shown);
     (void)MmfReleaseMra(mra);
-    if (delay_us) std::this_thread::sleep_for(std::chrono::microseconds(delay_us));
+    if (links.delay_us) std::this_thread::sleep_for(std::chrono::microseconds(links.delay_us));
   }
   sink.Finish();
 }
@@ -426,14 +200,19 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
     streamer.ConnectListMaker(list_maker, handle->InputChannel);
   }
   const int64_t first_cluster = rating_stream->Tell();
+  out.first_cluster = first_cluster > 0 ? static_cast<uint64_t>(first_cluster) : 0;
 
+  // A framework connects only the channels that offer a format.
   std::vector<int32_t> wanted = options.channels;
   if (wanted.empty()) {
-    for (size_t k = 0; k < graph.outputs().size(); ++k) wanted.push_back(static_cast<int32_t>(k));
+    for (size_t k = 0; k < graph.outputs().size(); ++k) {
+      if (graph.outputs()[k].formats_offered > 0) wanted.push_back(static_cast<int32_t>(k));
+    }
   }
   std::vector<MmfChannel*> acquired;
   for (int32_t k : wanted) {
-    if (k < 0 || static_cast<size_t>(k) >= graph.outputs().size()) {
+    if (k < 0 || static_cast<size_t>(k) >= graph.outputs().size() ||
+        graph.outputs()[static_cast<size_t>(k)].formats_offered == 0) {
       out.error = "no output channel " + std::to_string(k);
       break;
     }
@@ -462,15 +241,17 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
     (void)control->Start(handle);
     if (!own_upstream) (void)streamer.Seek(static_cast<uint64_t>(first_cluster), 0);
     std::unique_ptr<PlaybackControl> playback;
-    if (!own_upstream && (!options.actions.empty() || options.script)) {
+    const bool controlled = !options.actions.empty() || options.script;
+    if (!own_upstream && (controlled || options.catch_up)) {
       playback = std::make_unique<PlaybackControl>(ControlTablesOf(plugin), handle, &streamer, &clock, acquired.size());
     }
     std::vector<std::thread> sinks;
     for (size_t i = 0; i < acquired.size(); ++i) {
-      uint32_t delay = i < options.sink_delay_us.size() ? options.sink_delay_us[i] : 0;
+      const uint32_t delay = i < options.sink_delay_us.size() ? options.sink_delay_us[i] : 0;
+      const SinkLinks links{output,         acquired[i],  &out.channels[i],         i,       delay,  config_pool.handle(),
+                            prefix_pool.handle(), playback.get(), playback && controlled, control, handle};
       // By pointer: a Thumb function's address is odd, and a reference bound to it reads as misaligned.
-      sinks.emplace_back(&SinkThread, output, acquired[i], &out.channels[i], std::cref(options), delay,
-                         config_pool.handle(), prefix_pool.handle(), playback.get(), GraphStopper{control, handle});
+      sinks.emplace_back(&SinkThread, links, std::cref(options));
       if (placement.channels_cpu >= 0) {
         KeepOnCpu(sinks.back(), placement.channels_cpu);
         WaitForTurnOnCore(sinks.back());
@@ -483,6 +264,10 @@ RunResult RunGraph(const Plugin& plugin, const std::string& path, const RunnerOp
           options.script(*playback);
         } else {
           out.control_results = playback->Run(options.actions);
+        }
+        if (options.catch_up) {
+          const RecoveryLinks links{output, plugin.converter(), handle, config_pool.handle(), playback.get()};
+          RecoverFromDamage(links, acquired, &out.channels, options.recoveries);
         }
         playback->Finish();
       });

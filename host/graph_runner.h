@@ -43,10 +43,12 @@ struct RunnerOptions {
   void (*on_buffer)(void* user, int32_t channel, MmfMra* buffer) = nullptr;
   void* user = nullptr;
   // Called on a sink's thread with the whole frames (not decoder-configuration
-  // packets) completed in each output buffer it consumed, in order, at most
-  // kFrameBatch (or frame_room's room) at a time and before on_buffer. With
-  // keep_frames off, ChannelRun::frames stays empty, so a long file costs no
-  // memory per frame.
+  // packets) completed in the output buffers it consumed, in order, at most
+  // kFrameBatch (or frame_room's room) at a time: when that room is full,
+  // when NextBuffer answers anything but a delivery, and, under playback
+  // control, after each output buffer (before on_buffer). With keep_frames
+  // off, ChannelRun::frames stays empty, so a long file costs no memory per
+  // frame.
   void (*on_frames)(void* user, int32_t channel, const RunFrame* frames, size_t count) = nullptr;
   // Where a sink gathers the frames it passes to on_frames next, and in
   // *room how many fit there: the consumer's own storage, so that it need not
@@ -71,6 +73,20 @@ struct RunnerOptions {
   bool channels_share_core = false;
   bool preroll = false;       // sets "EnablePreroll"
   int32_t trick_time_ms = 0;  // sets "TrickTime" when not 0
+  // Damaged input (file streamer only, see host/damage_recovery.h): after a
+  // channel fails, the channels that it stopped catch up to where it failed;
+  // then playback goes on from the first cue point after the furthest frame
+  // delivered, at most `recoveries` times. Off: a failure ends the run.
+  bool catch_up = false;
+  int recoveries = 0;
+};
+
+// Where a channel's frames stopped at damaged input and went on again.
+struct Gap {
+  size_t at = 0;           // frames delivered before it
+  uint64_t from_us = 0;    // time of the last of them
+  uint64_t to_us = 0;      // time of the cue point playback went on from
+  uint64_t after_byte = 0;  // the furthest any channel had got: the damage lies after it
 };
 
 struct ChannelRun {
@@ -88,6 +104,11 @@ struct ChannelRun {
   uint64_t time_markers = 0;      // properties 3
   uint64_t foreign_elements = 0;  // frame elements that point outside every input buffer
   bool incomplete_frame = false;  // the stream ended inside a split frame
+  uint64_t frame_end = 0;         // file offset just past the last frame delivered
+  // Its last NextBuffer failed of itself, rather than answering a state that
+  // another channel's failure or a Stop had set.
+  bool failed = false;
+  std::vector<Gap> gaps;
 };
 
 struct RunResult {
@@ -97,6 +118,7 @@ struct RunResult {
   std::vector<ChannelRun> channels;
   uint64_t bytes_read = 0;  // by the streamer
   std::vector<int> control_results;  // the answer of each action
+  uint64_t first_cluster = 0;  // where the input stood after the rating
 };
 
 // Loads nothing: `plugin` is the loaded kelvane.so.

@@ -1,5 +1,6 @@
 #include "host/graph_setup.h"
 
+#include "host/log_control.h"
 #include "platform/mmf_status.h"
 
 namespace host {
@@ -53,10 +54,12 @@ void FilterGraph::ConfigureOutputs(const SetupOptions& options) {
     setup.channel = channel;
     int32_t formats = 0;
     MmfMediaFormat format{};
+    ThreadLog log;
     while (output->IterateOutputFormats(channel, &format, &formats) == kMmfFormatMatch) {
       if (setup.formats_offered++ == 0) setup.offered = format;
     }
-    if (options.configure_outputs) {
+    if (setup.formats_offered == 0) setup.not_set_up = log.last();
+    if (options.configure_outputs && setup.formats_offered > 0) {
       setup.acquire_result = output->AcquireOutputChannel(channel);
       setup.set_format_result = output->SetOutputFormat(channel, &setup.offered);
       if (options.output_pool && options.output_pool_param) {

@@ -1,11 +1,13 @@
 #pragma once
 // The framework's side of connecting a parser filter: sniff and rate the
 // input through the plug-in's tables, attach the input stream to the input
-// channel and configure it, then list, acquire and configure every output
-// channel. The object owns the instance: its destructor releases the acquired
-// outputs and destroys the instance.
+// channel and configure it, then list every output channel, and acquire and
+// configure each one that offers a format (as a framework connects only the
+// pins that have one). The object owns the instance: its destructor releases
+// the acquired outputs and destroys the instance.
 
 #include <cstdint>
+#include <string>
 #include <vector>
 
 #include "host/graph.h"
@@ -30,7 +32,8 @@ struct SetupOptions {
 struct OutputChannelSetup {
   MmfChannel* channel = nullptr;
   MmfMediaFormat offered{};  // the first format IterateOutputFormats offered
-  int formats_offered = 0;   // how many times it answered 100
+  int formats_offered = 0;   // how many times it answered 100; 0: not set up, never acquired
+  std::string not_set_up;    // then: what the plug-in logged when asked for its formats
   int acquire_result = -1;   // -1: not attempted
   int set_format_result = -1;
   int pool_result = -1;

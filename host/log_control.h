@@ -15,4 +15,22 @@ void SetLogThreshold(int level);
 using LogCapture = std::function<void(int level, const std::string& text)>;
 void SetLogCapture(LogCapture capture);
 
+// While it lives, keeps the messages logged on the thread that made it.
+void NoteOnThread(const char* text);
+
+class ThreadLog {
+ public:
+  ThreadLog();
+  ~ThreadLog();
+  ThreadLog(const ThreadLog&) = delete;
+  ThreadLog& operator=(const ThreadLog&) = delete;
+  // The last message, or "" when none came.
+  const std::string& last() const { return last_; }
+
+ private:
+  ThreadLog* outer_;
+  std::string last_;
+  friend void NoteOnThread(const char* text);
+};
+
 }  // namespace host

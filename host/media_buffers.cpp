@@ -13,13 +13,14 @@
 #include <vector>
 
 #include "host/memory_pools.h"
+#include "host/spin_lock.h"
 #include "platform/channel.h"
 #include "platform/mra_pool.h"
 
 namespace {
 
 using Element = host::MraElement;
-static_assert(std::is_trivial_v<Element>, "elements start as calloc's zero bytes");
+static_assert(std::is_trivial_v<Element>, "elements are raw storage until set; none is read beyond ElementCount");
 
 struct MraPoolState;
 
@@ -39,16 +40,24 @@ struct HostMra {
 };
 static_assert(std::is_standard_layout_v<HostMra>);
 
+// Every output buffer is taken and given back once: the free list has a
+// lock of its own that costs no system call, and only a taker that must wait
+// for a buffer to come back uses the mutex and condition.
 struct MraPoolState {
-  std::mutex mutex;
+  host::SpinLock lock;  // the free list, the counts and `closed`
+  std::mutex wait_mutex;
   std::condition_variable returned;
+  std::atomic<uint32_t> waiting{0};  // takers waiting on `returned`
   std::vector<HostMra> mras;
-  // Zeroed by calloc: a large pool costs no time or memory until its buffers fill.
+  // Not zeroed: an element is read only once set, and a large pool costs no memory until its buffers fill.
   std::unique_ptr<Element[], FreeDeleter> elements;
   std::vector<HostMra*> free;
   uint32_t in_use = 0;
   bool closed = false;  // freed by its owner; deleted with the last media buffer
 };
+
+// The library is loaded with the program, never by dlopen: its own TLS block, reached directly.
+[[gnu::tls_model("initial-exec")]] thread_local uint64_t acquired_on_this_thread = 0;
 
 constexpr int kInvalid = 22;
 constexpr int kOutOfRange = 28;
@@ -121,7 +130,7 @@ namespace host {
 MmfMraPool* MakeMraPool(uint32_t count, uint32_t capacity) {
   if (count == 0 || capacity == 0) return nullptr;
   const size_t element_count = static_cast<size_t>(count) * capacity;
-  auto* elements = static_cast<Element*>(std::calloc(element_count, sizeof(Element)));
+  auto* elements = static_cast<Element*>(std::malloc(element_count * sizeof(Element)));
   if (!elements) return nullptr;
   auto* state = new MraPoolState;
   state->elements.reset(elements);
@@ -141,8 +150,10 @@ MmfMraPool* MakeMraPool(uint32_t count, uint32_t capacity) {
 
 const MraElement* MraElements(MmfMra* mra) { return Host(mra)->elements; }
 
+uint64_t MrasAcquiredOnThisThread() { return acquired_on_this_thread; }
+
 uint32_t MraPoolFreeCount(MmfMraPool* pool) {
-  std::lock_guard lock(State(pool)->mutex);
+  std::lock_guard lock(State(pool)->lock);
   return static_cast<uint32_t>(State(pool)->free.size());
 }
 
@@ -151,7 +162,7 @@ uint32_t MraPoolFreeCount(MmfMraPool* pool) {
 extern "C" int MmfAllocateMraPool(MmfMraPool** pool, MmfChannel* channel, uint32_t capacity) {
   if (!pool || !channel || capacity == 0) return kInvalid;
   uint32_t count = channel->Format.buffer_count ? channel->Format.buffer_count : 1;
-  MmfMraPool* made = host::MakeMraPool(count, capacity);
+  MmfMraPool* made = host::MakeMraPool(count, capacity < host::kOutputBufferElements ? capacity : host::kOutputBufferElements);
   if (!made) return kNoMemory;
   *pool = made;
   return 0;
@@ -162,9 +173,12 @@ extern "C" int MmfFreeMraPool(MmfMraPool* pool) {
   MraPoolState* state = State(pool);
   bool last;
   {
-    std::lock_guard lock(state->mutex);
+    std::lock_guard lock(state->lock);
     state->closed = true;
     last = state->in_use == 0;
+  }
+  {
+    std::lock_guard lock(state->wait_mutex);
     state->returned.notify_all();
   }
   if (last) delete state;
@@ -174,16 +188,25 @@ extern "C" int MmfFreeMraPool(MmfMraPool* pool) {
 extern "C" int MmfAcquireMra(MmfMraPool* pool, MmfMra** mra, uint32_t flags) {
   if (!pool || !mra) return kInvalid;
   MraPoolState* state = State(pool);
-  std::unique_lock lock(state->mutex);
-  if (!(flags & kMmfAcquireNoWait)) {
-    state->returned.wait(lock, [state] { return !state->free.empty() || state->closed; });
+  auto available = [state] {
+    std::lock_guard lock(state->lock);
+    return !state->free.empty() || state->closed;
+  };
+  if (!(flags & kMmfAcquireNoWait) && !available()) {
+    // Counted before the last look, so that a buffer given back after it wakes this taker.
+    std::unique_lock lock(state->wait_mutex);
+    state->waiting.fetch_add(1);
+    state->returned.wait(lock, available);
+    state->waiting.fetch_sub(1);
   }
+  std::lock_guard lock(state->lock);
   if (state->free.empty() || state->closed) return kNoneFree;
   HostMra* taken = state->free.back();
   state->free.pop_back();
   taken->in_use = 1;
   taken->record.ElementCount = 0;
   ++state->in_use;
+  ++acquired_on_this_thread;
   *mra = &taken->record;
   return 0;
 }
@@ -196,14 +219,18 @@ extern "C" int MmfReleaseMra(MmfMra* mra) {
   mra->ElementCount = 0;
   host_mra->referenced = nullptr;
   MraPoolState* state = host_mra->pool;
-  bool delete_pool = false;
+  bool delete_pool = false, wake = false;
   {
-    std::lock_guard lock(state->mutex);
+    std::lock_guard lock(state->lock);
     if (!host_mra->in_use) return kInvalid;
     host_mra->in_use = 0;
     state->free.push_back(host_mra);
     --state->in_use;
     delete_pool = state->closed && state->in_use == 0;
+    wake = state->waiting.load() > 0;  // read before the owner may free a pool with none in use
+  }
+  if (wake) {
+    std::lock_guard lock(state->wait_mutex);
     state->returned.notify_one();
   }
   if (delete_pool) delete state;

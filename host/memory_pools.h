@@ -73,6 +73,15 @@ inline void DropBufferReference(MmfPoolBuffer* buffer) {
   if (references == 1) ReturnToPool(pool_buffer);
 }
 
+// Elements of each output media buffer of a filter: MmfAllocateMraPool grants
+// at most this many, whatever the filter asks for, as a decoder takes a few
+// frames at a time. A filter that fails while filling one loses only those.
+constexpr uint32_t kOutputBufferElements = 26;
+
+// Media buffers taken from any pool by the calling thread so far: a call that
+// took none never got as far as filling a buffer.
+uint64_t MrasAcquiredOnThisThread();
+
 // A pool of `count` media buffers with `capacity` elements each, for the host's
 // own filters; freed with MmfFreeMraPool.
 MmfMraPool* MakeMraPool(uint32_t count, uint32_t capacity);

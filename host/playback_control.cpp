@@ -32,6 +32,8 @@ int PlaybackControl::Sequence(Work work) {
     changed_.wait(lock, [this] { return parked_ == sinks_; });
   }
   flushed_ = false;
+  marked_ = true;
+  held_.clear();
   const int result = work();
   (void)tables_.control->Start(handle_);
   {
@@ -46,18 +48,35 @@ int PlaybackControl::Sequence(Work work) {
   return result;
 }
 
+int PlaybackControl::SeekWork(uint64_t time_us) {
+  uint64_t position = 0;
+  int result = tables_.converter->ConvertToPosition(handle_, 0, time_us, &position);
+  if (result != kMmfOk) return result;
+  result = tables_.seeker->Seek(handle_, 0, time_us, position);
+  (void)streamer_->Seek(position, time_us);
+  (void)tables_.flush->Flush(handle_);
+  flushed_ = true;
+  clock_->Consumed(time_us);
+  backward_ = false;
+  return result;
+}
+
 int PlaybackControl::Seek(uint64_t time_us) {
+  return Sequence([&] { return SeekWork(time_us); });
+}
+
+bool PlaybackControl::WaitIdle() {
+  std::unique_lock lock(mutex_);
+  changed_.wait(lock, [this] { return idle_ == sinks_ || finished_; });
+  return !finished_;
+}
+
+int PlaybackControl::Reposition(uint64_t time_us, const std::vector<bool>& held, const std::function<void()>& prepare) {
   return Sequence([&] {
-    uint64_t position = 0;
-    int result = tables_.converter->ConvertToPosition(handle_, 0, time_us, &position);
-    if (result != kMmfOk) return result;
-    result = tables_.seeker->Seek(handle_, 0, time_us, position);
-    (void)streamer_->Seek(position, time_us);
-    (void)tables_.flush->Flush(handle_);
-    flushed_ = true;
-    clock_->Consumed(time_us);
-    backward_ = false;
-    return result;
+    marked_ = false;
+    held_ = held;
+    prepare();
+    return SeekWork(time_us);
   });
 }
 
@@ -91,6 +110,10 @@ int PlaybackControl::ScanEnd() {
   });
 }
 
+int PlaybackControl::ScanWhilePlaying(bool forward, uint32_t speed) {
+  return forward ? tables_.trick->ScanForward(handle_, speed) : tables_.trick->ScanBackward(handle_, speed);
+}
+
 int PlaybackControl::Pause() { return tables_.control->Pause(handle_); }
 
 int PlaybackControl::Resume() { return tables_.control->Resume(handle_); }
@@ -106,6 +129,15 @@ bool PlaybackControl::Due(const ControlAction& action) {
   if (idle_ == sinks_ || holding_ > 0) return true;
   const uint64_t now = clock_->Now();
   return backward_ ? now <= action.at_us : now >= action.at_us;
+}
+
+bool PlaybackControl::WaitUntil(const std::function<bool()>& reached) {
+  std::unique_lock lock(mutex_);
+  while (!reached()) {
+    if (idle_ == sinks_) return false;
+    changed_.wait_for(lock, kPoll);
+  }
+  return true;
 }
 
 std::vector<int> PlaybackControl::Run(const std::vector<ControlAction>& actions) {
@@ -144,6 +176,7 @@ void PlaybackControl::Finish() {
 }
 
 bool PlaybackControl::Checkpoint() {
+  if (!closed_.load(std::memory_order_relaxed)) return false;
   std::unique_lock lock(mutex_);
   if (!closed_) return false;
   const uint64_t generation = generation_;
@@ -153,14 +186,17 @@ bool PlaybackControl::Checkpoint() {
   return true;
 }
 
-bool PlaybackControl::AfterEnd() {
+bool PlaybackControl::AfterEnd(size_t sink) {
   std::unique_lock lock(mutex_);
-  const uint64_t generation = generation_;
-  ++parked_;
-  ++idle_;
-  changed_.notify_all();
-  changed_.wait(lock, [&] { return generation_ != generation || finished_; });
-  if (generation_ != generation) return true;
+  for (;;) {
+    const uint64_t generation = generation_;
+    ++parked_;
+    ++idle_;
+    changed_.notify_all();
+    changed_.wait(lock, [&] { return generation_ != generation || finished_; });
+    if (generation_ == generation) break;
+    if (sink >= held_.size() || !held_[sink]) return true;
+  }
   --parked_;
   --idle_;
   return false;
@@ -169,6 +205,11 @@ bool PlaybackControl::AfterEnd() {
 bool PlaybackControl::Flushed() {
   std::lock_guard lock(mutex_);
   return flushed_;
+}
+
+bool PlaybackControl::Marked() {
+  std::lock_guard lock(mutex_);
+  return marked_;
 }
 
 bool PlaybackControl::Consumed(uint64_t time_us) {

@@ -8,6 +8,8 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "tools/reading/header_reading.h"
+
 const char kPluginOptionHelp[] =
     "  --plugin PATH    the plug-in to load (default: kelvane.so beside this program)\n";
 
@@ -45,20 +47,44 @@ int Failure(const char* command, const char* format, ...) {
   return kExitFailed;
 }
 
-int CheckInputFile(const char* command, const char* path) {
-  if (!std::strcmp(path, "-")) return kExitOk;
+int CheckInput(const char* command, const char* path, InputUse use, bool* stream) {
+  *stream = !std::strcmp(path, "-");
   struct stat status;
-  if (stat(path, &status) != 0) return Failure(command, "cannot open %s: %s", path, std::strerror(errno));
-  if (S_ISDIR(status.st_mode)) return Failure(command, "cannot read %s: %s", path, std::strerror(EISDIR));
+  if (!*stream) {
+    if (stat(path, &status) != 0) return Failure(command, "cannot open %s: %s", path, std::strerror(errno));
+    if (S_ISDIR(status.st_mode)) return Failure(command, "cannot read %s: %s", path, std::strerror(EISDIR));
+    *stream = !S_ISREG(status.st_mode) && !S_ISBLK(status.st_mode);
+  }
+  if (*stream && use == InputUse::kTwice) {
+    return UsageError(command, "FILE cannot be %s: %s reads its input more than once (save it to a file first)",
+                      !std::strcmp(path, "-") ? "standard input" : "a pipe or FIFO", command);
+  }
+  if (*stream) return kExitOk;
   FILE* file = std::fopen(path, "rb");
   if (!file) return Failure(command, "cannot open %s: %s", path, std::strerror(errno));
   std::fclose(file);
   return kExitOk;
 }
 
+int CheckInputFile(const char* command, const char* path) {
+  bool stream = false;
+  return CheckInput(command, path, InputUse::kTwice, &stream);
+}
+
+bool LogRequested() { return std::getenv("KELVANE_LOG") != nullptr; }
+
 int RefusedFile(const char* command, const char* path, int rating) {
-  return Failure(command, "%s: the plug-in refused it: rating %d (a Matroska file it can play rates %d)", path,
-                 rating, kAcceptedRating);
+  return RefusedFile(command, path, "the plug-in rated it " + std::to_string(rating) + "; a file it plays rates " +
+                                        std::to_string(kAcceptedRating));
+}
+
+int RefusedFile(const char* command, const char* path, const std::string& plugin_answer) {
+  struct stat status;
+  const bool regular = std::strcmp(path, "-") && stat(path, &status) == 0 && S_ISREG(status.st_mode);
+  std::string reason = regular ? reading::RefusalReason(path) : std::string();
+  if (reason.empty()) reason = "not a Matroska file the plug-in plays";
+  if (LogRequested()) return Failure(command, "%s: %s (%s)", path, reason.c_str(), plugin_answer.c_str());
+  return Failure(command, "%s: %s", path, reason.c_str());
 }
 
 bool ParseNumber(const char* text, unsigned long maximum, unsigned long* value) {

@@ -2,7 +2,12 @@
 
 #include <cmath>
 #include <cstdlib>
+#include <cstdio>
 #include <cstring>
+
+#include "tools/command_line.h"
+#include "tools/media_words.h"
+#include "tools/reading/header_reading.h"
 
 const char kControlUsage[] =
     "  --seek TIME[@AT]    seek to TIME seconds once playback reaches AT seconds (repeatable;\n"
@@ -84,4 +89,49 @@ int ParseControlOption(int argc, char** argv, int* i, host::RunnerOptions* run, 
   }
   if (std::strcmp(arg, "--trick-time") != 0) run->actions.push_back(action);
   return 1;
+}
+
+namespace {
+
+std::string Seconds(uint64_t us) {
+  char text[32];
+  std::snprintf(text, sizeof text, "%g", static_cast<double>(us) / 1e6);
+  return text;
+}
+
+// The action as its option was written: "--seek 10@2".
+std::string OptionOf(const host::ControlAction& action) {
+  const std::string at = action.at_us ? "@" + Seconds(action.at_us) : "";
+  switch (action.kind) {
+    case host::ControlAction::kSeek: return "--seek " + Seconds(action.time_us) + at;
+    case host::ControlAction::kScanForward: return "--ff " + std::to_string(action.speed) + at;
+    case host::ControlAction::kScanBackward: return "--rew " + std::to_string(action.speed) + at;
+    case host::ControlAction::kScanEnd: return "--scan-end " + Seconds(action.at_us);
+  }
+  return {};
+}
+
+}  // namespace
+
+void ReportControlResults(const char* command, const char* file, const std::vector<host::ControlAction>& actions,
+                          const std::vector<int>& results) {
+  std::optional<uint64_t> duration_ns;
+  for (size_t k = 0; k < actions.size(); ++k) {
+    const host::ControlAction& action = actions[k];
+    const std::string option = OptionOf(action);
+    if (k < results.size() && results[k] != 0) {
+      if (LogRequested()) {
+        std::fprintf(stderr, "kelvane %s: the plug-in refused %s (it answered %d)\n", command, option.c_str(), results[k]);
+      } else {
+        std::fprintf(stderr, "kelvane %s: the plug-in refused %s\n", command, option.c_str());
+      }
+      continue;
+    }
+    if (action.kind != host::ControlAction::kSeek) continue;
+    if (!duration_ns) duration_ns = reading::ReadHeaders(file, {true, false}).facts.info.DurationNs().value_or(0);
+    if (*duration_ns && action.time_us * 1000 >= *duration_ns) {
+      std::fprintf(stderr, "kelvane %s: %s is past the end of %s (duration %s): playback went on from its last cue point\n",
+                   command, option.c_str(), file, ClockTime(*duration_ns).c_str());
+    }
+  }
 }

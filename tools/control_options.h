@@ -9,6 +9,7 @@
 //   --trick-time MS    the "TrickTime" resource
 
 #include <string>
+#include <vector>
 
 #include "host/graph_runner.h"
 
@@ -19,3 +20,9 @@ extern const char kControlUsage[];
 // its last word; 0 when it is none; -1 when its value is missing or
 // malformed, with *error naming the option and what it takes.
 int ParseControlOption(int argc, char** argv, int* i, host::RunnerOptions* run, std::string* error);
+
+// After playback, on standard error: each action the plug-in refused, and
+// each seek past the end of `file` (the plug-in then goes on from its last
+// cue point), in words; the plug-in's answers only with KELVANE_LOG.
+void ReportControlResults(const char* command, const char* file, const std::vector<host::ControlAction>& actions,
+                          const std::vector<int>& results);

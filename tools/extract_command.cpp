@@ -21,10 +21,13 @@
 #include "platform/media_format.h"
 #include "tools/command_line.h"
 #include "tools/commands.h"
+#include "tools/damage_report.h"
 #include "tools/extract/channel_extractor.h"
-#include "tools/extract/track_facts.h"
+#include "tools/extract/header_outputs.h"
+#include "tools/extract/timestamp_recorder.h"
 #include "tools/extract/writer_choice.h"
 #include "tools/progress_bar.h"
+#include "tools/reading/header_reading.h"
 
 namespace {
 
@@ -33,14 +36,15 @@ constexpr unsigned long kMaxBufferSize = 64ul << 20;
 
 const std::string kExtractHelp =
     std::string(
-        "usage: kelvane extract FILE [-t TRACK]... -o DIR\n"
+        "usage: kelvane extract FILE [-t TRACK]... -o DIR [--timestamps]\n"
+        "       kelvane extract FILE [--attachments DIR] [--chapters FILE]\n"
         "\n"
         "Plays FILE through the plug-in as the framework does and writes each selected track\n"
         "to DIR/trackN.EXT (N: the Matroska track number, as 'kelvane info' and 'kelvane\n"
         "packets' print it), in a format that common players and decoders open:\n") +
     kWriterFormatsHelp +
-    "Header-stripped tracks come out with their stripped bytes put back and laced blocks\n"
-    "as their single frames. A raw track's NAME.index has one text line per packet:\n"
+    "Header-stripped tracks come out with their stripped bytes put back, zlib-compressed\n"
+    "tracks inflated, and laced blocks as their single frames. A raw track's NAME.index has one text line per packet:\n"
     "  config OFFSET SIZE          a decoder-configuration packet\n"
     "  frame OFFSET SIZE TIME_US   a frame and its presentation time in microseconds\n"
     "(OFFSET and SIZE in bytes of NAME.raw; lines starting with # are comments).\n"
@@ -48,22 +52,38 @@ const std::string kExtractHelp =
     "When standard error is a terminal a progress bar shows the bytes and frames\n"
     "written, the rate and the time left. Standard output gets one line per file.\n"
     "\n"
+    "FILE must be a regular file (not standard input or a pipe): the plug-in reads it\n"
+    "twice, to rate it and to play it.\n"
+    "\n"
+    "On damaged input every frame delivered is written all the same, and playback goes on\n"
+    "past the damage from the next cue point, as 'kelvane packets' does; standard error\n"
+    "says where frames are missing. A track the plug-in sets up no channel for (an\n"
+    "encrypted one) is named on standard error and left out.\n"
+    "\n"
     "options:\n"
     "  -t, --track TRACK  extract this track (repeatable, or TRACK,TRACK...);\n"
     "                     default: every track the plug-in offers\n"
     "  -o, --output DIR   the directory to write to (made, with its parents, when missing)\n"
+    "  --timestamps       also DIR/trackN.timestamps.txt: each frame's time in\n"
+    "                     milliseconds, ascending (timestamp format v2)\n"
+    "  --attachments DIR  write each attachment to DIR under its own file name\n"
+    "  --chapters FILE    write the chapters to FILE in the simple chapter format\n"
+    "                     (CHAPTER01=00:00:00.000, CHAPTER01NAME=...)\n"
     "  -q, --quiet        no progress bar\n"
     "  --buffer-size BYTES  bytes per input buffer (default 65536); small ones split\n"
     "                     frames across buffers, which must not change the files\n"
+    "  --no-recover       stop where the channels fail, rather than going on past the damage\n"
     "  --plugin PATH      the plug-in to load (default: kelvane.so beside this program)\n"
     "  -h, --help         this text\n"
     "\n"
-    "exit codes: 0 every file written; 1 the file cannot be read, the plug-in refused it,\n"
-    "or a file could not be written; 2 usage, or a track the file does not offer\n"
+    "exit codes: 0 every file written; 1 the file cannot be read, the plug-in refused it, it\n"
+    "is damaged (what was delivered is written), or a file could not be written; 2 usage,\n"
+    "or a track the file does not offer\n"
     "\n"
     "examples:\n"
     "  kelvane extract movie.mkv -o tracks\n"
-    "  kelvane extract movie.mkv -t 2 -o audio && ffplay audio/track2.aac\n";
+    "  kelvane extract movie.mkv -t 2 -o audio && ffplay audio/track2.aac\n"
+    "  kelvane extract movie.mkv --attachments fonts --chapters chapters.txt\n";
 
 struct Options {
   const char* file = nullptr;
@@ -71,8 +91,14 @@ struct Options {
   std::vector<uint64_t> tracks;
   std::string plugin = host::PluginBesideExecutable();
   bool quiet = false;
+  bool recover = true;
+  bool timestamps = false;
+  const char* attachments = nullptr;  // directory
+  const char* chapters = nullptr;     // file
   uint32_t buffer_size = host::RunnerOptions{}.input_buffer_size;
 };
+
+constexpr int kRecoveries = 4;  // times a file may be played on past damage, as packets does
 
 bool ParseTracks(const char* text, std::vector<uint64_t>* tracks) {
   std::string list(text);
@@ -101,7 +127,9 @@ int ParseOptions(int argc, char** argv, Options* options) {
     if (!std::strcmp(arg, "-t") || !std::strcmp(arg, "--track")) {
       const char* list = value(arg);
       if (!list) return kExitUsage;
-      if (!ParseTracks(list, &options->tracks)) return UsageError(kCommand, "bad track number '%s'", list);
+      if (!ParseTracks(list, &options->tracks)) {
+        return UsageError(kCommand, "%s: '%s' is not a list of track numbers like 1,3", arg, list);
+      }
     } else if (!std::strcmp(arg, "-o") || !std::strcmp(arg, "--output")) {
       if (!(options->directory = value(arg))) return kExitUsage;
     } else if (!std::strcmp(arg, "--plugin")) {
@@ -113,17 +141,27 @@ int ParseOptions(int argc, char** argv, Options* options) {
       unsigned long size = 0;
       if (!text) return kExitUsage;
       if (!ParseNumber(text, kMaxBufferSize, &size) || size == 0) {
-        return UsageError(kCommand, "bad buffer size '%s'", text);
+        return UsageError(kCommand, "--buffer-size: '%s' is not a number of bytes from 1 to %lu", text, kMaxBufferSize);
       }
       options->buffer_size = static_cast<uint32_t>(size);
     } else if (!std::strcmp(arg, "-q") || !std::strcmp(arg, "--quiet")) {
       options->quiet = true;
+    } else if (!std::strcmp(arg, "--no-recover")) {
+      options->recover = false;
+    } else if (!std::strcmp(arg, "--timestamps")) {
+      options->timestamps = true;
+    } else if (!std::strcmp(arg, "--attachments")) {
+      if (!(options->attachments = value(arg))) return kExitUsage;
+    } else if (!std::strcmp(arg, "--chapters")) {
+      if (!(options->chapters = value(arg))) return kExitUsage;
     } else if (int code = TakeFile(kCommand, arg, &options->file); code != kExitOk) {
       return code;
     }
   }
   if (!options->file) return UsageError(kCommand, "no FILE given");
-  if (!options->directory) return UsageError(kCommand, "no output directory given (-o DIR)");
+  if (!options->directory && !options->attachments && !options->chapters) {
+    return UsageError(kCommand, "no output directory given (-o DIR)");
+  }
   return -1;
 }
 
@@ -136,24 +174,37 @@ int DescribeChannels(const host::Plugin& plugin, const char* path, std::vector<C
   setup.configure_outputs = false;
   host::FilterGraph graph(plugin, *input, setup);
   if (!graph.rated()) return RefusedFile(kCommand, path, graph.rating());
-  std::vector<TrackFacts> tracks;
-  if (!ReadOfferedTracks(path, &tracks)) return Failure(kCommand, "%s: cannot read its track entries", path);
+  std::vector<reading::TrackFacts> tracks;
+  uint64_t timecode_scale = 0;
+  if (!reading::ReadOfferedTracks(path, &tracks, &timecode_scale)) return Failure(kCommand, "%s: cannot read its track entries", path);
   size_t next_track = 0;
   for (size_t k = 0; k < graph.outputs().size(); ++k) {
     const MmfMediaFormat& format = graph.outputs()[k].offered;
+    if (graph.outputs()[k].formats_offered == 0) {
+      std::fprintf(stderr, "kelvane %s: %s: channel %zu is not set up, its track is left out: %s\n", kCommand, path, k,
+                   graph.outputs()[k].not_set_up.c_str());
+      continue;
+    }
     if (format.fourcc == 0) continue;  // a channel record the plug-in left unused
     if (next_track >= tracks.size()) return Failure(kCommand, "%s: more channels than tracks", path);
-    const TrackFacts& track = tracks[next_track++];
+    const reading::TrackFacts& track = tracks[next_track++];
     ChannelFacts facts;
     facts.channel = static_cast<int32_t>(k);
     facts.track = track.number;
     facts.codec_id = track.codec_id;
     facts.fourcc = format.fourcc;
+    facts.default_duration_ns = track.default_duration_ns;
+    facts.timecode_scale_ns = timecode_scale;
+    for (const reading::ContentEncodingFacts& encoding : track.content_encodings) {
+      if (!encoding.compression || encoding.comp_algo != reading::kCompressionZlib) continue;
+      facts.zlib_frames = facts.zlib_frames || (encoding.scope & 1);
+      facts.zlib_private = facts.zlib_private || (encoding.scope & 2);
+    }
     facts.video = format.stream_type == static_cast<uint32_t>(kMmfStreamEncodedVideo);
     if (!facts.video) {
       facts.channels = format.media.audio.channels;
       facts.sample_rate = format.media.audio.sample_rate;
-      facts.bit_depth = track.bit_depth;
+      facts.bit_depth = static_cast<uint32_t>(track.bit_depth);
       facts.pcm_byte_order = format.pcm_byte_order;
     }
     channels->push_back(facts);
@@ -182,22 +233,6 @@ int SelectTracks(const Options& options, std::vector<ChannelFacts>* channels) {
   }
   *channels = std::move(chosen);
   return kExitOk;
-}
-
-// Like mkdir -p: the directory and any missing parents.
-int MakeDirectory(const char* path) {
-  std::string partial;
-  for (const char* p = path;; ++p) {
-    if ((*p == '/' || !*p) && !partial.empty() && mkdir(partial.c_str(), 0755) != 0 && errno != EEXIST) break;
-    if (!*p) {
-      struct stat status;
-      if (stat(path, &status) == 0 && S_ISDIR(status.st_mode)) return kExitOk;
-      errno = ENOTDIR;
-      break;
-    }
-    partial += *p;
-  }
-  return Failure(kCommand, "cannot make the directory %s: %s", path, std::strerror(errno));
 }
 
 struct Extraction {
@@ -233,24 +268,40 @@ int RunExtract(int argc, char** argv) {
   Options options;
   if (int code = ParseOptions(argc, argv, &options); code >= 0) return code;
   if (int code = CheckInputFile(kCommand, options.file); code != kExitOk) return code;
+  if (options.attachments || options.chapters) {
+    if (int code = ExtractFromHeaders(kCommand, options.file, options.attachments, options.chapters); code != kExitOk) {
+      return code;
+    }
+    if (!options.directory) return kExitOk;
+  }
   std::unique_ptr<host::Plugin> plugin = LoadPlugin(kCommand, options.plugin);
   if (!plugin) return kExitFailed;
   std::vector<ChannelFacts> channels;
   if (int code = DescribeChannels(*plugin, options.file, &channels); code != kExitOk) return code;
   if (int code = SelectTracks(options, &channels); code != kExitOk) return code;
   if (channels.empty()) return Failure(kCommand, "%s: the plug-in offers no track", options.file);
-  if (int code = MakeDirectory(options.directory); code != kExitOk) return code;
+  if (!MakeDirectories(options.directory)) {
+    return Failure(kCommand, "cannot make the directory %s: %s", options.directory, std::strerror(errno));
+  }
 
   ProgressBar progress(kCommand, FileSize(options.file), !options.quiet && ProgressBar::StderrIsTerminal());
   RunState state;
   host::RunnerOptions run;
   run.checksum = false;
   run.read_ahead = true;
+  run.catch_up = true;
+  run.recoveries = options.recover ? kRecoveries : 0;
   run.input_buffer_size = options.buffer_size;
   for (const ChannelFacts& facts : channels) {
     auto extraction = std::make_unique<Extraction>();
     extraction->facts = facts;
     extraction->chosen = ChooseWriter(facts, options.directory, &extraction->file);
+    if (options.timestamps) {
+      extraction->chosen.writer = std::make_unique<TimestampRecorder>(
+          &extraction->file, std::move(extraction->chosen.writer),
+          std::string(options.directory) + "/track" + std::to_string(facts.track) + ".timestamps.txt",
+          facts.default_duration_ns, facts.timecode_scale_ns);
+    }
     if (!extraction->file.Open(extraction->chosen.path)) {
       return Failure(kCommand, "%s", extraction->file.error().c_str());
     }
@@ -277,6 +328,11 @@ int RunExtract(int argc, char** argv) {
                 facts.codec_id.c_str(), path.c_str(), extraction->chosen.index_path.empty() ? "" : " + ",
                 extraction->chosen.index_path.c_str(), extraction->extractor->frames(), extraction->file.size());
   }
-  if (!result.ok) return Failure(kCommand, "%s: %s", options.file, result.error.c_str());
-  return code;
+  if (result.channels.empty()) return Failure(kCommand, "%s: %s", options.file, result.error.c_str());
+  std::vector<uint64_t> tracks;
+  for (const ChannelFacts& facts : channels) {
+    if (tracks.size() <= size_t(facts.channel)) tracks.resize(size_t(facts.channel) + 1);
+    tracks[size_t(facts.channel)] = facts.track;
+  }
+  return ReportDamage(kCommand, options.file, result, tracks) ? kExitFailed : code;
 }

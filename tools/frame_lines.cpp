@@ -5,7 +5,9 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cinttypes>
 #include <cstring>
+#include <string>
 #include <utility>
 
 #include "host/thread_placement.h"
@@ -316,9 +318,39 @@ bool CopyOut(FILE* spill, FILE* out) {
   return !std::ferror(spill);
 }
 
+// Copies lines, putting each gap's line before the line of the frame it came before.
+class GapsBetweenLines {
+ public:
+  GapsBetweenLines(FILE* out, const char* prefix, const std::vector<host::Gap>& gaps)
+      : out_(out), prefix_(prefix), gaps_(gaps) {}
+  void Put(const char* data, size_t n) {
+    const char* end = data + n;
+    while (data != end) {
+      PutGaps();
+      const char* newline = static_cast<const char*>(std::memchr(data, '\n', static_cast<size_t>(end - data)));
+      const char* stop = newline ? newline + 1 : end;
+      std::fwrite(data, 1, static_cast<size_t>(stop - data), out_);
+      lines_ += newline ? 1 : 0;
+      data = stop;
+    }
+  }
+  void PutGaps() {
+    for (; next_ < gaps_.size() && gaps_[next_].at <= lines_; ++next_) {
+      std::fprintf(out_, "%sgap %" PRIu64 " %" PRIu64 "\n", prefix_, gaps_[next_].from_us, gaps_[next_].to_us);
+    }
+  }
+
+ private:
+  FILE* out_;
+  const char* prefix_;
+  const std::vector<host::Gap>& gaps_;
+  size_t next_ = 0;
+  uint64_t lines_ = 0;
+};
+
 }  // namespace
 
-bool FrameLines::Write(int32_t index, FILE* out) {
+bool FrameLines::Write(int32_t index, FILE* out, const std::vector<host::Gap>& gaps) {
   if (index < 0 || static_cast<size_t>(index) >= channels_.size()) return true;
   Channel& channel = channels_[static_cast<size_t>(index)];
   {
@@ -328,7 +360,20 @@ bool FrameLines::Write(int32_t index, FILE* out) {
   Format(channel, channel.chunk.get(), channel.filled);  // what the sink gathered last
   channel.filled = 0;
   if (channel.failed) return false;
-  if (channel.spill && !CopyOut(channel.spill, out)) return false;
-  std::fwrite(channel.block.get(), 1, channel.used, out);
+  if (gaps.empty()) {
+    if (channel.spill && !CopyOut(channel.spill, out)) return false;
+    std::fwrite(channel.block.get(), 1, channel.used, out);
+    return true;
+  }
+  const std::string prefix(channel.prefix, channel.prefix_length);
+  GapsBetweenLines lines(out, prefix.c_str(), gaps);
+  if (channel.spill) {
+    if (std::fflush(channel.spill) != 0 || fseeko(channel.spill, 0, SEEK_SET) != 0) return false;
+    char chunk[65536];
+    for (size_t n; (n = std::fread(chunk, 1, sizeof chunk, channel.spill)) > 0;) lines.Put(chunk, n);
+    if (std::ferror(channel.spill)) return false;
+  }
+  lines.Put(channel.block.get(), channel.used);
+  lines.PutGaps();
   return true;
 }

@@ -36,9 +36,10 @@ class FrameLines {
   // in the room given are taken as they lie; any others are copied in.
   static void OnFrames(void* user, int32_t channel, const host::RunFrame* frames, size_t count);
 
-  // Writes channel `channel`'s lines to `out`, once its sink has stopped;
-  // false when a temporary file failed.
-  bool Write(int32_t channel, FILE* out);
+  // Writes channel `channel`'s lines to `out`, once its sink has stopped,
+  // with a line "CHANNEL TRACK gap FROM_US TO_US" before the frame each gap
+  // came before; false when a temporary file failed.
+  bool Write(int32_t channel, FILE* out, const std::vector<host::Gap>& gaps = {});
 
  private:
   // Storage for frames that are only ever copied in whole: not initialised first.

@@ -1,6 +1,8 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <string>
+#include <vector>
 
 #include "host/log_control.h"
 #include "tools/command_line.h"
@@ -15,8 +17,8 @@ struct Command {
 };
 
 const Command kCommands[] = {
-    {"extract", RunExtract, "write each channel of a file as a file players open (Annex B, ADTS, FLAC, Ogg, WAV...)"},
-    {"info", RunInfo, "list the EBML header, Segment Info, tracks, cues and tags of a Matroska file"},
+    {"extract", RunExtract, "write each track as a file players open (Annex B, ADTS, FLAC, Ogg, WAV...), attachments, chapters"},
+    {"info", RunInfo, "list a Matroska file's headers: tracks, chapters, attachments, tags (--tree: every element)"},
     {"metadata", RunMetadata, "print the metadata entries the plug-in offers for a file"},
     {"packets", RunPackets, "play a file through the plug-in and print every channel's frames"},
     {"probe", RunProbe, "connect the plug-in to a file (or - for standard input) and print its channels"},
@@ -42,9 +44,14 @@ void PrintUsage(FILE* out) {
                "  2  usage: an unknown command or option, a malformed value, a missing FILE, or a\n"
                "     track or channel the file does not offer\n"
                "\n"
+               "options are written --opt VALUE or --opt=VALUE; after --, every word is a FILE\n"
+               "(for a file whose name starts with -). kelvane --version prints the version.\n"
+               "\n"
                "environment:\n"
-               "  KELVANE_LOG=LEVEL  show the plug-in's log messages up to LEVEL on standard error:\n"
-               "                     2 failures (default), 3 also degraded results, 5 also notices\n"
+               "  KELVANE_LOG=LEVEL  show the plug-in's and the framework's own log messages up to\n"
+               "                     LEVEL on standard error, and the answer codes behind a\n"
+               "                     refusal: 2 failures, 3 also degraded results, 5 also notices\n"
+               "                     (unset: none; the tool says in words what went wrong)\n"
                "\n"
                "examples:\n"
                "  kelvane info movie.mkv\n"
@@ -59,14 +66,16 @@ const Command* Find(const char* name) {
   return nullptr;
 }
 
-// The plug-in's failures by default; its degraded results and notices only on request.
-constexpr int kDefaultLogLevel = 2;
+// The plug-in's own messages only on request: they speak the framework's
+// language, and the tool says in words what went wrong.
+constexpr int kDefaultLogLevel = 0;
+constexpr int kRequestedLogLevel = 2;
 
 void SetLogLevel() {
   const char* level = std::getenv("KELVANE_LOG");
-  unsigned long value = kDefaultLogLevel;
+  unsigned long value = level ? kRequestedLogLevel : kDefaultLogLevel;
   if (level && !ParseNumber(level, 9, &value)) {
-    std::fprintf(stderr, "kelvane: KELVANE_LOG='%s' is not a level from 0 to 9; using %d\n", level, kDefaultLogLevel);
+    std::fprintf(stderr, "kelvane: KELVANE_LOG='%s' is not a level from 0 to 9; using %d\n", level, kRequestedLogLevel);
   }
   host::SetLogThreshold(static_cast<int>(value));
 }
@@ -76,10 +85,38 @@ int UnknownCommand(const char* name) {
   return kExitUsage;
 }
 
+// The command's words as every command reads them: "--opt=value" becomes
+// "--opt" "value", and after "--" a FILE that starts with '-' is given as
+// "./-name", which no command takes for an option.
+std::vector<std::string> NormalWords(int argc, char** argv) {
+  std::vector<std::string> words;
+  bool files_only = false;
+  for (int i = 0; i < argc; ++i) {
+    const std::string word = argv[i];
+    if (files_only) {
+      words.push_back(word.size() > 1 && word[0] == '-' ? "./" + word : word);
+    } else if (word == "--") {
+      files_only = true;
+    } else if (word.rfind("--", 0) == 0 && word.find('=') != std::string::npos) {
+      words.push_back(word.substr(0, word.find('=')));
+      words.push_back(word.substr(word.find('=') + 1));
+    } else {
+      words.push_back(word);
+    }
+  }
+  return words;
+}
+
+int PrintVersion() {
+  std::printf("kelvane %s\n", KELVANE_VERSION);
+  return kExitOk;
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
   SetLogLevel();
+  if (argc >= 2 && (!std::strcmp(argv[1], "--version") || !std::strcmp(argv[1], "-V"))) return PrintVersion();
   if (argc < 2) {
     std::fprintf(stderr, "kelvane: no command given\n");
     PrintUsage(stderr);
@@ -100,5 +137,12 @@ int main(int argc, char** argv) {
   }
   const Command* command = Find(name);
   if (!command) return UnknownCommand(name);
-  return command->run(argc - 2, argv + 2);
+  std::vector<std::string> words = NormalWords(argc - 2, argv + 2);
+  std::vector<char*> command_argv;
+  for (std::string& word : words) {
+    if (word == "--version") return PrintVersion();
+    command_argv.push_back(word.data());
+  }
+  command_argv.push_back(nullptr);
+  return command->run(static_cast<int>(words.size()), command_argv.data());
 }

@@ -47,7 +47,6 @@ constexpr int kParseCannotSeek = 4002;   // its answer when the stream does not 
 
 const char* ParseFailure(int result) {
   switch (result) {
-    case kParseMalformed: return "not a Matroska file it can read";
     case kParseCannotSeek: return "the input cannot seek";
     default: return "the metadata parse failed";
   }
@@ -173,10 +172,10 @@ int RunMetadata(int argc, char** argv) {
 
   MmfMetadata* block = nullptr;
   int result = parser->Parser_ParseMetadata(stream->record(), 0, &block);
-  if (result != 0) {
-    return Failure("metadata", "%s: the plug-in refused it: %s (Parser_ParseMetadata answered %d)", file,
-                   ParseFailure(result), result);
+  if (result == kParseMalformed) {
+    return RefusedFile("metadata", file, "Parser_ParseMetadata answered " + std::to_string(result));
   }
+  if (result != 0) return Failure("metadata", "%s: %s", file, ParseFailure(result));
   std::vector<Entry> entries;
   int32_t index = 0;
   char* key = nullptr;

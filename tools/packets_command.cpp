@@ -13,22 +13,17 @@
 #include <string>
 #include <vector>
 
-#include "core/codec_table.h"
-#include "core/file_model.h"
-#include "core/header/element_walker.h"
-#include "core/memory.h"
-#include "core/metadata_list.h"
-#include "core/status.h"
 #include "host/graph_runner.h"
-#include "host/input_streams.h"
 #include "host/plugin_loader.h"
 #include "host/thread_placement.h"
-#include "stream/mkvvstream.h"
 #include "tools/command_line.h"
 #include "tools/commands.h"
 #include "tools/control_options.h"
+#include "tools/damage_report.h"
 #include "tools/frame_lines.h"
 #include "tools/json_writer.h"
+#include "tools/playback_limits.h"
+#include "tools/reading/header_reading.h"
 
 const char kPacketsHelp[] =
     "usage: kelvane packets [OPTIONS] FILE\n"
@@ -46,35 +41,48 @@ const char kPacketsHelp[] =
     "  CHANNEL TRACK seek\n"
     "marks where each seek or scan jump took effect.\n"
     "\n"
+    "On damaged input every frame delivered is printed all the same. When a channel fails\n"
+    "and the file has cue points, playback goes on from the first cue point after the\n"
+    "furthest frame delivered (at most 4 times), and a line\n"
+    "  CHANNEL TRACK gap FROM_US TO_US\n"
+    "marks where frames are missing; standard error says where each channel failed or\n"
+    "stopped, and whether the file ended inside a Cluster. A track the plug-in sets up no\n"
+    "channel for (an encrypted one) is named on standard error and left out.\n"
+    "\n"
     "options:\n"
     "  --channels K,K,...  output channels to acquire, by index (default: all)\n"
     "  --buffer-size BYTES\n"
     "                      bytes per input buffer, 1 to 67108864 (default 65536)\n"
     "  --no-hash           no Adler-32 of the frames (the channel threads then share one core)\n"
     "  --json              one JSON document instead of lines (docs/json.md, section packets)\n"
+    "  --no-recover        stop where the channels fail, rather than going on past the damage\n"
     "  --plugin PATH       the plug-in to load (default: kelvane.so beside this program)\n"
     "  -h, --help          this text\n"
     "playback control:\n"
     "%s"
+    "%s"
     "\n"
     "exit codes: 0 every channel played to its end; 1 the plug-in refused the file, it cannot\n"
-    "be read, or a channel ended with an error; 2 usage, including a channel the file does not\n"
-    "offer. A control action the plug-in refused is reported on standard error (exit code 0).\n"
+    "be read, or it is damaged (a channel failed or stopped, or the file ends inside a Cluster:\n"
+    "what was delivered is printed); 2 usage, including a channel the file does not offer. A\n"
+    "control action the plug-in refused is reported on standard error (exit code 0).\n"
     "\n"
     "examples:\n"
     "  kelvane packets movie.mkv\n"
     "  kelvane packets --channels 1 --no-hash movie.mkv\n"
     "  kelvane packets --seek 10@2 --preroll movie.mkv       # seek to 10 s once playback reaches 2 s\n"
-    "  kelvane packets --ff 400@1 --trick-time 500 movie.mkv # fast forward from 1 s\n";
+    "  kelvane packets --ff 400@1 --trick-time 500 movie.mkv # fast forward from 1 s\n"
+    "  kelvane packets --seek 600 --frames 3 movie.mkv        # where a seek to 10 min lands\n";
 
 namespace {
 
-constexpr int64_t kHeaderBufferSize = 480;
 constexpr int kSchemaVersion = 1;
+constexpr int kRecoveries = 4;  // times a file may be played on past damage
 constexpr unsigned long kMaxBufferSize = 64ul << 20;
 
 struct Options {
   host::RunnerOptions run;
+  LimitOptions limits;
   bool json = false;
   const char* file = nullptr;
   std::string plugin_path = host::PluginBesideExecutable();
@@ -101,11 +109,13 @@ int ParseOptions(int argc, char** argv, Options* options) {
   for (int i = 0; i < argc; ++i) {
     const char* arg = argv[i];
     if (IsHelpOption(arg)) {
-      std::printf(kPacketsHelp, kControlUsage);
+      std::printf(kPacketsHelp, kControlUsage, kLimitUsage);
       return kExitOk;
     }
     std::string error;
-    if (int taken = ParseControlOption(argc, argv, &i, &options->run, &error); taken != 0) {
+    int taken = ParseControlOption(argc, argv, &i, &options->run, &error);
+    if (taken == 0) taken = ParseLimitOption(argc, argv, &i, &options->limits, &error);
+    if (taken != 0) {
       if (taken < 0) return UsageError("packets", "%s", error.c_str());
       continue;
     }
@@ -114,6 +124,8 @@ int ParseOptions(int argc, char** argv, Options* options) {
     if (takes_value && i + 1 >= argc) return UsageError("packets", "%s needs a value", arg);
     if (!std::strcmp(arg, "--json")) {
       options->json = true;
+    } else if (!std::strcmp(arg, "--no-recover")) {
+      options->run.recoveries = 0;
     } else if (!std::strcmp(arg, "--no-hash")) {
       options->run.checksum = false;
     } else if (!std::strcmp(arg, "--buffer-size")) {
@@ -142,25 +154,21 @@ int ParseOptions(int argc, char** argv, Options* options) {
 }
 
 // Track numbers of the offered tracks: the plug-in offers one channel per
-// track with a supported codec, in file order.
+// track with a supported codec that is not encrypted, in file order. The
+// encrypted ones are said on standard error.
 std::vector<uint64_t> OfferedTracks(const char* path) {
   std::vector<uint64_t> tracks;
-  auto input = host::OpenFileStream(path, true);
-  mkvvstream stream;
-  if (!input || mkvvstream_init(&stream, input->record(), kHeaderBufferSize, 1, kFillWithRead, 1) != 0) return tracks;
-  static mkv_file_info info;  // large: keep it off the stack
-  std::memset(&info, 0, sizeof info);
-  mkv_parse_limits limits{kDefaultMaxStringSize, 1};
-  info.parse_limits = &limits;
-  info.metadata = mem_new_zeroed<mkv_metadata_list>();
-  if (info.metadata && parse_mkvfile(&info, &stream) == kParseSucceeded) {
-    for (uint32_t i = 0; i < info.track_count && i < kMaxTracks; ++i) {
-      if (lookup_codec_fourcc(info.tracks[i].codec_id) != 0) tracks.push_back(info.tracks[i].track_number);
+  reading::HeaderReading reading = reading::ReadHeaders(path, {true, false});
+  if (reading.ok) {
+    for (const reading::TrackFacts& track : reading.facts.tracks) {
+      if (track.offered_fourcc) {
+        tracks.push_back(track.number);
+      } else if (track.encrypted) {
+        std::fprintf(stderr, "kelvane packets: %s: track %" PRIu64 " (%s) is left out: it is encrypted\n", path,
+                     track.number, track.codec_id.c_str());
+      }
     }
   }
-  if (info.metadata) FreeMetadata(info.metadata);
-  destroy_mkv_file_info(&info);
-  mkvvstream_destroy(&stream);
   return tracks;
 }
 
@@ -177,7 +185,8 @@ std::string FourCC(uint32_t code) {
   return text;
 }
 
-void PrintLines(const host::RunResult& result, const std::vector<uint64_t>& tracks, bool hash) {
+// The frame lines and their marks come from the kept frames, unless `lines` wrote them.
+void PrintLines(const host::RunResult& result, const std::vector<uint64_t>& tracks, bool hash, bool kept) {
   for (const host::ChannelRun& run : result.channels) {
     for (const host::RunFrame& packet : run.config) {
       std::printf("%d %" PRIu64 " config %u", run.index, TrackOf(run, tracks), packet.size);
@@ -186,18 +195,26 @@ void PrintLines(const host::RunResult& result, const std::vector<uint64_t>& trac
     }
   }
   for (const host::ChannelRun& run : result.channels) {
+    if (!kept) break;
     const uint64_t track = TrackOf(run, tracks);
-    size_t next_seek = 0;
-    for (size_t i = 0; i < run.frames.size(); ++i) {
-      const host::RunFrame& frame = run.frames[i];
-      for (; next_seek < run.seeks.size() && run.seeks[next_seek] == i; ++next_seek) {
+    size_t next_seek = 0, next_gap = 0;
+    auto marks_before = [&](size_t i) {
+      for (; next_seek < run.seeks.size() && run.seeks[next_seek] <= i; ++next_seek) {
         std::printf("%d %" PRIu64 " seek\n", run.index, track);
       }
+      for (; next_gap < run.gaps.size() && run.gaps[next_gap].at <= i; ++next_gap) {
+        const host::Gap& gap = run.gaps[next_gap];
+        std::printf("%d %" PRIu64 " gap %" PRIu64 " %" PRIu64 "\n", run.index, track, gap.from_us, gap.to_us);
+      }
+    };
+    for (size_t i = 0; i < run.frames.size(); ++i) {
+      const host::RunFrame& frame = run.frames[i];
+      marks_before(i);
       std::printf("%d %" PRIu64 " %" PRIu64 " %u", run.index, track, frame.time_us, frame.size);
       if (hash) std::printf(" %08x", frame.adler32);
       std::printf("\n");
     }
-    for (; next_seek < run.seeks.size(); ++next_seek) std::printf("%d %" PRIu64 " seek\n", run.index, track);
+    marks_before(SIZE_MAX);
   }
 }
 
@@ -220,6 +237,14 @@ void WriteJson(const char* file, const host::RunResult& result, const std::vecto
   out.Field("schema_version", kSchemaVersion);
   out.Field("command", "packets");
   out.Field("file", file);
+  out.FieldOrNull("error", result.ok ? nullptr : result.error.c_str());
+  uint64_t cluster = 0, size = 0;
+  out.Key("ended_inside_cluster");
+  if (EndsInsideCluster(file, result.first_cluster, &cluster, &size)) {
+    out.Uint(cluster);
+  } else {
+    out.Null();
+  }
   out.Key("control_results");
   out.BeginArray(true);
   for (int answer : result.control_results) out.Int(answer);
@@ -240,6 +265,19 @@ void WriteJson(const char* file, const host::RunResult& result, const std::vecto
     out.BeginArray(true);
     for (size_t at : run.seeks) out.Uint(at);
     out.EndArray();
+    out.Key("gaps");
+    out.BeginArray();
+    for (const host::Gap& gap : run.gaps) {
+      out.BeginObject(true);
+      out.Field("at", gap.at);
+      out.Field("from_us", gap.from_us);
+      out.Field("to_us", gap.to_us);
+      out.Field("after_byte", gap.after_byte);
+      out.EndObject();
+    }
+    out.EndArray();
+    out.Field("end_result", run.end_result);
+    out.Field("last_byte", run.frame_end);
     out.Key("frames");
     out.BeginArray();
     for (const host::RunFrame& frame : run.frames) WriteFrame(out, frame, hash, false);
@@ -265,15 +303,26 @@ std::string ChannelList(const std::vector<uint64_t>& tracks) {
 int RunPackets(int argc, char** argv) {
   Options options;
   options.run.read_ahead = true;  // the streamer reads on while the channels parse
+  options.run.catch_up = true;
+  options.run.recoveries = kRecoveries;
   if (int code = ParseOptions(argc, argv, &options); code >= 0) return code;
   // Without checksums a sink does next to nothing of its own: its thread is
   // one of the channel threads that take turns under the plug-in's lock, and
   // those run best side by side on one core.
   options.run.channels_share_core = !options.run.checksum;
   const char* file = options.file;
-  if (int code = CheckInputFile("packets", file); code != kExitOk) return code;
+  // With --json a failure still gives one document: the error, and what was delivered.
+  host::RunResult result;
+  auto failed = [&](int code, std::string error) {
+    if (options.json) {
+      result.error = error;
+      WriteJson(file, result, {}, options.run.checksum);
+    }
+    return code;
+  };
+  if (int code = CheckInputFile("packets", file); code != kExitOk) return failed(code, "the file cannot be read");
   auto plugin = LoadPlugin("packets", options.plugin_path);
-  if (!plugin) return kExitFailed;
+  if (!plugin) return failed(kExitFailed, "the plug-in cannot be loaded");
 
   std::vector<uint64_t> tracks = OfferedTracks(file);
   for (int32_t k : options.run.channels) {
@@ -293,23 +342,30 @@ int RunPackets(int argc, char** argv) {
     options.run.user = lines.get();
     options.run.keep_frames = false;
   }
-  host::RunResult result = host::RunGraph(*plugin, file, options.run);
-  if (!result.ok) {
-    if (result.rating != kAcceptedRating) return RefusedFile("packets", file, result.rating);
-    if (result.error.rfind("no output channel ", 0) == 0) {
-      return UsageError("packets", "--channels: %s has %s", file, result.error.c_str());
-    }
-    return Failure("packets", "%s: %s", file, result.error.c_str());
+  std::vector<int32_t> playing = options.run.channels;
+  if (playing.empty()) {
+    for (size_t k = 0; k < tracks.size(); ++k) playing.push_back(static_cast<int32_t>(k));
   }
-  for (size_t k = 0; k < result.control_results.size(); ++k) {
-    if (result.control_results[k] != 0) {
-      std::fprintf(stderr, "kelvane packets: control action %zu answered %d\n", k + 1, result.control_results[k]);
-    }
+  PlaybackLimits limits(options.limits, playing);
+  limits.Apply(&options.run);
+  result = host::RunGraph(*plugin, file, options.run);
+  limits.Settle(&result);
+  if (result.rating != kAcceptedRating) {
+    return failed(RefusedFile("packets", file, result.rating), "the plug-in refused the file");
   }
+  if (result.error.rfind("no output channel ", 0) == 0) {
+    return UsageError("packets", "--channels: %s has %s", file, result.error.c_str());
+  }
+  // Once playback began, what was delivered is printed, damage or not.
+  if (result.channels.empty()) {
+    return failed(Failure("packets", "%s: %s", file, result.error.c_str()), result.error.c_str());
+  }
+  ReportControlResults("packets", file, options.run.actions, result.control_results);
   options.json ? WriteJson(file, result, tracks, options.run.checksum)
-               : PrintLines(result, tracks, options.run.checksum);  // with `lines`: only the configurations
+               : PrintLines(result, tracks, options.run.checksum, !lines);
   for (const host::ChannelRun& run : result.channels) {
-    if (lines && !lines->Write(run.index, stdout)) return Failure("packets", "cannot write the frame lines");
+    if (lines && !lines->Write(run.index, stdout, run.gaps)) return Failure("packets", "cannot write the frame lines");
   }
-  return kExitOk;
+  std::fflush(stdout);
+  return ReportDamage("packets", file, result, tracks) ? kExitFailed : kExitOk;
 }

@@ -17,6 +17,7 @@
 #include "tools/command_line.h"
 #include "tools/commands.h"
 #include "tools/json_writer.h"
+#include "tools/probe_notes.h"
 
 const char kProbeHelp[] =
     "usage: kelvane probe [--json] [--plugin PATH] FILE\n"
@@ -27,9 +28,11 @@ const char kProbeHelp[] =
     "each output channel (one per track with a codec it supports) with its format: the\n"
     "four-character code, the picture size and frame rate or the channels and sample rate,\n"
     "the size of the codec's extra data, and the answers of acquiring and configuring it.\n"
+    "A channel counted for a track that the plug-in then left out (an encrypted one) offers\n"
+    "no format: it is shown as not set up, with the reason the plug-in logged.\n"
     "The decoder-configuration packets are delivered at playback: see 'kelvane packets'.\n"
     "\n"
-    "FILE may be - for standard input, an input that cannot seek.\n"
+    "FILE may be - for standard input, or a pipe or FIFO: an input that cannot seek.\n"
     "\n"
     "options:\n"
     "  --json           one JSON document instead of text (docs/json.md, section probe)\n"
@@ -98,6 +101,10 @@ void PrintChannelText(const host::OutputChannelSetup& setup, size_t index) {
   const MmfMediaFormat& format = channel.Format;
   std::printf("  channel %zu:\n", index);
   std::printf("    name: %s\n", channel.Name ? channel.Name : "");
+  if (setup.formats_offered == 0) {
+    std::printf("    set_up: no\n    reason: %s\n", setup.not_set_up.c_str());
+    return;
+  }
   std::printf("    fourcc: %s\n", FourCc(format.fourcc).c_str());
   std::printf("    stream_type: 0x%08" PRIX32 "\n", format.stream_type);
   if (IsVideo(format)) {
@@ -137,6 +144,12 @@ void WriteChannelJson(JsonWriter& out, const host::OutputChannelSetup& setup, si
   out.BeginObject();
   out.Field("index", index);
   out.Field("name", channel.Name ? channel.Name : "");
+  out.Field("set_up", setup.formats_offered > 0);
+  if (setup.formats_offered == 0) {
+    out.Field("reason", setup.not_set_up);
+    out.EndObject();
+    return;
+  }
   out.Field("fourcc", FourCc(format.fourcc));
   out.Field("stream_type", format.stream_type);
   out.Field("media", IsVideo(format) ? "video" : "audio");
@@ -213,11 +226,11 @@ int RunProbe(int argc, char** argv) {
     }
   }
   if (!file) return UsageError("probe", "no FILE given");
-  if (int code = CheckInputFile("probe", file); code != kExitOk) return code;
+  bool from_stream = false;  // standard input, a FIFO or a pipe: read once, never seeks
+  if (int code = CheckInput("probe", file, InputUse::kOnce, &from_stream); code != kExitOk) return code;
   std::unique_ptr<host::Plugin> plugin = LoadPlugin("probe", plugin_path);
   if (!plugin) return kExitFailed;
-  const bool from_stdin = !std::strcmp(file, "-");
-  auto stream = host::OpenFileStream(file, !from_stdin);
+  auto stream = host::OpenFileStream(file, !from_stream);
   if (!stream) return Failure("probe", "cannot open %s", file);
 
   // The input channel is connected to a file streamer over the same input,
@@ -250,5 +263,6 @@ int RunProbe(int argc, char** argv) {
     report.channels = graph.outputs();
   }
   json ? WriteJson(report) : PrintText(report);
+  if (!json && report.rated && !from_stream) PrintCompressionNotes(file);
   return report.rated ? kExitOk : RefusedFile("probe", file, report.rating);
 }

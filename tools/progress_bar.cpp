@@ -1,16 +1,28 @@
 #include "tools/progress_bar.h"
 
+#include <sys/ioctl.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cinttypes>
 #include <cstdio>
+#include <cstring>
 #include <string>
 
 namespace {
 
 constexpr auto kRedrawInterval = std::chrono::milliseconds(200);
-constexpr int kBarWidth = 24;
+constexpr size_t kBarWidth = 24;     // the widest bar
+constexpr size_t kNarrowestBar = 8;  // below this the bar is left out
+constexpr size_t kDefaultColumns = 80;
+
+// Columns of the terminal on standard error, asked at every redraw so that a
+// resized window is followed.
+size_t TerminalColumns() {
+  winsize size{};
+  if (ioctl(STDERR_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0) return size.ws_col;
+  return kDefaultColumns;
+}
 
 std::string Amount(double bytes) {
   const char* units[] = {"B", "KiB", "MiB", "GiB", "TiB"};
@@ -81,17 +93,44 @@ void ProgressBar::Draw(bool done) {
   // finished run is full whatever the count says.
   double fraction = done ? 1.0 : total_ ? std::min(1.0, static_cast<double>(bytes) / static_cast<double>(total_)) : 0;
   const double rate = elapsed > 0 ? static_cast<double>(bytes) / elapsed : 0;
-  std::string bar(kBarWidth, '-');
-  for (int i = 0; i < static_cast<int>(fraction * kBarWidth + 0.5) && i < kBarWidth; ++i)
-    bar[static_cast<size_t>(i)] = '#';
   std::string left = "--:--";
   if (done) {
     left = "0:00";
   } else if (rate > 0 && total_ > bytes) {
     left = Duration(static_cast<double>(total_ - bytes) / rate);
   }
-  std::fprintf(stderr, "\r%s [%s] %3d%%  %s  %" PRIu64 " frames  %s/s  %s left\x1b[K%s", label_, bar.c_str(),
-               static_cast<int>(fraction * 100), Amount(static_cast<double>(bytes)).c_str(), frames,
-               Amount(rate).c_str(), left.c_str(), done ? "\n" : "");
+  char percent[8];
+  std::snprintf(percent, sizeof percent, "%3d%%", static_cast<int>(fraction * 100));
+  // The line never reaches the last column, so the terminal does not wrap
+  // it and each redraw overwrites the one before. A narrow bar and the parts
+  // most wanted come first (percentage, bytes, time left, rate, frames); a
+  // bar of up to its full width takes what room is left.
+  const std::string parts[] = {std::string(percent), Amount(static_cast<double>(bytes)),
+                               std::to_string(frames) + " frames", Amount(rate) + "/s", left + " left"};
+  const size_t wanted[] = {0, 1, 4, 3, 2};
+  const size_t width = TerminalColumns() - 1;
+  const size_t bar_frame = 3;  // " [" and "]"
+  size_t used = std::strlen(label_) + bar_frame + kNarrowestBar;
+  const bool with_bar = used + 1 + parts[0].size() <= width;
+  if (!with_bar) used = std::strlen(label_);
+  bool kept[5] = {};
+  for (size_t index : wanted) {
+    const size_t cost = (index == 0 ? 1 : 2) + parts[index].size();
+    if (used + cost > width) break;
+    kept[index] = true;
+    used += cost;
+  }
+  std::string line = label_;
+  if (with_bar) {
+    const size_t bar_width = std::min(kBarWidth, kNarrowestBar + (width - used));
+    std::string bar(bar_width, '-');
+    const auto filled = static_cast<size_t>(fraction * static_cast<double>(bar_width) + 0.5);
+    for (size_t i = 0; i < filled && i < bar_width; ++i) bar[i] = '#';
+    line += " [" + bar + "]";
+  }
+  for (size_t index = 0; index < 5; ++index) {
+    if (kept[index]) line += (index == 0 ? " " : "  ") + parts[index];
+  }
+  std::fprintf(stderr, "\r%s\x1b[K%s", line.c_str(), done ? "\n" : "");
   std::fflush(stderr);
 }

@@ -166,6 +166,15 @@ int parse_mkvcluster(mkvinbuff* inbuff1, mkvinbuff* inbuff2, mkvcluster* cluster
   }
 }
 
+cluster_answer mkvcluster_answer(const mkvcluster* cluster, int result) {
+  if (result == kClusterBlockReady || result == kClusterSkip) return cluster_answer::done;
+  // Every read cut by the end of the buffers leaves its step behind; an
+  // invalid byte ends the read it was in.
+  const bool ran_out = cluster->resume.step != mkv_resume_step::none;
+  if ((result == kClusterChildShort || result == kClusterHeaderFailed) && ran_out) return cluster_answer::need_more_data;
+  return cluster_answer::error;
+}
+
 bool mkvcluster_inside_element(const mkvcluster* cluster) {
   const mkv_cluster_resume& resume = cluster->resume;
   switch (resume.step) {

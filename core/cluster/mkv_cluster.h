@@ -83,6 +83,17 @@ static_assert(std::is_standard_layout_v<mkvcluster> && std::is_trivially_copyabl
 // destroy_mkvcluster before each call: it frees the previous block's table.
 [[nodiscard]] int parse_mkvcluster(mkvinbuff* inbuff1, mkvinbuff* inbuff2, mkvcluster* cluster, uint64_t* skip);
 
+// What an answer of parse_mkvcluster means to its caller. -1 and -2 each stand
+// for two things, told apart by the record: the buffers ran out (the record
+// waits inside a read, and the next call with the bytes that follow goes on
+// from there) or bytes that cannot be read (the record waits for nothing).
+enum class cluster_answer : uint8_t {
+  done,            // 0, a block header; -3, a skip
+  need_more_data,  // -1 or -2 with a read left open
+  error,           // -1 or -2 on bytes that cannot be read, -4, -5
+};
+[[nodiscard]] cluster_answer mkvcluster_answer(const mkvcluster* cluster, int result);
+
 // Called with the ID and size of a SimpleBlock (0xA3) or BlockGroup (0xA0)
 // whose header was just read: 0, -6 for a BlockGroup without a (further)
 // Block, or a failure. `skip` is not used. Any other ID gives -4.

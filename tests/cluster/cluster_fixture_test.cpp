@@ -5,6 +5,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <string>
 #include <vector>
 
@@ -49,18 +50,37 @@ std::vector<std::string> Driven(const std::vector<uint8_t>& file, const DriveOpt
 
 class ClusterFixtureTest : public testing::TestWithParam<std::string> {};
 
+// A damaged fixture is read as mkvinfo lists it, whole when the damage reads
+// as elements to pass over (a block size that claims too much), else up to
+// the damage, ending with the parser's answer there: a cut file inside the
+// block it cuts short (waiting for more data), zeroed bytes with an error.
+// mkvinfo's next block after those opens the Cluster of a cue point.
 TEST_P(ClusterFixtureTest, EveryBufferSizeGivesTheMkvinfoBlockList) {
-  auto expected = testing_support::LoadFixture(GetParam()).blocks;
+  const testing_support::FixtureExpectation fx = testing_support::LoadFixture(GetParam());
   auto file = testing_support::ReadFixtureBytes(GetParam());
   ASSERT_FALSE(file.empty());
+  const bool cut = fx.damaged_at == file.size();
   int64_t live_before = host::LiveBlockCount();
   for (size_t size : {size_t{1}, size_t{2}, size_t{3}, size_t{7}, size_t{64}, size_t{4096}, size_t{32768}, file.size()}) {
     for (bool group_tail : {true, false}) {
+      SCOPED_TRACE(testing::Message() << "in buffers of " << size << (group_tail ? "" : ", group tails left to the parser"));
       DriveOptions options;
       options.buffer_sizes = {size};
       options.read_group_tail = group_tail;
-      ASSERT_EQ(Driven(file, options), Listed(expected, group_tail))
-          << "in buffers of " << size << (group_tail ? "" : ", group tails left to the parser");
+      std::vector<std::string> driven = Driven(file, options), listed = Listed(fx.blocks, group_tail);
+      if (fx.damaged_at && driven.back() != "complete") {
+        ASSERT_EQ(driven.back(), cut ? "ended inside an element" : "failed with -2");
+        driven.erase(driven.end() - (cut ? 2 : 1), driven.end());
+        const size_t read = driven.size();
+        ASSERT_LE(read + (cut ? 0 : 1), fx.blocks.size());
+        if (!cut) {
+          const auto& next = fx.blocks[read];
+          EXPECT_TRUE(next.key && std::any_of(fx.cues.begin(), fx.cues.end(),
+                                              [&](const auto& cue) { return int64_t(cue.time_ticks) == next.ticks; }));
+        }
+        listed.resize(cut ? fx.blocks.size() : read);
+      }
+      ASSERT_EQ(driven, listed);
     }
   }
   EXPECT_EQ(host::LiveBlockCount(), live_before);

@@ -96,7 +96,10 @@ void expect_track_matches(const mkv_track_info& track, const ExpectedTrack& want
     EXPECT_EQ(config.bits_per_sample, want.flac_bits);
   }
   const uint32_t fourcc = lookup_codec_fourcc(track.codec_id);
-  if (want.type != "video" || (fourcc != fourcc_value("AVC1") && fourcc != fourcc_value("MP4V")) || !track.codec_private) return;
+  // A Video for Windows track's CodecPrivate is a BITMAPINFOHEADER, which the framework's parser does not read.
+  if (want.type != "video" || (fourcc != fourcc_value("AVC1") && fourcc != fourcc_value("MP4V")) || !track.codec_private ||
+      want.codec == "V_MS/VFW/FOURCC")
+    return;
   MmDecoderConfigInfo config = {0, 0, 1, 1};
   EXPECT_EQ(MmParseDecoderConfig(track.codec_private, track.codec_private_size, fourcc, &config, 0), 0);
   EXPECT_EQ(config.Width, want.width);

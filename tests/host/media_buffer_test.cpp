@@ -49,7 +49,7 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
   input.Kind = kMmfChannelKind;
   input.Direction = kMmfDirectionInput;
   MmfPoolBuffer *a = nullptr, *b = nullptr, *c = nullptr, *held = nullptr;
-  MmfMra *mra = nullptr, *none = nullptr, *from_channel = nullptr;
+  MmfMra *mra = nullptr, *none = nullptr, *from_channel = nullptr, *small = nullptr;
   MmfMraPool* channel_pool = nullptr;
   MmfReadList* list = nullptr;
   MmfClock* clock_handle = nullptr;
@@ -126,7 +126,7 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
       {"channel pool", [&] { return MmfAllocateMraPool(&channel_pool, &channel, 600); }, 0},
       {"channel pool: as many as the format's buffers", [&] { return host::MraPoolFreeCount(channel_pool); }, 3},
       {"channel pool: a buffer", [&] { return MmfAcquireMra(channel_pool, &from_channel, 0); }, 0},
-      {"channel pool: of the capacity", [&] { return from_channel->Capacity; }, 600},
+      {"channel pool: a decoder's few frames, not the 600 asked for", [&] { return from_channel->Capacity; }, host::kOutputBufferElements},
       {"channel pool: a pool buffer", [&] { return (held = Acquire(one)) != nullptr; }, 1},
       {"channel pool: buffer on the pool buffer", [&] { return MmfSetMraBufferElement(from_channel, 0, held, held->Data, 16); }, 0},
       {"channel pool: the pool buffer's acquirer lets go", [&] { return Ops().ReleaseBuffer(held); }, 0},
@@ -135,6 +135,10 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
       {"channel pool: which gives back its pool buffer", [&] { return one.FreeCount(); }, 1},
       {"channel pool: when the format names no buffers", [&] { return channel.Format.buffer_count = 0, MmfAllocateMraPool(&channel_pool, &channel, 8); }, 0},
       {"channel pool: one buffer", [&] { return host::MraPoolFreeCount(channel_pool); }, 1},
+      {"channel pool: its one buffer", [&] { return MmfAcquireMra(channel_pool, &small, kMmfAcquireNoWait); }, 0},
+      {"channel pool: of the capacity asked for", [&] { return small->Capacity; }, 8},
+      {"channel pool: no second", [&] { return MmfAcquireMra(channel_pool, &none, kMmfAcquireNoWait); }, 11},
+      {"channel pool: its one buffer released", [&] { return MmfReleaseMra(small); }, 0},
       {"channel pool: freed", [&] { return MmfFreeMraPool(channel_pool); }, 0},
       {"streamer: next buffer of another channel", [&] { return host::FileStreamer::Ops()->NextBuffer(&other, &mra); }, 22},
       {"streamer: next buffer into nothing", [&] { return host::FileStreamer::Ops()->NextBuffer(streamer.output(), nullptr); }, 22},

@@ -8,6 +8,7 @@
 
 #include "host/memory_pools.h"
 #include "tests/plugin/graph_harness.h"
+#include "tests/support/log_recorder.h"
 
 namespace {
 
@@ -15,7 +16,7 @@ using plugin_test::Connected;
 using plugin_test::ConnectFile;
 using plugin_test::HostPlugin;
 
-enum class Op { kAcquire, kRelease, kSetFormat, kSetPool };
+enum class Op { kAcquire, kRelease, kSetFormat, kSetPool, kNextBuffer, kReadList };
 
 struct Step {
   Op op;
@@ -25,6 +26,8 @@ struct Step {
 struct Sequence {
   const char* name;
   std::vector<Step> steps;
+  const char* fixture = "avc_aac";
+  int32_t channel = 0;
 };
 
 // avc_aac offers two channels; nothing is acquired by the set-up.
@@ -42,28 +45,51 @@ TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {
       {"format once per lifetime",
        {{Op::kAcquire, 0}, {Op::kSetFormat, 0}, {Op::kSetFormat, 4016}, {Op::kRelease, 0}, {Op::kAcquire, 0},
         {Op::kSetFormat, 4016}, {Op::kSetPool, 0}, {Op::kRelease, 0}}},
+      // The record counted for the encrypted track: nothing to play, every operation refused.
+      {"a record without a track",
+       {{Op::kAcquire, 4044}, {Op::kSetFormat, 4044}, {Op::kSetPool, 4044}, {Op::kNextBuffer, 4044},
+        {Op::kReadList, 4044}, {Op::kRelease, 4044}},
+       "encrypted_aac", 1},
   };
   const MmfMediaOutputOps& ops = *HostPlugin().output();
   host::MemoryPool pool(4096, 4);
   for (const Sequence& sequence : sequences) {
     SCOPED_TRACE(sequence.name);
-    Connected c = Unconfigured();
+    host::SetupOptions options;
+    options.configure_outputs = false;
+    Connected c = ConnectFile(sequence.fixture, true, options);
     ASSERT_EQ(c.channel_count(), 2);
-    MmfChannel* channel = AsFrameworkChannel(&c.channel(0));
+    MmfChannel* channel = AsFrameworkChannel(&c.channel(sequence.channel));
     MmfMediaFormat format = c.channel(0).Format;
     for (size_t i = 0; i < sequence.steps.size(); ++i) {
       const Step& step = sequence.steps[i];
       int32_t acquired_before = c.context()->AcquiredChannelCount;
       int result = -1;
+      MmfMra* mra = reinterpret_cast<MmfMra*>(&format);
+      MmfReadListEntry* entry = nullptr;
+      testing_support::LogRecorder log;
       switch (step.op) {
         case Op::kAcquire: result = ops.AcquireOutputChannel(channel); break;
         case Op::kRelease: result = ops.ReleaseOutputChannel(channel); break;
         case Op::kSetFormat: result = ops.SetOutputFormat(channel, &format); break;
         case Op::kSetPool: result = ops.SetOutputChannelMemoryPool(channel, host::MemoryPool::Ops(), pool.handle()); break;
+        case Op::kNextBuffer: result = ops.NextBuffer(channel, &mra); break;
+        case Op::kReadList:
+          result = HostPlugin().Get<MmfListMakerOps>("MediaListMaker")->GetNextReadList(channel, &entry, nullptr);
+          break;
       }
       EXPECT_EQ(result, step.result) << "step " << i;
-      const MkvChannelState& state = *c.channel(0).State;
-      EXPECT_EQ(state.Acquired, (c.channel(0).Flags & 1) ? 1u : 0u) << "step " << i;
+      if (result == 4044) {
+        const char* names[] = {"AcquireOutputChannel", "ReleaseOutputChannel", "SetOutputFormat",
+                               "SetOutputChannelMemoryPool", "NextBuffer", "GetNextReadList"};
+        EXPECT_TRUE(log.Contains(2, std::string("kelvane: ") + names[int(step.op)] +
+                                        " channel 1 has no track: track 2 is encrypted."))
+            << "step " << i;
+        EXPECT_EQ(mra == nullptr, step.op == Op::kNextBuffer) << "step " << i;
+        EXPECT_EQ(c.context()->RingHead, 0) << "the ring is not touched";
+      }
+      const MkvChannelState& state = *c.channel(sequence.channel).State;
+      EXPECT_EQ(state.Acquired, (c.channel(sequence.channel).Flags & 1) ? 1u : 0u) << "step " << i;
       EXPECT_EQ(c.context()->ReadList != nullptr, state.Acquired == 1) << "step " << i;
       if (step.op == Op::kSetPool) {
         EXPECT_EQ(state.MraPool != nullptr, result == 0) << "step " << i;

@@ -49,6 +49,8 @@ TEST_P(PlaybackFixtureTest, EveryTrackDeliversTheListedFramesAtEveryBufferSize) 
     SCOPED_TRACE("input buffers of " + std::to_string(size) + " bytes");
     host::RunnerOptions options;
     options.input_buffer_size = size;
+    options.catch_up = true;
+    options.recoveries = 4;
     for (int32_t only = offered.size() < 2 ? -1 : int32_t(offered.size()) - 1; only >= -1; --only) {
       SCOPED_TRACE(only < 0 ? "every channel acquired" : "only channel " + std::to_string(only) + " acquired");
       options.channels = only < 0 ? std::vector<int32_t>{} : std::vector<int32_t>{only};
@@ -88,6 +90,8 @@ TEST_P(PlaybackFixtureTest, WithoutChecksumsTheToolsWayDeliversTheSameFrames) {
     SCOPED_TRACE("input buffers of " + std::to_string(size) + " bytes");
     host::RunnerOptions plain;
     plain.input_buffer_size = size;
+    plain.catch_up = true;
+    plain.recoveries = 4;
     host::RunnerOptions tool = plain;
     tool.checksum = false;
     tool.read_ahead = true;
@@ -104,6 +108,8 @@ TEST_P(PlaybackFixtureTest, WithoutChecksumsTheToolsWayDeliversTheSameFrames) {
     for (size_t k = 0; k < got.channels.size(); ++k) {
       SCOPED_TRACE("channel " + std::to_string(k));
       const host::ChannelRun &a = got.channels[k], &b = expected.channels[k];
+      // Which frames a failing channel loses with its output buffer depends on where it stood.
+      if (!a.gaps.empty() || !b.gaps.empty()) continue;
       ASSERT_EQ(a.frames.size(), b.frames.size());
       for (size_t i = 0; i < a.frames.size(); ++i) {
         ASSERT_EQ(std::make_tuple(a.frames[i].time_us, a.frames[i].size, a.frames[i].marked, a.frames[i].adler32),

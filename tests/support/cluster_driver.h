@@ -43,7 +43,7 @@ struct DriveOptions {
 
 struct DriveOutcome {
   std::vector<DrivenBlock> blocks;
-  bool failed = false;    // a result that was neither a block, a skip nor "ran out with the buffers empty"
+  bool failed = false;    // a result that was neither a block, a skip nor "ran out" with inbuff1 used up
   int failure = 0;        // that result
   bool complete = false;  // every byte was consumed and no read or frame was left half done
 };
@@ -104,7 +104,10 @@ class Driver {
     return view;
   }
 
-  bool buffers_empty() const { return in1_.buff_left == 0 && (!has_in2_ || in2_.buff_left == 0); }
+  // The parser waits for the bytes after inbuff1, as the output path takes it.
+  bool waits(int result) const {
+    return mkvcluster_answer(cluster_.get(), result) == cluster_answer::need_more_data && in1_.buff_left == 0;
+  }
 
   void fail(int result) {
     outcome_.failed = true;
@@ -145,7 +148,7 @@ class Driver {
       skip_left_ = skip;
       return apply_skip();
     }
-    if ((result == kClusterChildShort || result == kClusterHeaderFailed) && buffers_empty()) return;
+    if (waits(result)) return;
     fail(result);
   }
 
@@ -162,7 +165,7 @@ class Driver {
       finish_group_tail();
       return start_block();
     }
-    if (result == kClusterChildShort && buffers_empty()) return;
+    if (waits(result)) return;
     fail(result);
   }
 

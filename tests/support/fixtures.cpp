@@ -107,6 +107,7 @@ bool ParseExpectedLine(std::string_view line, FixtureExpectation* fx) {
   else if (key == "timecode_scale") return ParseNumber(rest, &fx->timecode_scale);
   else if (key == "file_size") return ParseNumber(rest, &fx->file_size);
   else if (key == "cue_points") return ParseNumber(rest, &fx->cue_point_count);
+  else if (key == "damaged_at") return ParseNumber(rest, &fx->damaged_at);
   else if (key == "duration_ns") return fx->has_duration = ParseNumber(rest, &fx->duration_ns);
   else if (key == "tag") {
     size_t name_end = rest.find(' ');
@@ -114,6 +115,9 @@ bool ParseExpectedLine(std::string_view line, FixtureExpectation* fx) {
     if (name.empty()) return false;
     std::string_view text = name_end == std::string_view::npos ? std::string_view() : rest.substr(name_end + 1);
     fx->tags.emplace_back(std::string(name), std::string(text));
+  } else if (key == "tag_target" || key == "track_name" || key == "edition" || key == "chapter" ||
+             key == "chapter_name" || key == "attachment") {
+    return true;  // read by the tool's checks (check_info.sh)
   } else if (key == "track") {
     ExpectedTrack track;
     for (std::string_view token : SplitOn(rest, ' ')) {

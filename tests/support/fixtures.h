@@ -58,6 +58,7 @@ struct FixtureExpectation {
   bool has_duration = false;
   std::vector<ExpectedTrack> tracks;  // in file order
   uint32_t cue_point_count = 0;
+  uint64_t damaged_at = 0;  // the first byte the recipe zeroed, or the length it cut the file to; 0: none
   std::vector<ExpectedCue> cues;
   std::vector<std::pair<std::string, std::string>> tags;  // every SimpleTag: name, string
   std::vector<ExpectedBlock> blocks;                       // in file order

@@ -6,6 +6,8 @@
 # Cues refuses a seek to 5 s; malformed values are usage errors.
 #   check_packets_control.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
 source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
+work_err=$(mktemp)
+trap 'rm -f "$work_err"' EXIT
 
 # long_cues: TimecodeScale 1 ms, every cue point names track 1.
 cue_times=$(awk '{ print $1 * 1000 }' "$fixtures/long_cues.cues" | sort -un)
@@ -34,7 +36,15 @@ late=$(awk 'NR == FNR { cues[++n] = $1; next }
 [[ -z "$late" ]] || fail "ff: frames later than TrickTime after their cue point: $late"
 
 err=$("${kelvane[@]}" packets --seek 5@0.5 "$fixtures/no_cues.mkv" 2>&1 >/dev/null) || fail "no_cues: exit code $?"
-grep -q "control action 1 answered 4002" <<<"$err" || fail "no_cues: the refused seek is not reported"
+grep -q "the plug-in refused --seek 5@0.5" <<<"$err" || fail "no_cues: the refused seek is not reported"
+err=$("${kelvane[@]}" packets --seek 100@0.5 "$fixtures/long_cues.mkv" 2>&1 >/dev/null)
+[[ $err == *"--seek 100@0.5 is past the end"* ]] || fail "a seek past the end is not reported: $err"
+
+# A seek and a scan beside a channel record without a track; damage without recovery.
+"${kelvane[@]}" packets --seek 0.5@0.2 --ff 200@0.6 "$fixtures/encrypted_aac.mkv" >/dev/null 2>&1 || fail "encrypted_aac: exit code $?"
+out=$("${kelvane[@]}" packets --no-recover "$fixtures/damaged_zeroed.mkv" 2>"$work_err")
+[[ $? == 1 && -n $out && $out != *" gap "* ]] || fail "--no-recover: went on past the damage or printed nothing"
+[[ $(grep -c "stopped after .* us, after byte" "$work_err") == 2 ]] || fail "--no-recover: $(cat "$work_err")"
 
 for bad in "--seek x" "--seek 1@y" "--ff -3" "--trick-time 0" "--scan-end"; do
   # shellcheck disable=SC2086

@@ -3,7 +3,9 @@
 #include <algorithm>
 
 bool ElementaryWriter::Begin(const std::vector<Bytes>& config) {
-  if (headers_first_ && !config.empty()) headers_ = config[0];
+  if (headers_first_ && !config.empty() && config[0].size() > header_skip_) {
+    headers_.assign(config[0].begin() + static_cast<ptrdiff_t>(header_skip_), config[0].end());
+  }
   return true;
 }
 

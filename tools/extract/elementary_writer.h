@@ -8,11 +8,15 @@
 
 class ElementaryWriter : public FrameWriter {
  public:
-  ElementaryWriter(OutputFile* out, bool headers_first) : FrameWriter(out), headers_first_(headers_first) {}
+  // `header_skip`: bytes of the decoder configuration before its headers (a
+  // Video for Windows track's 40-byte BITMAPINFOHEADER).
+  ElementaryWriter(OutputFile* out, bool headers_first, size_t header_skip = 0)
+      : FrameWriter(out), headers_first_(headers_first), header_skip_(header_skip) {}
   bool Begin(const std::vector<Bytes>& config) override;
   bool Frame(const FrameView& frame) override;
 
  private:
   bool headers_first_;
+  size_t header_skip_;
   Bytes headers_;  // still to be written before the first frame
 };

@@ -7,6 +7,7 @@
 
 #include <sys/uio.h>
 
+#include <algorithm>
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -26,6 +27,10 @@ struct ChannelFacts {
   uint32_t sample_rate = 0;     // audio, Hz
   uint32_t bit_depth = 0;       // audio, from the track; 0 not stated
   uint32_t pcm_byte_order = 0;  // 1 little endian, 2 big endian, 0 not PCM
+  uint64_t default_duration_ns = 0;  // 0: not stated
+  uint64_t timecode_scale_ns = 0;    // the file's TimecodeScale
+  bool zlib_frames = false;          // stored with zlib content compression
+  bool zlib_private = false;         // the compression covers the CodecPrivate too
 };
 
 struct FrameView {

@@ -2,6 +2,8 @@
 
 #include "tools/extract/adts_writer.h"
 #include "tools/extract/annexb_writer.h"
+#include "tools/extract/avi_writer.h"
+#include "tools/extract/inflating_writer.h"
 #include "tools/extract/elementary_writer.h"
 #include "tools/extract/flac_writer.h"
 #include "tools/extract/ogg_writer.h"
@@ -33,6 +35,24 @@ bool IsMpeg4Part2(const ChannelFacts& facts) {
   return facts.fourcc == Code("MP4V") && facts.codec_id.rfind("V_MPEG4/ISO/", 0) == 0;
 }
 
+constexpr char kVfwCodecId[] = "V_MS/VFW/FOURCC";
+constexpr size_t kBitmapInfoHeaderSize = 40;
+
+// Video for Windows compression codes of MPEG-4 Part 2 video (the plug-in
+// offers a VfW track under its compression code), in any letter case.
+bool IsVfwMpeg4Part2(const ChannelFacts& facts) {
+  if (facts.codec_id != kVfwCodecId) return false;
+  uint32_t upper = facts.fourcc;
+  for (int shift = 0; shift < 32; shift += 8) {
+    const uint32_t c = upper >> shift & 0xFF;
+    if (c >= 'a' && c <= 'z') upper -= uint32_t{'a' - 'A'} << shift;
+  }
+  for (uint32_t code : {Code("XVID"), Code("DIVX"), Code("DX50"), Code("FMP4"), Code("MP4V")}) {
+    if (upper == code) return true;
+  }
+  return false;
+}
+
 }  // namespace
 
 const char kWriterFormatsHelp[] =
@@ -43,6 +63,8 @@ const char kWriterFormatsHelp[] =
     "  PCM                       .wav   WAV, big-endian samples turned little endian\n"
     "  MPEG audio, AC-3, DTS     .mp3 .mp2 .mp1 .ac3 .dts  elementary streams\n"
     "  MPEG-1/2, MPEG-4 Part 2   .m1v .m2v .m4v  elementary streams, sequence/VOL headers first\n"
+    "    (also Video for Windows tracks coded XVID, DIVX, DX50, FMP4 or MP4V)\n"
+    "  other Video for Windows   .avi   AVI with the track's BITMAPINFOHEADER\n"
     "  anything else             .raw + .index  raw frames and a per-frame index (below)\n";
 
 ChosenWriter ChooseWriter(const ChannelFacts& facts, const std::string& directory, OutputFile* out) {
@@ -69,6 +91,10 @@ ChosenWriter ChooseWriter(const ChannelFacts& facts, const std::string& director
     make("wav", std::make_unique<WavWriter>(out, facts));
   } else if (IsMpeg4Part2(facts)) {
     make("m4v", std::make_unique<ElementaryWriter>(out, true));
+  } else if (IsVfwMpeg4Part2(facts)) {
+    make("m4v", std::make_unique<ElementaryWriter>(out, true, kBitmapInfoHeaderSize));
+  } else if (facts.codec_id == kVfwCodecId) {
+    make("avi", std::make_unique<AviWriter>(out, facts));
   } else {
     for (const StreamFormat& format : kElementary) {
       if (format.fourcc == code) make(format.extension, std::make_unique<ElementaryWriter>(out, format.headers_first));
@@ -77,6 +103,9 @@ ChosenWriter ChooseWriter(const ChannelFacts& facts, const std::string& director
       chosen.index_path = base + "index";
       make("raw", std::make_unique<RawIndexWriter>(out, chosen.index_path, facts));
     }
+  }
+  if (facts.zlib_frames) {
+    chosen.writer = std::make_unique<InflatingWriter>(out, std::move(chosen.writer), facts.zlib_private);
   }
   return chosen;
 }
