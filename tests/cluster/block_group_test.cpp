@@ -6,7 +6,6 @@
 #include "host/heap_control.h"
 #include "platform/ao_log.h"
 #include "tests/cluster/cluster_harness.h"
-#include "tests/support/cluster_driver.h"
 #include "tests/support/log_recorder.h"
 
 namespace {
@@ -82,34 +81,6 @@ TEST(ParseMkvBlockGroupTest, RunningOutInsideAChildLogsThePartialHeader) {
       {kAoLogNotice, "                 inbuff1->buff_fileoff = 0, inbuff2->buff_fileoff = " + std::to_string(cut - 1)},
   };
   EXPECT_EQ(log.messages(), want);
-}
-
-// Every BlockGroup child read across calls, at every buffer size.
-TEST(ParseMkvBlockGroupTest, EveryBufferSizeGivesTheSameBlocksAndKeys) {
-  Bytes bytes = cat({ClusterOf({master(kBlockGroup, {uinteger(kReferencePriority, 1), Block1(), bin(kVoid, filler(4)),
-                                                     uinteger(kBlockDuration, 40), sinteger(kReferenceBlock, -40, 2)}),
-                                master(kBlockGroup, {bin(kCodecState, {9}), block(2, 7, 0, {filler(5)}),
-                                                     uinteger(kBlockDuration, 20)})}),
-                     master(kCues, {})});
-  testing_support::DriveOptions whole;
-  whole.buffer_sizes = {bytes.size()};
-  auto want = testing_support::DriveClusters(bytes.data(), bytes.size(), 0, whole);
-  ASSERT_TRUE(want.complete);
-  ASSERT_EQ(want.blocks.size(), 2u);
-  EXPECT_FALSE(want.blocks[0].key);
-  EXPECT_TRUE(want.blocks[1].key);
-  EXPECT_EQ(want.blocks[1].ticks, 17);
-  for (size_t size = 1; size < bytes.size(); ++size) {
-    testing_support::DriveOptions options;
-    options.buffer_sizes = {size};
-    auto got = testing_support::DriveClusters(bytes.data(), bytes.size(), 0, options);
-    ASSERT_TRUE(got.complete) << size;
-    ASSERT_EQ(got.blocks.size(), 2u) << size;
-    for (size_t i = 0; i < 2; ++i) {
-      EXPECT_EQ(got.blocks[i].key, want.blocks[i].key) << size;
-      EXPECT_EQ(got.blocks[i].adler32, want.blocks[i].adler32) << size;
-    }
-  }
 }
 
 // The first allocation of each parse fails: the CodecState copy, the frame table.

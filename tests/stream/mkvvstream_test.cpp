@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 
 #include <cstring>
-#include <random>
 #include <vector>
 
 #include "host/heap_control.h"
@@ -104,38 +103,6 @@ TEST(VstreamInitTest, RefusesWhatCannotBeBufferedAndLeavesNothingBehind) {
     host::FailNthAllocation(0);
     EXPECT_EQ(stream.buffer, nullptr) << c.name;
     EXPECT_EQ(host::LiveBlockCount(), live) << c.name;
-  }
-}
-
-// Random reads and seeks compared with the bytes themselves, for buffered and
-// unbuffered streams and buffer sizes around the read sizes.
-TEST(VstreamDifferentialTest, RandomReadsAndSeeksDeliverTheFileBytes) {
-  std::vector<uint8_t> bytes = Pattern(50000);
-  std::mt19937 random(1234);
-  for (bool buffered : {true, false}) {
-    for (int64_t buffer_size : {2, 16, 240, 480, 500}) {
-      auto input = host::MakeMemoryStream(bytes.data(), bytes.size(), buffered);
-      mkvvstream stream{};
-      ASSERT_EQ(mkvvstream_init(&stream, input->record(), buffer_size, 1, kFillWithRead, buffered ? 1 : 0), 0);
-      uint64_t position = 0;
-      for (int step = 0; step < 3000 && position < bytes.size(); ++step) {
-        if (random() % 4 == 0) {
-          uint64_t target = std::min<uint64_t>(buffered ? random() % bytes.size() : position + random() % 700, bytes.size());
-          ASSERT_EQ(mkvvstream_seek(&stream, target), 0);
-          position = target;
-        } else {
-          int32_t count = static_cast<int32_t>(random() % 600);
-          std::vector<uint8_t> out(static_cast<size_t>(count) + 1);
-          uint64_t expected = std::min<uint64_t>(static_cast<uint64_t>(count), bytes.size() - position);
-          ASSERT_EQ(mkvvstream_read(&stream, out.data(), count), expected)
-              << "buffered " << buffered << " size " << buffer_size << " at " << position;
-          ASSERT_EQ(0, std::memcmp(out.data(), bytes.data() + position, static_cast<size_t>(expected)));
-          position += expected;
-        }
-        ASSERT_EQ(mkvvstream_tell(&stream), position);
-      }
-      mkvvstream_destroy(&stream);
-    }
   }
 }
 
