@@ -2,6 +2,7 @@
 
 #include <chrono>
 
+#include "host/call_failures.h"
 #include "host/read_lists.h"
 #include "platform/mmf_status.h"
 #include "platform/mra_pool.h"
@@ -226,6 +227,7 @@ int FileStreamer::Deliver(uint64_t offset, uint32_t wanted, MmfMra** buffer) {
 // channel is connected to.
 extern "C" int MmfStreamerSetListMode(MmfReadList* list, uint32_t mode) {
   if (!list) return kMmfInvalidArgument;
+  if (int error = host::TakeInjectedFailure(host::FrameworkCall::kStreamerSetListMode)) return error;
   host::FileStreamer* streamer = host::FileStreamer::OfOutput(list->Channel ? list->Channel->Peer : nullptr);
   if (!streamer) return kMmfNotAvailable;
   return streamer->SetListMode(mode);

@@ -12,6 +12,7 @@
 #include <type_traits>
 #include <vector>
 
+#include "host/call_failures.h"
 #include "host/memory_pools.h"
 #include "host/spin_lock.h"
 #include "platform/channel.h"
@@ -187,6 +188,7 @@ extern "C" int MmfFreeMraPool(MmfMraPool* pool) {
 
 extern "C" int MmfAcquireMra(MmfMraPool* pool, MmfMra** mra, uint32_t flags) {
   if (!pool || !mra) return kInvalid;
+  if (int error = host::TakeInjectedFailure(host::FrameworkCall::kAcquireMra)) return error;
   MraPoolState* state = State(pool);
   auto available = [state] {
     std::lock_guard lock(state->lock);

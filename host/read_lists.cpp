@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <new>
 
+#include "host/call_failures.h"
 #include "platform/mmf_status.h"
 
 namespace {
@@ -14,6 +15,7 @@ constexpr int kOutOfMemory = 12;
 extern "C" int MmfAllocateReadlist(MmfReadList** list, MmfChannel* channel, uint32_t entry_count,
                                    uint32_t request_count) {
   if (!list || !channel || entry_count == 0 || request_count == 0) return kMmfInvalidArgument;
+  if (int error = host::TakeInjectedFailure(host::FrameworkCall::kAllocateReadlist)) return error;
   auto* made = new (std::nothrow) MmfReadList;
   if (!made) return kOutOfMemory;
   made->Channel = channel;
@@ -37,6 +39,7 @@ extern "C" int MmfFreeReadlist(MmfReadList* list) {
 
 extern "C" int MmfAcquireReadList(MmfReadList* list, MmfReadListEntry** entry) {
   if (!list || !entry) return kMmfInvalidArgument;
+  if (int error = host::TakeInjectedFailure(host::FrameworkCall::kAcquireReadList)) return error;
   std::lock_guard lock(list->Mutex);
   MmfReadListEntry& next = list->Entries[list->NextEntry];
   list->NextEntry = (list->NextEntry + 1) % static_cast<uint32_t>(list->Entries.size());

@@ -6,6 +6,7 @@
 
 #include <gtest/gtest.h>
 
+#include "host/call_failures.h"
 #include "host/memory_pools.h"
 #include "tests/plugin/graph_harness.h"
 #include "tests/support/log_recorder.h"
@@ -14,13 +15,18 @@ namespace {
 
 using plugin_test::Connected;
 using plugin_test::ConnectFile;
+using host::FrameworkCall;
 using plugin_test::HostPlugin;
 
 enum class Op { kAcquire, kRelease, kSetFormat, kSetPool, kNextBuffer, kReadList };
 
+constexpr int kInjected = 12;
+
 struct Step {
   Op op;
   int result;
+  FrameworkCall fail = FrameworkCall::kCount;  // made to answer kInjected during the step
+  const char* log = nullptr;                   // then logged at level 2
 };
 
 struct Sequence {
@@ -50,6 +56,14 @@ TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {
        {{Op::kAcquire, 4044}, {Op::kSetFormat, 4044}, {Op::kSetPool, 4044}, {Op::kNextBuffer, 4044},
         {Op::kReadList, 4044}, {Op::kRelease, 4044}},
        "encrypted_aac", 1},
+      // A failed acquisition stays acquired without a read list.
+      {"read list allocation fails",
+       {{Op::kAcquire, kInjected, FrameworkCall::kAllocateReadlist,
+         "kelvane: AcquireOutputChannel MmfAllocateReadlist() failed err = 12"},
+        {Op::kRelease, 0}}},
+      {"media buffer acquisition fails",
+       {{Op::kAcquire, 0}, {Op::kSetFormat, 0}, {Op::kSetPool, 0},
+        {Op::kNextBuffer, 1, FrameworkCall::kAcquireMra, "kelvane->MmfAcquireMra() failed"}, {Op::kRelease, 0}}},
   };
   const MmfMediaOutputOps& ops = *HostPlugin().output();
   host::MemoryPool pool(4096, 4);
@@ -61,6 +75,7 @@ TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {
     ASSERT_EQ(c.channel_count(), 2);
     MmfChannel* channel = AsFrameworkChannel(&c.channel(sequence.channel));
     MmfMediaFormat format = c.channel(0).Format;
+    c.context()->ControlState = 64;  // as after Start
     for (size_t i = 0; i < sequence.steps.size(); ++i) {
       const Step& step = sequence.steps[i];
       int32_t acquired_before = c.context()->AcquiredChannelCount;
@@ -68,6 +83,7 @@ TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {
       MmfMra* mra = reinterpret_cast<MmfMra*>(&format);
       MmfReadListEntry* entry = nullptr;
       testing_support::LogRecorder log;
+      if (step.log) host::FailNextCall(step.fail, kInjected);
       switch (step.op) {
         case Op::kAcquire: result = ops.AcquireOutputChannel(channel); break;
         case Op::kRelease: result = ops.ReleaseOutputChannel(channel); break;
@@ -79,6 +95,10 @@ TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {
           break;
       }
       EXPECT_EQ(result, step.result) << "step " << i;
+      if (step.log) {
+        host::FailNextCall(step.fail, 0);
+        EXPECT_TRUE(log.Contains(2, step.log)) << "step " << i;
+      }
       if (result == 4044) {
         const char* names[] = {"AcquireOutputChannel", "ReleaseOutputChannel", "SetOutputFormat",
                                "SetOutputChannelMemoryPool", "NextBuffer", "GetNextReadList"};
@@ -90,11 +110,12 @@ TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {
       }
       const MkvChannelState& state = *c.channel(sequence.channel).State;
       EXPECT_EQ(state.Acquired, (c.channel(sequence.channel).Flags & 1) ? 1u : 0u) << "step " << i;
-      EXPECT_EQ(c.context()->ReadList != nullptr, state.Acquired == 1) << "step " << i;
+      EXPECT_EQ(c.context()->ReadList != nullptr, state.Acquired == 1 && step.fail != FrameworkCall::kAllocateReadlist)
+          << "step " << i;
       if (step.op == Op::kSetPool) {
         EXPECT_EQ(state.MraPool != nullptr, result == 0) << "step " << i;
       }
-      if (step.result != 0) {
+      if (step.result != 0 && !step.log) {
         EXPECT_EQ(c.context()->AcquiredChannelCount, acquired_before) << "step " << i;
       }
     }

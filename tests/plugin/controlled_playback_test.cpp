@@ -51,14 +51,21 @@ INSTANTIATE_TEST_SUITE_P(
                     ControlCase{"PauseAfterError", 1, Op::kPause, 0, 64},
                     ControlCase{"PauseWhenStoppedChangesNothing", 16, Op::kPause, 0, 16},
                     ControlCase{"StopWhenRunning", 64, Op::kStop, 0, 16},
+                    ControlCase{"StopWhenStopped", 16, Op::kStop, 0, 16},
                     ControlCase{"StopAfterErrorAnswers4041", 1, Op::kStop, 4041, 16},
                     ControlCase{"StatusAnswersTheState", 256, Op::kStatus, -1, 256}),
     [](const testing::TestParamInfo<ControlCase>& info) { return info.param.name; });
 
+// The metadata event goes out once, at the first call, whatever the state.
 TEST(MediaControlNextBufferTest, StatesBelowRunningExceptFourAreAnsweredAtOnce) {
   plugin_test::Connected connected = plugin_test::ConnectFile("tiny_avc");
   ASSERT_TRUE(connected.graph->rated());
   const MmfMediaOutputOps* output = plugin_test::HostPlugin().output();
+  static std::vector<std::pair<uint32_t, uint32_t>> posted;  // event, bytes of data
+  plugin_test::HostPlugin().Get<MmfEventProducerOps>("MediaEventProducer")->EventSetPostFunction(
+      connected.graph->handle(), [](MmfFilterHandle*, uint32_t event, const void*, uint32_t bytes) {
+        posted.emplace_back(event, bytes);
+      });
   for (uint32_t state : {0u, 1u, 2u, 16u, 32u}) {
     connected.context()->ControlState = state;
     MmfMra* mra = reinterpret_cast<MmfMra*>(&state);
@@ -66,6 +73,7 @@ TEST(MediaControlNextBufferTest, StatesBelowRunningExceptFourAreAnsweredAtOnce) 
     EXPECT_EQ(mra, nullptr);
     EXPECT_EQ(connected.channel(0).State->DecoderConfigSent, 0u) << "nothing was touched";
   }
+  EXPECT_EQ(posted, (std::vector<std::pair<uint32_t, uint32_t>>{{4, 8}}));
 }
 
 // long_cues, no_cues and multi_audio offer their tracks 1, 2, ... as channels 0, 1, ...

@@ -3,7 +3,8 @@
 // sizes, channels pulled at different speeds on their own threads, and
 // output assembly on crafted input (what lies between Clusters, laces with
 // empty frames or bytes after their last frame, more input properties than an
-// output buffer has room for, a decoder configuration too large).
+// output buffer has room for, a decoder configuration too large, the timestamp
+// type of each track type).
 
 #include <algorithm>
 #include <cstdio>
@@ -166,10 +167,10 @@ INSTANTIATE_TEST_SUITE_P(Speeds, PlaybackThreadsTest,
                            return std::string(info.param.fixture) + "_" + std::to_string(info.index);
                          });
 
-// Info and Tracks of a file with one MP3 track.
-Bytes AudioHeader() {
+// Info and Tracks of a file with one MP3 track (of another type if asked).
+Bytes AudioHeader(uint64_t track_type = 2) {
   Bytes tracks = ebml::master(ebml::kTracks, {ebml::master(ebml::kTrackEntry, {
-      ebml::uinteger(ebml::kTrackNumber, 1), ebml::uinteger(ebml::kTrackUid, 1), ebml::uinteger(ebml::kTrackType, 2),
+      ebml::uinteger(ebml::kTrackNumber, 1), ebml::uinteger(ebml::kTrackUid, 1), ebml::uinteger(ebml::kTrackType, track_type),
       ebml::str(ebml::kCodecId, "A_MPEG/L3"),
       ebml::master(ebml::kAudio, {ebml::f64(ebml::kSamplingFrequency, 44100), ebml::uinteger(ebml::kChannels, 1)})})});
   return ebml::cat({ebml::master(ebml::kInfo, {ebml::uinteger(ebml::kTimecodeScale, 1000000)}), tracks});
@@ -192,10 +193,10 @@ Bytes AudioFile(const std::vector<Bytes>& between) {
 }
 
 // One Cluster that holds `blocks`.
-Bytes OneCluster(std::initializer_list<Bytes> blocks) {
+Bytes OneCluster(std::initializer_list<Bytes> blocks, uint64_t track_type = 2) {
   Bytes cluster = ebml::uinteger(ebml::kTimecode, 0);
   for (const Bytes& block : blocks) cluster = ebml::cat({cluster, block});
-  return MatroskaFile(ebml::cat({AudioHeader(), ebml::element(ebml::kCluster, cluster)}));
+  return MatroskaFile(ebml::cat({AudioHeader(track_type), ebml::element(ebml::kCluster, cluster)}));
 }
 
 std::string WriteTemp(const Bytes& bytes, const std::string& name) {
@@ -263,6 +264,8 @@ struct LaceCase {
   const char* name;
   Bytes file;
   std::vector<Bytes> frames;  // what the track must deliver, in order
+  uint32_t time_type = kMmfPropAudioTime;  // the only timestamp property delivered
+  bool unsupported = false;                // the track type is not one of audio, video and subtitle
 };
 
 class PlaybackLaceTest : public testing::TestWithParam<LaceCase> {};
@@ -274,13 +277,21 @@ TEST_P(PlaybackLaceTest, DeliversEveryFrameOnceAndPassesOverTheRest) {
   for (const Bytes& f : c.frames) want.emplace_back(f.size(), testing_support::Adler32(f.data(), f.size()));
   for (uint32_t size : {7u, 64u, 4096u}) {
     SCOPED_TRACE(size);
+    Trace trace;
+    testing_support::LogRecorder log;
     host::RunnerOptions options;
     options.input_buffer_size = size;
+    options.on_buffer = Record;
+    options.user = &trace;
     host::RunResult result = host::RunGraph(plugin_test::HostPlugin(), path, options);
     ASSERT_TRUE(result.ok) << result.error;
     std::vector<std::pair<uint32_t, uint32_t>> got;
     for (const host::RunFrame& f : result.channels[0].frames) got.emplace_back(f.size, f.adler32);
     EXPECT_EQ(got, want);
+    for (uint32_t type : {kMmfPropVideoTime, kMmfPropAudioTime, kMmfPropSubtitleTime}) {
+      EXPECT_EQ(std::count(trace.types.begin(), trace.types.end(), type) != 0, type == c.time_type) << type;
+    }
+    EXPECT_EQ(log.Contains(3, "kelvane:  Unsupported channel type."), c.unsupported);
   }
 }
 
@@ -311,7 +322,11 @@ INSTANTIATE_TEST_SUITE_P(
         LaceCase{"EveryFrameEmpty",
                  OneCluster({ebml::xiph_laced_block(1, 0, ebml::kKeyFrame, {Bytes{}, Bytes{}, Bytes{}}),
                              ebml::simple_block(1, 10, ebml::kKeyFrame, {Bytes(12, 0x55)})}),
-                 {Bytes(12, 0x55)}}),
+                 {Bytes(12, 0x55)}},
+        LaceCase{"SubtitleTrack", OneCluster({ebml::simple_block(1, 0, ebml::kKeyFrame, {Bytes(12, 0x55)})}, 17),
+                 {Bytes(12, 0x55)}, kMmfPropSubtitleTime},
+        LaceCase{"ComplexTrackTimedAsAudio", OneCluster({ebml::simple_block(1, 0, ebml::kKeyFrame, {Bytes(12, 0x55)})}, 3),
+                 {Bytes(12, 0x55)}, kMmfPropAudioTime, true}),
     [](const testing::TestParamInfo<LaceCase>& info) { return info.param.name; });
 
 TEST(PlaybackCasesTest, DecoderConfigurationLargerThanTheOutputBufferEndsTheChannelWithAnError) {

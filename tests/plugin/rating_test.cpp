@@ -1,9 +1,10 @@
 // RateInputFormat: every fixture against what mkvinfo and ffprobe recorded
 // for it; crafted files for the track set-up rules that the fixtures do not
 // reach (Vorbis layouts, PCM byte order, AAC, BITMAPINFOHEADER compression
-// codes, encryption, frame rates, the byte-rate estimate); and the rating as
-// a lifecycle (queries, repeated requests, failures that leave the instance
-// for Destroy to free without a leak).
+// codes, encryption, frame rates, the byte-rate estimate) and for the cue
+// table that the rating reads (scan steps, codec states, times past 48 bits);
+// and the rating as a lifecycle (queries, repeated requests, the seek test,
+// failures that leave the instance for Destroy to free without a leak).
 
 #include <cmath>
 #include <cstring>
@@ -142,6 +143,8 @@ void CheckChannel(const FixtureExpectation& fx, const ExpectedTrack& track, cons
     uint32_t rate = track.default_duration ? uint32_t(std::lround(1e9 / double(track.default_duration))) : 24;
     EXPECT_EQ(format.media.video.frame_rate, rate);
     EXPECT_NEAR(format.media.video.duration, double(fx.duration_ns) / 1000, 1.0);
+    EXPECT_EQ(format.media.video.pixel_aspect_width, track.sar_num);
+    EXPECT_EQ(format.media.video.pixel_aspect_height, track.sar_den);
   } else {
     EXPECT_STREQ(channel.Name, "EncodedAudioOut");
     bool pcm = track.codec.rfind("A_PCM/", 0) == 0;
@@ -218,9 +221,10 @@ Bytes Track(uint64_t number, uint64_t type, std::string_view codec, const Bytes&
                                    children}));
 }
 
-Bytes Cue(uint64_t ticks, uint64_t track, uint64_t position) {
+Bytes Cue(uint64_t ticks, uint64_t track, uint64_t position, const Bytes& more = {}) {
   return master(kCuePoint, {uinteger(kCueTime, ticks), master(kCueTrackPositions, {uinteger(kCueTrack, track),
-                                                                                    uinteger(kCueClusterPosition, position)})});
+                                                                                    uinteger(kCueClusterPosition, position),
+                                                                                    more})});
 }
 
 // Ticks of 1 ms, a 10 s segment, the given tracks and cues, one empty Cluster.
@@ -253,6 +257,26 @@ struct Case {
 
 const MkvChannel& First(const Connected& c) { return c.channel(0); }
 const MkvChannelState& State(const Connected& c) { return *c.channel(0).State; }
+uint64_t InFile(const Connected& c, uint64_t cue_position) {
+  return c.context()->FileInfo.segment_data_position + cue_position;
+}
+
+// The request after one that a forward scan (speed 0) read at 0 s from the Cluster at cue position 100.
+const MmfReadRequest& NextScanRequest(const Connected& c) {
+  MkvContext& context = *c.context();
+  EXPECT_EQ(MmfAcquireReadList(context.ReadList, &context.CurrentReadList), 0);
+  MmfReadListEntry* previous = context.CurrentReadList;
+  previous->Request->Position = InFile(c, 100);
+  previous->Request->Length = 1024;
+  context.TrickMode = 512;
+  context.ByteRate = 2000;
+  MmfReadListEntry* next = previous;
+  const auto* list_maker = HostPlugin().Get<MmfListMakerOps>("MediaListMaker");
+  EXPECT_EQ(list_maker->GetNextReadList(c.graph->handle()->InputChannel, &next, previous), 0);
+  return *next->Request;
+}
+
+constexpr uint64_t kPast48Bits = 281474977000;  // ms: 2^48 us and a bit
 
 std::vector<Case> Cases() {
   return {
@@ -349,6 +373,38 @@ std::vector<Case> Cases() {
          EXPECT_TRUE(
              log.Contains(3, "kelvane: CalcOverallByteRate cueing points weren't enough to estimate the bytes per second."));
        }},
+      {"cue points past 2^48 us",
+       File(Track(1, kVideo, "V_MPEG2"), master(kCues, {Cue(kPast48Bits, 1, 100), Cue(kPast48Bits + 1000, 1, 900)})),
+       [](const Connected& c, const LogRecorder&) {
+         EXPECT_EQ(c.context()->ByteRate, 800);
+         uint64_t position = 0, time = 0;
+         const MmfTimeConverterOps& converter = *HostPlugin().converter();
+         EXPECT_EQ(converter.ConvertToPosition(c.graph->handle(), 0, kPast48Bits * 1000 + 1000001, &position), 0);
+         EXPECT_EQ(position, InFile(c, 900));
+         EXPECT_EQ(converter.ConvertToTime(c.graph->handle(), 0, position, &time), 0);
+         EXPECT_EQ(time, (kPast48Bits + 1000) * 1000);
+       }},
+      {"a seek to a cue position with a codec state",
+       File(Track(1, kVideo, "V_MPEG2"), master(kCues, {Cue(0, 1, 100, uinteger(kCueCodecState, 3))})),
+       [](const Connected& c, const LogRecorder& log) {
+         EXPECT_EQ(HostPlugin().seeker()->Seek(c.graph->handle(), 0, 0, InFile(c, 100)), 0);
+         EXPECT_TRUE(log.Contains(5, "kelvane: Non-zero codec state on cue = 3"));
+       }},
+      {"a scan step onto cue points that share the Cluster it read",
+       File(Track(1, kVideo, "V_MPEG2"),
+            master(kCues, {Cue(0, 1, 100), Cue(1000, 1, 100), Cue(1500, 1, 100), Cue(5000, 1, 900)})),
+       [](const Connected& c, const LogRecorder&) {
+         const MmfReadRequest& next = NextScanRequest(c);
+         EXPECT_EQ(next.Time, 5000000u);
+         EXPECT_EQ(next.Position, InFile(c, 900));
+         EXPECT_EQ(next.Length, 1024);
+       }},
+      {"a scan step onto cue points that share the last Cluster",
+       File(Track(1, kVideo, "V_MPEG2"), master(kCues, {Cue(0, 1, 100), Cue(1000, 1, 100)})),
+       [](const Connected& c, const LogRecorder& log) {
+         EXPECT_EQ(NextScanRequest(c).Length, -1);
+         EXPECT_TRUE(log.Contains(5, "kelvane: GetNextReadList detected EOS internally. time = 1000000"));
+       }},
   };
 }
 
@@ -400,6 +456,33 @@ TEST(RateInputFormatLifecycleTest, QueryAnswersWhetherAFullRequestAccepted) {
   EXPECT_EQ(claim, 1u);
   EXPECT_EQ(filter->OutputChannels, channels);
   EXPECT_EQ(filter->Context->Rated, 1u);
+}
+
+// An input that cannot seek is rated only when the input format (word 1096)
+// spares it the seek to 0; SeekQuery then answers that it cannot seek. Above a
+// data rate (word 1108) of 50000 the headers go through the larger buffer: fewer reads.
+TEST(RateInputFormatLifecycleTest, SeekTestAndHeaderBufferFollowTheInputFormat) {
+  struct Row {
+    bool seekable;
+    uint32_t no_seek_test, data_rate;
+    int rating, seek_query;
+  };
+  const Row rows[] = {{true, 0, 0, 80, 2},  {true, 0, 50000, 80, 2}, {true, 0, 50001, 80, 2},
+                      {true, 1, 0, 80, 1},  {false, 0, 0, 0, 1},     {false, 1, 0, 80, 1}};
+  std::vector<uint64_t> reads;
+  for (const Row& row : rows) {
+    SCOPED_TRACE(reads.size());
+    auto stream = host::OpenFileStream(FixtureFile("avc_aac"), row.seekable);
+    Instance instance(*stream);
+    instance.format.no_seek_test = row.no_seek_test;
+    instance.format.data_rate = row.data_rate;
+    uint32_t claim = 0;
+    EXPECT_EQ(instance.Rate(1, &claim), row.rating);
+    EXPECT_EQ(HostPlugin().seeker()->SeekQuery(instance.handle), row.seek_query);
+    reads.push_back(stream->counters().reads);
+  }
+  EXPECT_EQ(reads[1], reads[0]);
+  EXPECT_LT(reads[2], reads[1]);
 }
 
 TEST(RateInputFormatLifecycleTest, RefusedStreamLeavesNothingAfterDestroy) {

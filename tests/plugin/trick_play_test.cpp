@@ -10,6 +10,7 @@
 #include <gtest/gtest.h>
 
 #include "filter/mkv_context.h"
+#include "host/call_failures.h"
 #include "host/file_streamer.h"
 #include "host/graph_clock.h"
 #include "host/memory_pools.h"
@@ -169,9 +170,16 @@ TEST_F(TrickPlayTest, TheRequestIsTrickTimesBytesRaisedToWholeInputBuffersAndEnd
     ASSERT_EQ(list_maker->GetNextReadList(handle_->InputChannel, &out, other), 0);
     EXPECT_EQ(out, current);
   }
+  // A failed acquisition of the next entry is answered and leaves the current one.
+  testing_support::LogRecorder log;
+  host::FailNextCall(host::FrameworkCall::kAcquireReadList, 12);
+  MmfReadListEntry* next = nullptr;
+  EXPECT_EQ(list_maker->GetNextReadList(handle_->InputChannel, &next, current), 12);
+  EXPECT_TRUE(log.Contains(2, "kelvane: GetNextReadList MmfAcquireReadList() failed err = 12"));
+  EXPECT_EQ(next, nullptr);
+  EXPECT_EQ(context()->CurrentReadList, current);
   // Without a byte rate the next request ends the stream.
   context()->ByteRate = 0;
-  MmfReadListEntry* next = nullptr;
   ASSERT_EQ(list_maker->GetNextReadList(handle_->InputChannel, &next, current), 0);
   EXPECT_NE(next, current);
   EXPECT_EQ(next->Request->Length, -1);
@@ -253,18 +261,37 @@ TEST_F(TrickPlayTest, WithoutCuesASkippingScanEndsTheStreamAndTheNoSkipScanFails
   EXPECT_EQ(Trick().ScanForward(handle_, 800), 48);
 }
 
-TEST_F(TrickPlayTest, WithoutAGraphClockEveryScanFailsAndSaysSo) {
-  Connect("long_cues", {0, 1});
-  host::AttachGraphClock(handle_->Graph, nullptr);
-  testing_support::LogRecorder log;
-  EXPECT_EQ(Trick().ScanForward(handle_, 100), kMmfNotAvailable);
-  EXPECT_EQ(Trick().ScanBackward(handle_, 100), kMmfNotAvailable);
-  EXPECT_EQ(Trick().ScanEnd(handle_), kMmfNotAvailable);
-  for (const char* op : {"ScanForward", "ScanBackward", "ScanEnd"}) {
-    EXPECT_TRUE(log.Contains(2, std::string("kelvane: ") + op + " failed to get current time.")) << op;
+// Each scan answers a failure of the graph clock or of a framework call with
+// its error and says so; a failed switch of list mode comes after the request
+// and TrickMode are set.
+TEST_F(TrickPlayTest, AFailedFrameworkCallFailsEveryScanAndSaysSo) {
+  struct Row {
+    host::FrameworkCall call;  // kCount: no graph clock
+    int error;
+    const char* message;
+    uint32_t modes[3];  // TrickMode after ScanForward, ScanBackward, ScanEnd
+  };
+  const Row rows[] = {{host::FrameworkCall::kCount, kMmfNotAvailable, " failed to get current time.", {0, 0, 0}},
+                      {host::FrameworkCall::kAcquireReadList, 12, " MmfAcquireReadList() failed err = 12", {0, 0, 0}},
+                      {host::FrameworkCall::kStreamerSetListMode, 12, " MmfStreamerSetListMode() failed err = 12",
+                       {512, 1024, 0}}};
+  for (const Row& row : rows) {
+    SCOPED_TRACE(row.message);
+    Connect("long_cues", {0, 1});
+    if (row.call == host::FrameworkCall::kCount) host::AttachGraphClock(handle_->Graph, nullptr);
+    testing_support::LogRecorder log;
+    const char* names[] = {"ScanForward", "ScanBackward", "ScanEnd"};
+    for (int op = 0; op < 3; ++op) {
+      if (row.call != host::FrameworkCall::kCount) host::FailNextCall(row.call, row.error);
+      EXPECT_EQ(op == 0 ? Trick().ScanForward(handle_, 100) : op == 1 ? Trick().ScanBackward(handle_, 100)
+                                                                       : Trick().ScanEnd(handle_),
+                row.error);
+      EXPECT_TRUE(log.Contains(2, std::string("kelvane: ") + names[op] + row.message)) << names[op];
+      EXPECT_EQ(context()->TrickMode, row.modes[op]) << names[op];
+    }
+    EXPECT_EQ(Trick().TrickQuery(handle_), 8);
+    TearDown();
   }
-  EXPECT_EQ(context()->TrickMode, 0u);
-  EXPECT_EQ(Trick().TrickQuery(handle_), 8);
 }
 
 constexpr uint32_t kForward = 512;
