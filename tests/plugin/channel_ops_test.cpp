@@ -13,9 +13,9 @@
 
 namespace {
 
+using host::FrameworkCall;
 using plugin_test::Connected;
 using plugin_test::ConnectFile;
-using host::FrameworkCall;
 using plugin_test::HostPlugin;
 
 enum class Op { kAcquire, kRelease, kSetFormat, kSetPool, kNextBuffer, kReadList };
