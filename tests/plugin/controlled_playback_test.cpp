@@ -62,6 +62,7 @@ TEST(MediaControlNextBufferTest, StatesBelowRunningExceptFourAreAnsweredAtOnce) 
   ASSERT_TRUE(connected.graph->rated());
   const MmfMediaOutputOps* output = plugin_test::HostPlugin().output();
   static std::vector<std::pair<uint32_t, uint32_t>> posted;  // event, bytes of data
+  posted.clear();
   plugin_test::HostPlugin().Get<MmfEventProducerOps>("MediaEventProducer")->EventSetPostFunction(
       connected.graph->handle(), [](MmfFilterHandle*, uint32_t event, const void*, uint32_t bytes) {
         posted.emplace_back(event, bytes);
