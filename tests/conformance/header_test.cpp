@@ -38,7 +38,7 @@ TEST(FixtureIndexTest, ListsEveryFileOnce) {
   std::vector<std::string> names = testing_support::FixtureNames();
   std::set<std::string> listed(names.begin(), names.end()), on_disk;
   EXPECT_EQ(listed.size(), names.size());
-  for (const auto& entry : std::filesystem::directory_iterator(KELVANE_FIXTURE_DIR)) {
+  for (const auto& entry : std::filesystem::directory_iterator(testing_support::FixturePath("."))) {
     if (entry.path().extension() == ".mkv") on_disk.insert(entry.path().stem().string());
   }
   EXPECT_EQ(listed, on_disk);
