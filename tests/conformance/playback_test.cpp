@@ -252,7 +252,7 @@ TEST_P(ConformanceTest, DeliversTheListedFramesSplitAtEveryByte) {
 // buffers of 1000 bytes fill it); with the streamer reading ahead and the
 // channels on one core too.
 TEST_P(ConformanceTest, ChannelsAtDifferentSpeedsEachGetTheirWholeTrack) {
-  if (refused_ || offered_.size() < 2) GTEST_SKIP() << "one channel";
+  if (refused_ || offered_.size() < 2 || bytes_.size() < 39000) GTEST_SKIP() << "one channel, or too short to fill the ring";
   for (int slow : {0, 1, 2}) {
     SCOPED_TRACE(slow == 0 ? "the first channel slow" : slow == 1 ? "the last channel slow" : "the tool's way");
     host::RunnerOptions options = Options(1000);
