@@ -2,9 +2,9 @@
 // report about it: Info, the track records, the picture the framework's
 // decoder-configuration parser sees in each AVC and MPEG-4 track, the FLAC
 // configuration, cues and tags; the metadata list is built (its rules are
-// pinned on crafted files in the header test). (The frames of the track
-// stored with header removal are compared, prefix put back, in the plug-in's
-// playback test.)
+// pinned on crafted files in tests/core/header_test.cpp). (The frames of the
+// track stored with header removal are compared, prefix put back, when
+// playback_test.cpp here plays it.)
 
 #include <gtest/gtest.h>
 
