@@ -14,7 +14,7 @@
 #include "host/graph_runner.h"
 #include "platform/mmf_status.h"
 #include "tests/plugin/graph_harness.h"
-#include "tests/plugin/playback_expectations.h"
+#include "tests/support/playback_expectations.h"
 
 namespace {
 

@@ -12,13 +12,12 @@
 #include "filter/mkv_filter.h"
 #include "host/graph_setup.h"
 #include "host/input_streams.h"
+#include "tests/support/fixtures.h"
 #include "tests/support/plugin_under_test.h"
 
 namespace plugin_test {
 
-inline std::string FixtureFile(const std::string& name) {
-  return std::string(KELVANE_FIXTURE_DIR) + "/" + name + ".mkv";
-}
+inline std::string FixtureFile(const std::string& name) { return testing_support::FixturePath(name + ".mkv"); }
 
 struct Connected {
   std::vector<uint8_t> bytes;  // kept alive for a memory stream

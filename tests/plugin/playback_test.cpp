@@ -1,18 +1,13 @@
-// Playback through a real graph (streamer → kelvane → one sink per acquired
-// channel): every fixture against mkvinfo's frames at several input buffer
-// sizes, channels pulled at different speeds on their own threads, and
-// output assembly on crafted input (what lies between Clusters, laces with
+// Output assembly through a real graph (streamer → kelvane → one sink per
+// acquired channel) on crafted input: what lies between Clusters, laces with
 // empty frames or bytes after their last frame, more input properties than an
 // output buffer has room for, a decoder configuration too large, the timestamp
-// type of each track type).
+// type of each track type. (Every fixture is played in tests/conformance.)
 
 #include <algorithm>
 #include <cstdio>
 #include <fstream>
-#include <iterator>
-#include <memory>
 #include <string>
-#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -22,7 +17,6 @@
 #include "platform/mmf_status.h"
 #include "platform/mra_pool.h"
 #include "tests/plugin/graph_harness.h"
-#include "tests/plugin/playback_expectations.h"
 #include "tests/support/block_builder.h"
 #include "tests/support/cluster_driver.h"
 #include "tests/support/fixtures.h"
@@ -31,141 +25,6 @@
 namespace {
 
 using ebml::Bytes;
-using namespace playback_test;
-
-class PlaybackFixtureTest : public testing::TestWithParam<std::string> {};
-
-// With several tracks, also each channel acquired alone.
-TEST_P(PlaybackFixtureTest, EveryTrackDeliversTheListedFramesAtEveryBufferSize) {
-  const std::string name = GetParam();
-  const FixtureExpectation fixture = testing_support::LoadFixture(name);
-  const std::vector<uint64_t> offered = OfferedTracks(fixture);
-  if (fixture.doc_type != "matroska" || offered.empty()) {
-    host::RunResult refused = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), {});
-    EXPECT_EQ(refused.rating, 0);
-    EXPECT_TRUE(refused.channels.empty());
-    return;
-  }
-  for (uint32_t size : {1000u, 4096u, 32768u, 1u << 20}) {
-    SCOPED_TRACE("input buffers of " + std::to_string(size) + " bytes");
-    host::RunnerOptions options;
-    options.input_buffer_size = size;
-    options.catch_up = true;
-    options.recoveries = 4;
-    for (int32_t only = offered.size() < 2 ? -1 : int32_t(offered.size()) - 1; only >= -1; --only) {
-      SCOPED_TRACE(only < 0 ? "every channel acquired" : "only channel " + std::to_string(only) + " acquired");
-      options.channels = only < 0 ? std::vector<int32_t>{} : std::vector<int32_t>{only};
-      CheckRun(name, fixture, offered, host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), options));
-    }
-  }
-}
-
-INSTANTIATE_TEST_SUITE_P(Fixtures, PlaybackFixtureTest, testing::ValuesIn(testing_support::FixtureNames()),
-                         [](const testing::TestParamInfo<std::string>& info) { return info.param; });
-
-// A consumer's room for the sinks' frames: a few at a time, so that the
-// sinks run into its end often. Every frame must come back in place.
-struct FrameRooms {
-  static constexpr size_t kRoom = 5;
-  host::RunFrame room[8][kRoom];
-  std::vector<host::RunFrame> passed[8];
-  bool elsewhere[8] = {};  // frames came from anywhere but the room (each channel's sink writes its own)
-
-  static host::RunFrame* Room(void* user, int32_t channel, size_t* room) {
-    *room = kRoom;
-    return static_cast<FrameRooms*>(user)->room[channel];
-  }
-  static void OnFrames(void* user, int32_t channel, const host::RunFrame* frames, size_t count) {
-    auto* rooms = static_cast<FrameRooms*>(user);
-    rooms->elsewhere[channel] |= frames != rooms->room[channel] || count > kRoom;
-    rooms->passed[channel].insert(rooms->passed[channel].end(), frames, frames + count);
-  }
-};
-
-// The tool plays without checksums another way: sinks take whole frames on a
-// short path and gather them in the tool's own room, the channels share a
-// core and the streamer reads ahead. What each channel gets is the same.
-TEST_P(PlaybackFixtureTest, WithoutChecksumsTheToolsWayDeliversTheSameFrames) {
-  const std::string name = GetParam();
-  for (uint32_t size : {1000u, 65536u}) {
-    SCOPED_TRACE("input buffers of " + std::to_string(size) + " bytes");
-    host::RunnerOptions plain;
-    plain.input_buffer_size = size;
-    plain.catch_up = true;
-    plain.recoveries = 4;
-    host::RunnerOptions tool = plain;
-    tool.checksum = false;
-    tool.read_ahead = true;
-    tool.channels_share_core = true;
-    auto rooms = std::make_unique<FrameRooms>();
-    tool.user = rooms.get();
-    tool.frame_room = FrameRooms::Room;
-    tool.on_frames = FrameRooms::OnFrames;
-    const host::RunResult expected = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), plain);
-    const host::RunResult got = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), tool);
-    EXPECT_EQ(std::count(std::begin(rooms->elsewhere), std::end(rooms->elsewhere), true), 0);
-    ASSERT_EQ(got.ok, expected.ok) << got.error;
-    ASSERT_EQ(got.channels.size(), expected.channels.size());
-    for (size_t k = 0; k < got.channels.size(); ++k) {
-      SCOPED_TRACE("channel " + std::to_string(k));
-      const host::ChannelRun &a = got.channels[k], &b = expected.channels[k];
-      // Which frames a failing channel loses with its output buffer depends on where it stood.
-      if (!a.gaps.empty() || !b.gaps.empty()) continue;
-      ASSERT_EQ(a.frames.size(), b.frames.size());
-      for (size_t i = 0; i < a.frames.size(); ++i) {
-        ASSERT_EQ(std::make_tuple(a.frames[i].time_us, a.frames[i].size, a.frames[i].marked, a.frames[i].adler32),
-                  std::make_tuple(b.frames[i].time_us, b.frames[i].size, b.frames[i].marked, 0u))
-            << "frame " << i;
-      }
-      ASSERT_LT(k, std::size(rooms->passed));
-      EXPECT_EQ(rooms->passed[k].size(), a.frames.size());
-      for (size_t i = 0; i < std::min(rooms->passed[k].size(), a.frames.size()); ++i) {
-        ASSERT_EQ(std::make_tuple(rooms->passed[k][i].time_us, rooms->passed[k][i].size, rooms->passed[k][i].marked),
-                  std::make_tuple(a.frames[i].time_us, a.frames[i].size, a.frames[i].marked))
-            << "frame " << i << " as passed";
-      }
-      EXPECT_EQ(a.frame_count, b.frame_count);
-      EXPECT_EQ(a.last_time_us, b.last_time_us);
-      EXPECT_EQ(a.config.size(), b.config.size());
-      EXPECT_EQ(a.foreign_elements, b.foreign_elements);
-      EXPECT_EQ(a.incomplete_frame, b.incomplete_frame);
-      EXPECT_EQ(a.time_markers, b.time_markers);
-    }
-  }
-}
-
-struct ThreadsCase {
-  const char* fixture;
-  std::vector<uint32_t> sink_delay_us;  // per channel
-  bool as_the_tool = false;             // the streamer reads ahead; the channels share one core
-};
-
-class PlaybackThreadsTest : public testing::TestWithParam<ThreadsCase> {};
-
-// Each file is larger than 39 input buffers of 1000 bytes: while a slow sink
-// sleeps after its first buffer, the fast channels fill the ring and wait for
-// room until the slow one moves past the tail. Run under ThreadSanitizer.
-TEST_P(PlaybackThreadsTest, ChannelsAtDifferentSpeedsEachGetTheirWholeTrack) {
-  const ThreadsCase& c = GetParam();
-  const FixtureExpectation fixture = testing_support::LoadFixture(c.fixture);
-  host::RunnerOptions options;
-  options.input_buffer_size = 1000;
-  options.sink_delay_us = c.sink_delay_us;
-  options.read_ahead = c.as_the_tool;
-  options.channels_share_core = c.as_the_tool;
-  CheckRun(c.fixture, fixture, OfferedTracks(fixture),
-           host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(c.fixture), options));
-}
-
-INSTANTIATE_TEST_SUITE_P(Speeds, PlaybackThreadsTest,
-                         testing::Values(ThreadsCase{"long_cues", {0, 3000}}, ThreadsCase{"long_cues", {3000, 0}},
-                                         ThreadsCase{"multi_audio", {2000, 0, 1000, 0}},
-                                         ThreadsCase{"multi_audio", {0, 0, 0, 3000}},
-                                         ThreadsCase{"long_cues", {0, 3000}, true},
-                                         ThreadsCase{"multi_audio", {0, 0, 0, 0}, true}),
-                         [](const testing::TestParamInfo<ThreadsCase>& info) {
-                           return std::string(info.param.fixture) + "_" + std::to_string(info.index);
-                         });
 
 // Info and Tracks of a file with one MP3 track (of another type if asked).
 Bytes AudioHeader(uint64_t track_type = 2) {

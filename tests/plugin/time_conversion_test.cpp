@@ -4,7 +4,7 @@
 #include <gtest/gtest.h>
 
 #include "tests/plugin/graph_harness.h"
-#include "tests/plugin/playback_expectations.h"
+#include "tests/support/playback_expectations.h"
 
 namespace {
 

@@ -16,7 +16,7 @@
 #include "host/memory_pools.h"
 #include "platform/mmf_status.h"
 #include "tests/plugin/graph_harness.h"
-#include "tests/plugin/playback_expectations.h"
+#include "tests/support/playback_expectations.h"
 #include "tests/support/log_recorder.h"
 
 namespace {

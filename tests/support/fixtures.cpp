@@ -1,6 +1,7 @@
 #include "tests/support/fixtures.h"
 
 #include <charconv>
+#include <cstdlib>
 #include <fstream>
 #include <iterator>
 #include <sstream>
@@ -11,9 +12,13 @@
 #include <gtest/gtest.h>
 
 namespace testing_support {
-namespace {
 
-std::string FixturePath(const std::string& file) { return std::string(KELVANE_FIXTURE_DIR) + "/" + file; }
+std::string FixturePath(const std::string& file) {
+  const char* dir = std::getenv("KELVANE_FIXTURES");
+  return std::string(dir && *dir ? dir : KELVANE_FIXTURE_DIR) + "/" + file;
+}
+
+namespace {
 
 bool ReadWholeFile(const std::string& path, std::string* text) {
   std::ifstream in(path, std::ios::binary);

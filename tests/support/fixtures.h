@@ -75,6 +75,10 @@ struct ExpectedFullFrame {
   uint32_t adler32;
 };
 
+// FILE in the fixture directory: $KELVANE_FIXTURES when set (drawn remuxes
+// are played that way), else the committed tests/fixtures.
+std::string FixturePath(const std::string& file);
+
 // Fixture names in the order of index.txt.
 std::vector<std::string> FixtureNames();
 

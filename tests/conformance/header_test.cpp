@@ -2,9 +2,9 @@
 // report about it: Info, the track records, the picture the framework's
 // decoder-configuration parser sees in each AVC and MPEG-4 track, the FLAC
 // configuration, cues and tags; the metadata list is built (its rules are
-// pinned on crafted files in the header test). (The frames of the track
-// stored with header removal are compared, prefix put back, in the plug-in's
-// playback test.)
+// pinned on crafted files in tests/core/header_test.cpp). (The frames of the
+// track stored with header removal are compared, prefix put back, when
+// playback_test.cpp here plays it.)
 
 #include <gtest/gtest.h>
 
@@ -38,7 +38,7 @@ TEST(FixtureIndexTest, ListsEveryFileOnce) {
   std::vector<std::string> names = testing_support::FixtureNames();
   std::set<std::string> listed(names.begin(), names.end()), on_disk;
   EXPECT_EQ(listed.size(), names.size());
-  for (const auto& entry : std::filesystem::directory_iterator(KELVANE_FIXTURE_DIR)) {
+  for (const auto& entry : std::filesystem::directory_iterator(testing_support::FixturePath("."))) {
     if (entry.path().extension() == ".mkv") on_disk.insert(entry.path().stem().string());
   }
   EXPECT_EQ(listed, on_disk);
