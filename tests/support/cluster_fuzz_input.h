@@ -10,14 +10,20 @@
 // Every result must be a declared one, no fixed capacity may be exceeded,
 // every block allocated must be freed again, and when the bytes parse
 // completely both in the chosen buffers and in one buffer, the block lists
-// must agree.
+// must agree. Over one buffer, the output path's shortcut for unlaced blocks
+// must leave the cluster record exactly as parse_mkvcluster does, for each
+// track met taken as the channel's own.
 
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
+#include <set>
 #include <string>
+#include <vector>
 
 #include "core/cluster/cluster_status.h"
 #include "core/cluster/mkv_cluster.h"
+#include "core/cluster/unlaced_block.h"
 #include "host/heap_control.h"
 #include "tests/support/cluster_driver.h"
 
@@ -63,6 +69,62 @@ inline bool SameBlocks(const DriveOutcome& a, const DriveOutcome& b, bool keys) 
   return true;
 }
 
+// The record with frame_sizes replaced by its one entry, or 0 when absent.
+// Between blocks the lace table's working values (index, sum, entries past
+// the count) are left over from whichever laced block the parser read last
+// and are set afresh before any use: the shortcut, passing other tracks'
+// laced blocks unread, may leave others.
+inline std::string Snapshot(const mkvcluster& c, uint64_t position) {
+  mkvcluster copy = c;
+  if (copy.resume.step == mkv_resume_step::none) {
+    copy.resume.lace_index = 0;
+    copy.resume.lace_sum = 0;
+    for (size_t i = copy.resume.lace_count; i < kMaxLaceFrames; ++i) copy.resume.lace_sizes[i] = 0;
+  }
+  int64_t first = c.frame_sizes ? c.frame_sizes[0] : 0;
+  copy.frame_sizes = nullptr;
+  std::string out(sizeof copy + sizeof first + sizeof position, '\0');
+  std::memcpy(out.data(), &copy, sizeof copy);
+  std::memcpy(out.data() + sizeof copy, &first, sizeof first);
+  std::memcpy(out.data() + sizeof copy + sizeof first, &position, sizeof position);
+  return out;
+}
+
+// The own track's blocks (and the final record) of one walk over one buffer;
+// skipped blocks and the own track's frames are passed over as the output path does.
+inline std::vector<std::string> Walk(const uint8_t* file, size_t size, uint64_t own, bool shortcut) {
+  std::vector<std::string> seen;
+  mkvcluster c{};
+  mkvinbuff in{file, static_cast<uint32_t>(size), 0, static_cast<uint32_t>(size), 0};
+  auto skip = [&in](uint64_t count) {
+    auto n = static_cast<uint32_t>(count < in.buff_left ? count : in.buff_left);
+    in.buff_pos += n;
+    in.buff_left -= n;
+  };
+  while (in.buff_left) {
+    destroy_mkvcluster(&c);
+    uint64_t left = 0;
+    auto taken = shortcut ? take_unlaced_block(&in, &c, own, &left) : unlaced_block_result::parse;
+    if (taken == unlaced_block_result::other_track) {
+      skip(left);
+      continue;
+    }
+    if (taken == unlaced_block_result::parse) {
+      int result = parse_mkvcluster(&in, nullptr, &c, &left);
+      if (result == kClusterSkip) {
+        skip(left);
+        continue;
+      }
+      if (result != kClusterBlockReady) break;
+    }
+    if (c.track_number == own) seen.push_back(Snapshot(c, in.buff_fileoff + in.buff_pos));
+    skip(c.block_data_left > 0 ? static_cast<uint64_t>(c.block_data_left) : 0);
+  }
+  destroy_mkvcluster(&c);
+  seen.push_back(Snapshot(c, in.buff_fileoff + in.buff_pos));
+  return seen;
+}
+
 }  // namespace cluster_fuzz_detail
 
 // "" when the input passed every check, else the first check that failed.
@@ -100,6 +162,13 @@ inline std::string RunClusterFuzzInput(const uint8_t* data, size_t size) {
   if (host::LiveBlockCount() != live) return "blocks leaked (one buffer)";
   if (fail_at == 0 && split.complete && whole.complete && !SameBlocks(split, whole, options.read_group_tail)) {
     return "blocks differ from the one-buffer parse";
+  }
+  std::set<uint64_t> tracks;
+  for (const DrivenBlock& block : whole.blocks) tracks.insert(block.track);
+  for (uint64_t own : tracks) {
+    if (Walk(file + start, file_size - start, own, true) != Walk(file + start, file_size - start, own, false)) {
+      return "the unlaced-block shortcut leaves another record than the parser for track " + std::to_string(own);
+    }
   }
   return "";
 }
