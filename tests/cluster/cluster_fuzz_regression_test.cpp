@@ -56,10 +56,12 @@ TEST(ClusterFuzzRegressionTest, InputsPassEveryCheckOfTheFuzzTarget) {
                  xiph_laced_block(1, 4, 0, numbered_frames(2, 150)), simple_block(2, 5, 0, big),
                  ebml_laced_block(3, 6, 0, numbered_frames(6, 40)), simple_block(4, 7, 0, big)})},
       // A Xiph lace table that runs past its block, and an EBML one with an invalid size: the parser's to read.
+      // After the last Cluster, a block outside any Cluster that a run must not take.
       {"bad_lace_tables",
-       Clusters({simple_block(1, 0, 0, big), simple_block(3, 1, 0, big),
-                 element(kSimpleBlock, cat({Bytes{0x82, 0, 2, kXiphLacing, 2}, filler(150, 0xFF)})),
-                 simple_block(1, 3, 0, big), simple_block(3, 4, 0, big)})},
+       cat({Clusters({simple_block(1, 0, 0, big), simple_block(3, 1, 0, big),
+                      element(kSimpleBlock, cat({Bytes{0x82, 0, 2, kXiphLacing, 2}, filler(150, 0xFF)})),
+                      simple_block(1, 3, 0, big), simple_block(3, 4, 0, big)}),
+            simple_block(3, 5, 0, big)})},
       {"invalid_ebml_lace_size",
        Clusters({simple_block(1, 0, 0, big), simple_block(3, 1, 0, big),
                  element(kSimpleBlock, cat({Bytes{0x82, 0, 2, kEbmlLacing, 1, 0x00}, filler(140)})),
@@ -68,7 +70,8 @@ TEST(ClusterFuzzRegressionTest, InputsPassEveryCheckOfTheFuzzTarget) {
        Clusters({Group({uinteger(kBlockDuration, 5), block(1, 0, 0, one)}),
                  Group({block(2, 1, 0, one), element(kDiscardPadding, Bytes{0x01}), uinteger(kReferenceBlock, 3)}),
                  xiph_laced_block(3, 2, 0, laced), ebml_laced_block(1, 3, 0, laced), element(0xEC, filler(3)),
-                 simple_block(200, 4, 0, one), simple_block(2, 5, 0, one), Group({block(3, 6, 0, one)})})},
+                 simple_block(200, 4, 0, one), simple_block(2, 5, 0, one), Group({block(3, 6, 0, one)}),
+                 element(kVoid, filler(40, 0x80))})},  // which would pass for a block, were it one
   };
   for (const auto& row : rows) {
     EXPECT_EQ(testing_support::RunClusterFuzzInput(row.input.data(), row.input.size()), "") << row.name;

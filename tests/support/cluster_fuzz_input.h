@@ -169,8 +169,10 @@ inline std::string RunClusterFuzzInput(const uint8_t* data, size_t size) {
   std::set<uint64_t> tracks;
   for (const DrivenBlock& block : whole.blocks) tracks.insert(block.track);
   for (uint64_t own : tracks) {
-    if (Walk(file + start, file_size - start, own, true) != Walk(file + start, file_size - start, own, false)) {
-      return "the unlaced-block shortcut leaves another record than the parser for track " + std::to_string(own);
+    if (Walk(file + start, file_size - start, own, true) != Walk(file + start, file_size - start, own, false) ||
+        host::LiveBlockCount() != live) {
+      return "the unlaced-block shortcut leaves another record than the parser, or a block, for track " +
+             std::to_string(own);
     }
   }
   return "";
