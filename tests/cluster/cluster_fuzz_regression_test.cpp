@@ -48,20 +48,20 @@ TEST(ClusterFuzzRegressionTest, InputsPassEveryCheckOfTheFuzzTarget) {
                  Group({block(2, 4, 0, big), uinteger(kBlockDuration, 7), uinteger(kReferencePriority, 2)}),
                  Group({block(3, 5, 0, big), sinteger(kReferenceBlock, -3, 8)}), simple_block(3, 6, 0, big),
                  simple_block(1, 7, 0, big), Group({block(2, 8, 0, big)}), Group({block(1, 9, 0, big)})})},
-      // Other tracks' laced blocks passed by their sizes in a run, up to the own block, laced or not.
+      // Other tracks' laced blocks passed by their sizes in a run, up to the own block, laced or not; after
+      // the last Cluster, a block outside any Cluster that a run must not take.
       {"laced_runs",
-       Clusters({xiph_laced_block(2, 0, 0, numbered_frames(5, 300)),
-                 simple_block(3, 1, kFixedLacing, numbered_frames(4, 64)),
-                 ebml_laced_block(4, 2, 0, numbered_frames(3, 200)), simple_block(1, 3, 0, big),
-                 xiph_laced_block(1, 4, 0, numbered_frames(2, 150)), simple_block(2, 5, 0, big),
-                 ebml_laced_block(3, 6, 0, numbered_frames(6, 40)), simple_block(4, 7, 0, big)})},
+       cat({Clusters({xiph_laced_block(2, 0, 0, numbered_frames(5, 300)),
+                      simple_block(3, 1, kFixedLacing, numbered_frames(4, 64)),
+                      ebml_laced_block(4, 2, 0, numbered_frames(3, 200)), simple_block(1, 3, 0, big),
+                      xiph_laced_block(1, 4, 0, numbered_frames(2, 150)), simple_block(2, 5, 0, big),
+                      ebml_laced_block(3, 6, 0, numbered_frames(6, 40)), simple_block(4, 7, 0, big)}),
+            simple_block(4, 8, 0, big)})},
       // A Xiph lace table that runs past its block, and an EBML one with an invalid size: the parser's to read.
-      // After the last Cluster, a block outside any Cluster that a run must not take.
       {"bad_lace_tables",
-       cat({Clusters({simple_block(1, 0, 0, big), simple_block(3, 1, 0, big),
-                      element(kSimpleBlock, cat({Bytes{0x82, 0, 2, kXiphLacing, 2}, filler(150, 0xFF)})),
-                      simple_block(1, 3, 0, big), simple_block(3, 4, 0, big)}),
-            simple_block(3, 5, 0, big)})},
+       Clusters({simple_block(1, 0, 0, big), simple_block(3, 1, 0, big),
+                 element(kSimpleBlock, cat({Bytes{0x82, 0, 2, kXiphLacing, 2}, filler(150, 0xFF)})),
+                 simple_block(1, 3, 0, big), simple_block(3, 4, 0, big)})},
       {"invalid_ebml_lace_size",
        Clusters({simple_block(1, 0, 0, big), simple_block(3, 1, 0, big),
                  element(kSimpleBlock, cat({Bytes{0x82, 0, 2, kEbmlLacing, 1, 0x00}, filler(140)})),
