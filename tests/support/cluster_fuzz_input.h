@@ -70,23 +70,24 @@ inline bool SameBlocks(const DriveOutcome& a, const DriveOutcome& b, bool keys) 
 
 // The record's fields one after another, owned tables by their contents, then
 // `position`. Not its padding: a copy of a whole member, such as
-// `number = {}`, may fill that with whatever lay in the copied temporary.
-// Between blocks the lace table's working values (index, sum, entries past
-// the count) are left over from whichever laced block the parser read last
-// and are set afresh before any use: the shortcut, passing other tracks'
-// laced blocks unread, may leave others.
+// `number = {}`, may fill that with whatever lay in the copied temporary. Nor
+// the lace table's working values (count, index, sum, entries) unless a table
+// is being read: else they are left over from whichever laced block the parser
+// read last, and set afresh before any use; the shortcut, passing other
+// tracks' laced blocks unread, may leave others.
 inline std::string Snapshot(const mkvcluster& c, uint64_t position) {
   const mkv_cluster_resume& r = c.resume;
-  const bool between = r.step == mkv_resume_step::none;
   std::string out;
   auto put = [&out](const auto&... field) { (out.append(reinterpret_cast<const char*>(&field), sizeof field), ...); };
   put(c.cluster_timecode, c.cluster_position, c.cluster_prevsize, c.in_blockgroup, c.block_duration,
       c.reference_priority, c.reference_block, c.codec_state_size, c.blockgroup_size, c.blockgroup_start,
       c.blockgroup_end, c.track_number, c.block_timecode, c.block_flags, c.frame_count, c.block_data_left,
       c.block_start, c.block_end, c.cluster_size, c.cluster_start, c.cluster_end, r.step, r.header_part, r.id,
-      r.number.value, r.number.left, r.number.length, r.payload_left, r.lace_count, r.data_left, position);
-  if (!between) put(r.lace_index, r.lace_sum);
-  out.append(reinterpret_cast<const char*>(r.lace_sizes), (between ? r.lace_count : kMaxLaceFrames) * sizeof(int64_t));
+      r.number.value, r.number.left, r.number.length, r.payload_left, r.data_left, position);
+  if (r.step == mkv_resume_step::lace_table) {
+    put(r.lace_count, r.lace_index, r.lace_sum);
+    out.append(reinterpret_cast<const char*>(r.lace_sizes), (r.lace_index + 1u) * sizeof(int64_t));
+  }
   put(c.codec_state != nullptr, c.frame_sizes != nullptr);
   if (c.codec_state) out.append(reinterpret_cast<const char*>(c.codec_state), c.codec_state_size);
   if (c.frame_sizes) out.append(reinterpret_cast<const char*>(c.frame_sizes), c.frame_count * sizeof(int64_t));
