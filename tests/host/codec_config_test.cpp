@@ -187,6 +187,7 @@ TEST(DecoderConfigTest, ConfigurationsGiveTheirPictureShape) {
       {"no aspect_ratio_info", avc({.aspect_idc = -1}), kAvc1, true, {320, 240, 33, 44}},
       {"no VUI", avc({.aspect_idc = -2}), kAvc1, true, {320, 240, 33, 44}},
       {"chroma_format_idc 4", avc({.chroma_format_idc = 4}), kAvc1, false, {11, 22, 33, 44}},
+      {"bit depth 14", avc({.bit_depth_minus8 = 6}), kAvc1, true, {320, 240, 4, 3}},
       {"bit depth 15", avc({.bit_depth_minus8 = 7}), kAvc1, false, {11, 22, 33, 44}},
       {"picture order type 3", avc({.poc_type = 3}), kAvc1, false, {11, 22, 33, 44}},
       {"picture order cycle of 256", avc({.poc_type = 1, .poc_cycle = 256}), kAvc1, false, {11, 22, 33, 44}},

@@ -352,6 +352,16 @@ std::vector<Case> Cases() {
          EXPECT_EQ(c.channel(1).Format.fourcc, 0u);
          EXPECT_TRUE(log.Contains(5, "kelvane:  track 0 is encrypted.  Encryption not supported."));
        }},
+      {"an encrypted track in the last of the 100 track slots",
+       File(cat({[] { Bytes opus; for (uint64_t i = 1; i < 100; ++i) opus = cat({opus, Track(i, kAudio, "A_OPUS")}); return opus; }(),
+                 Track(100, kAudio, "A_AAC",
+                       master(kContentEncodings, {master(kContentEncoding, {uinteger(kContentEncodingType, 1),
+                                                                            master(kContentEncryption, {})})}))})),
+       [](const Connected& c, const LogRecorder& log) {
+         ASSERT_EQ(c.channel_count(), 1);
+         EXPECT_EQ(HostPlugin().output()->AcquireOutputChannel(AsFrameworkChannel(&c.channel(0))), 4044);
+         EXPECT_TRUE(log.Contains(2, "kelvane: AcquireOutputChannel channel 0 has no track: track 100 is encrypted."));
+       }},
       {"vorbis, AVC and a subtitle track",
        File(cat({Track(1, kAudio, "A_VORBIS"), Track(2, kVideo, "V_MPEG4/ISO/AVC"), Track(3, 17, "S_TEXT/UTF8")})),
        [](const Connected& c, const LogRecorder&) {

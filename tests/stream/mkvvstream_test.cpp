@@ -101,6 +101,7 @@ TEST(VstreamInitTest, RefusesWhatCannotBeBufferedAndLeavesNothingBehind) {
     host::FailNthAllocation(c.failing_allocation);
     EXPECT_EQ(mkvvstream_init(c.null_stream ? nullptr : &stream, c.input, c.size, 1, kFillWithRead, 1), -1) << c.name;
     host::FailNthAllocation(0);
+    mkvvstream_destroy(c.null_stream ? nullptr : &stream);  // safe on what init refused
     EXPECT_EQ(stream.buffer, nullptr) << c.name;
     EXPECT_EQ(host::LiveBlockCount(), live) << c.name;
   }
