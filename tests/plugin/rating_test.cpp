@@ -18,6 +18,7 @@
 #include "core/flac_config.h"
 #include "host/heap_control.h"
 #include "tests/plugin/graph_harness.h"
+#include "tests/support/allocation_failures.h"
 #include "tests/support/ebml_builder.h"
 #include "tests/support/fixtures.h"
 #include "tests/support/log_recorder.h"
@@ -538,30 +539,17 @@ TEST(RateInputFormatLifecycleTest, EveryFailedAllocationRefusesTheStreamWithoutL
       ASSERT_EQ(instance.Rate(1, &claim), 80);
       full_entries = AsMkvFilter(instance.handle)->Context->Metadata->entry_count;
     }
-    bool reached_end = false;
-    for (uint64_t n = 1; !reached_end && n < 5000; ++n) {
-        int64_t live = host::LiveBlockCount();
-      {
-        Instance instance(*stream);
-        ASSERT_NE(instance.handle, nullptr);
-        uint32_t claim = 0;
-        uint64_t before = host::AllocationCount();
-        host::FailNthAllocation(n);
-        int rating = instance.Rate(1, &claim);
-        host::FailNthAllocation(0);
-        reached_end = host::AllocationCount() - before < n;
-        const mkv_metadata_list* metadata = AsMkvFilter(instance.handle)->Context->Metadata;
-        if (reached_end) {
-          EXPECT_EQ(rating, 80);
-        } else if (rating != 0) {
-          EXPECT_EQ(rating, 80) << "allocation " << n;
-          ASSERT_NE(metadata, nullptr);
-          EXPECT_LT(metadata->entry_count, full_entries) << "allocation " << n;
-        }
-      }
-      EXPECT_EQ(host::LiveBlockCount(), live) << "allocation " << n;
-    }
-    EXPECT_TRUE(reached_end);
+    EXPECT_GT(testing_support::EachAllocationFailing([&](uint64_t n) {
+      Instance instance(*stream);
+      uint32_t claim = 0;
+      testing_support::FailingAllocation failing(n);
+      const int rating = instance.Rate(1, &claim);
+      const bool reached = failing.Reached();
+      EXPECT_TRUE(rating == 80 || (reached && rating == 0)) << "allocation " << n << ": " << rating;
+      const mkv_metadata_list* metadata = AsMkvFilter(instance.handle)->Context->Metadata;
+      EXPECT_TRUE(rating == 0 || !reached || (metadata && metadata->entry_count < full_entries)) << "allocation " << n;
+      return reached;
+    }), 10u);
   }
 }
 
