@@ -288,7 +288,10 @@ constexpr uint32_t kOwnGroup = UINT32_MAX;
 // Block, read in place as the parser reads them. True once the read position
 // is past the group; false at a child of another kind or one that does not
 // lie whole in inbuff1, after the values before it: the parser goes on from there.
+// A group that runs past the Cluster's end is the parser's from the start: it
+// reads such a group's children on past that end, in the same call.
 inline bool finish_group_values(mkvinbuff* inbuff1, mkvcluster* cluster) {
+  if (cluster->blockgroup_end > cluster->cluster_end) return false;
   // Most often the group ends with one ReferenceBlock of one byte (FB 81 xx).
   const uint64_t start = inbuff1->buff_fileoff + inbuff1->buff_pos;
   if (start + 3 == cluster->blockgroup_end && start + 3 <= cluster->cluster_end &&
