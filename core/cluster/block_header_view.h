@@ -21,7 +21,9 @@ using block_flags::kLacingBits;
 // Sizes up to here keep the parser's 32-bit block arithmetic exact.
 constexpr uint64_t kLargestExactSize = 0x7FFFFFFF;
 // The longest header taken here: BlockGroup ID and size, Block ID and size,
-// track number, timecode and flags. Closer to the end of inbuff1 the parser reads it.
+// track number, timecode and flags. Closer to the end of inbuff1 the parser
+// reads it, and closer to the Cluster's end too: the parser does not return a
+// block whose header reaches that end, but reads on from there.
 constexpr uint32_t kLongestHeader = 1 + 8 + 1 + 8 + 8 + 3;
 
 // A size or track number at `at` (marker removed): its length, or 0 when
@@ -49,7 +51,7 @@ constexpr uint32_t kLongestHeader = 1 + 8 + 1 + 8 + 8 + 3;
 
 // Where inbuff1 allows a run of block headers, from its read position:
 // headers start before both its last kLongestHeader bytes and the Cluster's
-// end (`stop`), and blocks passed whole end by `limit`. Offsets from inbuff1's start.
+// (`stop`), and blocks passed whole end by `limit`. Offsets from inbuff1's start.
 struct run_window {
   const uint8_t* buff;
   uint32_t first;  // the read position
@@ -67,7 +69,8 @@ struct run_window {
                     inbuff1->buff_pos,
                     total,
                     fileoff,
-                    static_cast<uint32_t>(std::min<uint64_t>(total - kLongestHeader + 1, cluster_left)),
+                    static_cast<uint32_t>(std::min<uint64_t>(
+                        total - kLongestHeader + 1, cluster_left > kLongestHeader ? cluster_left - kLongestHeader : 0)),
                     static_cast<uint32_t>(std::min<uint64_t>(total, cluster_left))};
 }
 
@@ -285,7 +288,10 @@ constexpr uint32_t kOwnGroup = UINT32_MAX;
 // Block, read in place as the parser reads them. True once the read position
 // is past the group; false at a child of another kind or one that does not
 // lie whole in inbuff1, after the values before it: the parser goes on from there.
+// A group that runs past the Cluster's end is the parser's from the start: it
+// reads such a group's children on past that end, in the same call.
 inline bool finish_group_values(mkvinbuff* inbuff1, mkvcluster* cluster) {
+  if (cluster->blockgroup_end > cluster->cluster_end) return false;
   // Most often the group ends with one ReferenceBlock of one byte (FB 81 xx).
   const uint64_t start = inbuff1->buff_fileoff + inbuff1->buff_pos;
   if (start + 3 == cluster->blockgroup_end && start + 3 <= cluster->cluster_end &&

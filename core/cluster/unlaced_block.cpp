@@ -19,7 +19,7 @@ bool take_one(mkvinbuff* inbuff1, mkvcluster* cluster, uint64_t own_track, bool*
   if (inbuff1->buff_left < kLongestHeader) return false;
   const uint8_t* const start = inbuff1->buff + inbuff1->buff_pos;
   const uint64_t position = inbuff1->buff_fileoff + inbuff1->buff_pos;
-  if (position >= cluster->cluster_end) return false;
+  if (position + kLongestHeader >= cluster->cluster_end) return false;
   block_header_view h;
   if (!decode_header(start, &h)) return false;
   const int32_t data = data_size(h);

@@ -32,9 +32,11 @@ TEST(ClusterFuzzRegressionTest, InputsPassEveryCheckOfTheFuzzTarget) {
        {0x60, 0x00, 0x80, 0x01, 0x1F, 0x43, 0xB6, 0x75, 0x77, 0xC0, 0x00, 0x00, 0xA0, 0x01, 0x00,
         0x60, 0x20, 0x00, 0x16, 0x6A, 0x18, 0xA4, 0x81, 0x81, 0x81, 0x81, 0x1F}},
       // Built: every track's blocks walked by the unlaced-block shortcut beside the parser.
+      // Last, an empty frame, whose header ends at the Cluster's end: the parser reads on from there.
       {"simple_blocks", Clusters({simple_block(1, 0, kKeyFrame, one), simple_block(2, 3, kKeyFrame, one),
                                   simple_block(3, 5, 0, big), simple_block(2, -7, 0, one),
-                                  simple_block(1, 9, 0x08, big), simple_block(3, 11, 0, one)})},
+                                  simple_block(1, 9, 0x08, big), simple_block(3, 11, 0, one),
+                                  simple_block(1, 12, 0, numbered_frames(1, 0))})},
       {"groups_with_values",
        Clusters({Group({block(1, 0, 0, one), uinteger(kReferenceBlock, 0xFF9C, 2)}),
                  Group({block(2, 4, 0, big), uinteger(kBlockDuration, 24), uinteger(kReferencePriority, 3)}),
