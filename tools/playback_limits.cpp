@@ -120,13 +120,16 @@ void PlaybackLimits::Settle(host::RunResult* result) const {
     if (limits_.frames) end = std::min<size_t>(end, start + *limits_.frames);
     run.frames.resize(end);
   }
-  if (stopped_ && !result->ok) {
-    const bool ended = std::all_of(result->channels.begin(), result->channels.end(), [](const host::ChannelRun& run) {
-      return run.end_result == kMmfEndOfStream || run.end_result == kControlStopped;
-    });
-    if (ended) {
-      result->ok = true;
-      result->error.clear();
-    }
+  if (!stopped_) return;
+  const bool ended = std::all_of(result->channels.begin(), result->channels.end(), [](const host::ChannelRun& run) {
+    return run.end_result == kMmfEndOfStream || run.end_result == kControlStopped;
+  });
+  if (!ended) return;
+  // The stop was the limits' own: a channel it caught waiting for room or input
+  // ended where it was asked to, as one that reached the end of the file first.
+  result->ok = true;
+  result->error.clear();
+  for (host::ChannelRun& run : result->channels) {
+    if (run.end_result == kControlStopped) run.end_result = kMmfEndOfStream;
   }
 }
