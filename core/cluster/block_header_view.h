@@ -50,8 +50,8 @@ constexpr uint32_t kLongestHeader = 1 + 8 + 1 + 8 + 8 + 3;
 }
 
 // Where inbuff1 allows a run of block headers, from its read position:
-// headers start before both its last kLongestHeader bytes and the Cluster's
-// (`stop`), and blocks passed whole end by `limit`. Offsets from inbuff1's start.
+// headers start before the last kLongestHeader bytes of both it and the
+// Cluster (`stop`), and blocks passed whole end by `limit`. Offsets from inbuff1's start.
 struct run_window {
   const uint8_t* buff;
   uint32_t first;  // the read position
@@ -294,8 +294,7 @@ inline bool finish_group_values(mkvinbuff* inbuff1, mkvcluster* cluster) {
   if (cluster->blockgroup_end > cluster->cluster_end) return false;
   // Most often the group ends with one ReferenceBlock of one byte (FB 81 xx).
   const uint64_t start = inbuff1->buff_fileoff + inbuff1->buff_pos;
-  if (start + 3 == cluster->blockgroup_end && start + 3 <= cluster->cluster_end &&
-      inbuff1->buff_left >= kLongestValue) {
+  if (start + 3 == cluster->blockgroup_end && inbuff1->buff_left >= kLongestValue) {
     const uint8_t* at = inbuff1->buff + inbuff1->buff_pos;
     if (at[0] == cluster_id::kReferenceBlock && at[1] == 0x81) {
       cluster->reference_block = static_cast<int8_t>(at[2]);
@@ -307,7 +306,7 @@ inline bool finish_group_values(mkvinbuff* inbuff1, mkvcluster* cluster) {
   }
   for (;;) {
     const uint64_t position = inbuff1->buff_fileoff + inbuff1->buff_pos;
-    if (position >= cluster->blockgroup_end || position >= cluster->cluster_end) return true;
+    if (position >= cluster->blockgroup_end) return true;  // within the Cluster, as checked above
     if (inbuff1->buff_left < kLongestValue) return false;
     const uint8_t* at = inbuff1->buff + inbuff1->buff_pos;
     const uint32_t length = group_value_length(at);
