@@ -38,34 +38,40 @@ std::ostream& operator<<(std::ostream& out, const Read& r) {
   return out << "{" << r.time << " us at " << r.offset << ", " << r.bytes << " bytes}";
 }
 
-// long_cues with the streamer, its list maker and the graph clock connected
-// as the framework connects them; `channels` are the outputs acquired.
+// A file with the streamer, its list maker and the graph clock connected as
+// the framework connects them; `channels` are the outputs acquired. With
+// `plays` the plug-in reads its input from the streamer in buffers of 4096.
 class TrickPlayTest : public testing::Test {
  protected:
-  void Connect(const std::string& name, std::vector<int32_t> channels) {
+  void Connect(const std::string& name, std::vector<int32_t> channels, bool plays = false) {
     host::SetupOptions options;
-    options.buffer_size = kBufferSize;
     options.configure_outputs = false;
-    connected_ = plugin_test::ConnectFile(name, true, options);
+    host::StreamerConfig config{kBufferSize, 16};
+    if (plays) {
+      options.upstream = host::FileStreamer::Ops();
+      options.input_pool = host::MemoryPool::Ops();
+      options.input_pool_param = pool_.handle();
+      config = {4096, 128};
+    } else {
+      options.buffer_size = kBufferSize;
+    }
+    connected_ = plugin_test::ConnectStreamed(name, config, options);
     ASSERT_TRUE(connected_.graph->rated());
     handle_ = connected_.graph->handle();
     for (int32_t k : channels) {
       ASSERT_EQ(HostPlugin().output()->AcquireOutputChannel(AsFrameworkChannel(&connected_.channel(k))), 0);
     }
-    source_ = host::OpenFileStream(plugin_test::FixtureFile(name), true);
-    streamer_ = std::make_unique<host::FileStreamer>(source_.get(), host::StreamerConfig{kBufferSize, 16});
-    handle_->InputChannel->Peer = streamer_->output();
-    streamer_->ConnectListMaker(HostPlugin().Get<MmfListMakerOps>("MediaListMaker"), handle_->InputChannel);
-    ASSERT_EQ(streamer_->Seek(static_cast<uint64_t>(connected_.stream->Tell()), 0), 0);
     host::AttachGraphClock(handle_->Graph, &clock_);
   }
 
   void TearDown() override {
-    if (handle_) host::AttachGraphClock(handle_->Graph, nullptr);
     if (!handle_) return;
+    host::AttachGraphClock(handle_->Graph, nullptr);
     for (int32_t k = 0; k < connected_.channel_count(); ++k) {
       (void)HostPlugin().output()->ReleaseOutputChannel(AsFrameworkChannel(&connected_.channel(k)));
     }
+    connected_.graph.reset();
+    handle_ = nullptr;
   }
 
   // What the streamer reads until it ends or `limit` buffers were read.
@@ -74,7 +80,7 @@ class TrickPlayTest : public testing::Test {
     int result = kMmfBufferDelivered;
     for (int n = 0; n < limit && result == kMmfBufferDelivered; ++n) {
       MmfMra* mra = nullptr;
-      result = host::FileStreamer::Ops()->NextBuffer(streamer_->output(), &mra);
+      result = host::FileStreamer::Ops()->NextBuffer(connected_.streamer->output(), &mra);
       if (result != kMmfBufferDelivered) break;
       uint32_t type = 0, low = 0, element = 0;
       uint16_t high = 0;
@@ -101,10 +107,9 @@ class TrickPlayTest : public testing::Test {
   MkvContext* context() { return connected_.context(); }
 
   playback_test::CueModel cues_{"long_cues"};
+  host::MemoryPool pool_{65536, 8};
   plugin_test::Connected connected_;
   MmfFilterHandle* handle_ = nullptr;
-  std::unique_ptr<host::InputStream> source_;
-  std::unique_ptr<host::FileStreamer> streamer_;
   host::GraphClock clock_;
 };
 
@@ -294,63 +299,47 @@ TEST_F(TrickPlayTest, AFailedFrameworkCallFailsEveryScanAndSaysSo) {
   }
 }
 
-constexpr uint32_t kForward = 512;
-constexpr uint32_t kSpeed = 100;         // with TrickTime 500 ms: a step of 1 s
-constexpr int32_t kRequestBytes = 16384;  // several Clusters; a read past the end of the file ends the stream
-constexpr int kFirstCue = 4;
-
-// Requests longer than TrickTime's bytes (several Clusters each): the channel
-// still delivers only the first TrickTime of media after each jump.
-TEST(TrickPlaybackTest, ScanForwardDeliversTheFirstTrickTimeAfterEachJump) {
+// Requests longer than TrickTime's bytes (several Clusters each, 16384 bytes:
+// a read past the end of the file ends the stream): the channel still
+// delivers only the first TrickTime of media after each jump.
+TEST_F(TrickPlayTest, ScanForwardDeliversTheFirstTrickTimeAfterEachJump) {
   using namespace playback_test;
-  const CueModel cues("long_cues");
+  constexpr int kFirstCue = 4;
+  constexpr int32_t kRequestBytes = 16384;
   const uint64_t file_size = testing_support::ReadFixtureBytes("long_cues").size();
-  host::MemoryPool pool(65536, 8);
-  auto source = host::OpenFileStream(plugin_test::FixtureFile("long_cues"), true);
-  host::FileStreamer streamer(source.get(), host::StreamerConfig{4096, 128});
-  host::SetupOptions options;
-  options.configure_outputs = false;
-  options.upstream = host::FileStreamer::Ops();
-  options.input_pool = host::MemoryPool::Ops();
-  options.input_pool_param = pool.handle();
-  plugin_test::Connected connected = plugin_test::ConnectFile("long_cues", true, options);
-  ASSERT_TRUE(connected.graph->rated());
+  Connect("long_cues", {}, true);
   const host::Plugin& plugin = plugin_test::HostPlugin();
-  MmfFilterHandle* handle = connected.graph->handle();
-  MmfChannel* video = AsFrameworkChannel(&connected.channel(0));
-  const host::OutputChannelSetup& setup = connected.graph->outputs()[0];
+  MmfChannel* video = AsFrameworkChannel(&connected_.channel(0));
   ASSERT_EQ(plugin.output()->AcquireOutputChannel(video), 0);
-  ASSERT_EQ(plugin.output()->SetOutputFormat(video, &setup.offered), 0);
-  ASSERT_EQ(plugin.output()->SetOutputChannelMemoryPool(video, host::MemoryPool::Ops(), pool.handle()), 0);
-  handle->InputChannel->Peer = streamer.output();
-  streamer.ConnectListMaker(plugin.Get<MmfListMakerOps>("MediaListMaker"), handle->InputChannel);
+  ASSERT_EQ(plugin.output()->SetOutputFormat(video, &connected_.graph->outputs()[0].offered), 0);
+  ASSERT_EQ(plugin.output()->SetOutputChannelMemoryPool(video, host::MemoryPool::Ops(), pool_.handle()), 0);
 
   // The first request of a forward scan, as a scan would fill it.
-  MkvContext* context = connected.context();
+  MkvContext* context = connected_.context();
   ASSERT_NE(context->ByteRate, 0);
   ASSERT_EQ(MmfAcquireReadList(context->ReadList, &context->CurrentReadList), 0);
   MmfReadRequest& first = *context->CurrentReadList->Request;
-  first.Position = cues.positions[kFirstCue];
-  first.Time = cues.times[kFirstCue];
+  first.Position = cues_.positions[kFirstCue];
+  first.Time = cues_.times[kFirstCue];
   first.Length = kRequestBytes;
   context->CurrentReadList->Ready = 1;
-  context->TrickMode = kForward;
-  context->TrickSpeed = kSpeed;
-  ASSERT_EQ(plugin.Get<MmfMediaControlOps>("MediaControl")->Start(handle), 0);
-  ASSERT_EQ(streamer.SetListMode(1), 0);
+  context->TrickMode = 512;  // forward
+  context->TrickSpeed = 100;  // with TrickTime 500 ms: a step of 1 s
+  ASSERT_EQ(plugin.Get<MmfMediaControlOps>("MediaControl")->Start(handle_), 0);
+  ASSERT_EQ(connected_.streamer->SetListMode(1), 0);
 
   // Each step: the first cue point after the last one's time + 1 s, until none
   // is left or a request reaches the end of the file.
   const uint64_t window = 1000 * static_cast<uint64_t>(context->TrickTime);
   std::vector<Frame> expected;
   for (size_t cue = kFirstCue;;) {
-    for (const Listed& f : cues.tracks.at(1)) {
-      if (f.time_us >= cues.times[cue] && f.time_us <= cues.times[cue] + window) expected.push_back(f);
+    for (const Listed& f : cues_.tracks.at(1)) {
+      if (f.time_us >= cues_.times[cue] && f.time_us <= cues_.times[cue] + window) expected.push_back(f);
     }
     // The streamer ends the stream when a request reads into the end of the file.
-    if (cues.positions[cue] + kRequestBytes >= file_size) break;
-    const size_t next = cues.Forward(cues.times[cue] + 2 * window);
-    if (cues.times[next] <= cues.times[cue] + 2 * window) break;
+    if (cues_.positions[cue] + kRequestBytes >= file_size) break;
+    const size_t next = cues_.Forward(cues_.times[cue] + 2 * window);
+    if (cues_.times[next] <= cues_.times[cue] + 2 * window) break;
     cue = next;
   }
 
@@ -380,8 +369,7 @@ TEST(TrickPlaybackTest, ScanForwardDeliversTheFirstTrickTimeAfterEachJump) {
   }
   EXPECT_EQ(result, kMmfEndOfStream);
   EXPECT_EQ(FirstDifference(got, expected), "");
-  plugin.Get<MmfMediaFlushOps>("MediaFlush")->Flush(handle);
-  plugin.output()->ReleaseOutputChannel(video);
+  plugin.Get<MmfMediaFlushOps>("MediaFlush")->Flush(handle_);
 }
 
 }  // namespace

@@ -15,6 +15,7 @@
 #include "host/graph_runner.h"
 #include "host/memory_pools.h"
 #include "tests/support/cluster_driver.h"
+#include "tests/support/cue_rules.h"
 #include "tests/support/fixtures.h"
 
 namespace playback_test {
@@ -165,19 +166,8 @@ struct CueModel {
     }
   }
 
-  // The first cue point after t, or the last.
-  size_t Forward(uint64_t t) const {
-    size_t f = 0;
-    while (f + 1 < times.size() && times[f] <= t) ++f;
-    return f;
-  }
-  // The last cue point at or before t (the first when none is), except that
-  // the last one's own time gives the one before.
-  size_t Backward(uint64_t t) const {
-    const size_t f = Forward(t);
-    if (times[f] > t) return f == 0 ? 0 : f - 1;
-    return t > times[f] || f == 0 ? f : f - 1;
-  }
+  size_t Forward(uint64_t t) const { return testing_support::ChosenCue(times, t, true); }
+  size_t Backward(uint64_t t) const { return testing_support::ChosenCue(times, t, false); }
   // Index in `track`'s frames of its first frame in the Cluster of cue point
   // `cue`: a Cluster opens with its cue track's block at the cue time.
   size_t FirstFrameInCluster(uint64_t track, size_t cue) const {
