@@ -1,8 +1,8 @@
 // Playback control on a running graph (streamer, kelvane, one sink thread
 // per channel): the control state machine, seeks with and without preroll,
-// scans and their end, and random seeks, pauses and resumes on channel
-// threads. What each channel delivers after a seek or a jump is checked
-// against the fixtures' cue tables and block lists from mkvinfo.
+// and random seeks, pauses, resumes and scans on channel threads. What each
+// channel delivers after a seek is checked against the fixtures' cue tables
+// and block lists from mkvinfo.
 
 #include <mutex>
 #include <random>
@@ -209,74 +209,6 @@ TEST(ControlledSeekWithoutCuesTest, ZeroReplaysAndAnyOtherTimeIsRefusedWithoutLo
     EXPECT_EQ(Follows(Segment(run, 2), listed, 0, true), "") << "the seek to 0 plays it all again";
   }
 }
-
-// The groups of a scan: each jump's time marker heads the first frame delivered after it.
-std::vector<std::vector<host::RunFrame>> Jumps(const std::vector<host::RunFrame>& frames) {
-  std::vector<std::vector<host::RunFrame>> jumps;
-  for (const host::RunFrame& frame : frames) {
-    if (frame.marked || jumps.empty()) jumps.emplace_back();
-    jumps.back().push_back(frame);
-  }
-  return jumps;
-}
-
-struct ScanCase {
-  const char* name;
-  bool forward;
-  uint32_t speed;
-  uint64_t from_us;  // a seek goes there first, and the scan starts as the clock reads it
-};
-
-class ControlledScanTest : public testing::TestWithParam<ScanCase> {};
-
-// Video only: each jump opens a Cluster at a cue point and delivers its frames
-// in file order up to TrickTime (500 ms) after the cue's time; each next cue
-// point is the one the time moved by TrickTime and the speed leads to, and the
-// scan ends at the end of the cue table.
-TEST_P(ControlledScanTest, EachJumpDeliversTheFirstTrickTimeOfTheNextCuePointsCluster) {
-  const ScanCase& c = GetParam();
-  CueModel fx("long_cues");
-  const auto kind = c.forward ? host::ControlAction::kScanForward : host::ControlAction::kScanBackward;
-  host::RunnerOptions options = Options({SeekTo(c.from_us, 0), {kind, c.from_us, 0, c.speed}});
-  options.channels = {0};
-  options.trick_time_ms = 500;
-  host::RunResult result = Play(options);
-  ASSERT_TRUE(result.ok) << result.error;
-  ASSERT_EQ(result.control_results, (std::vector<int>{0, 0}));
-  const host::ChannelRun& run = result.channels.at(0);
-  const std::vector<Listed>& listed = fx.tracks.at(1);
-  ASSERT_EQ(run.seeks.size(), 2u);
-  const auto jumps = Jumps(Segment(run, 2));
-  // Sinks run free: one output buffer may take the clock far ahead before the scan starts.
-  ASSERT_FALSE(jumps.empty());
-  const uint64_t skip = 500 * (1000 * uint64_t(c.speed)) / 100;
-  size_t cue = fx.Forward(jumps[0][0].time_us - 1);
-  ASSERT_EQ(fx.times[cue], jumps[0][0].time_us) << "the first jump lands on a cue point";
-  if (c.forward) {
-    EXPECT_GT(jumps[0][0].time_us, c.from_us) << "the scan starts after the clock's time";
-  }
-  for (size_t k = 0; k < jumps.size(); ++k) {
-    SCOPED_TRACE("jump " + std::to_string(k) + " to " + std::to_string(fx.times[cue]));
-    const uint64_t t = fx.times[cue];
-    std::vector<Listed> window;
-    for (size_t i = fx.FirstFrameInCluster(1, cue); i < listed.size(); ++i) {
-      if (listed[i].time_us >= t && listed[i].time_us <= t + 500000) window.push_back(listed[i]);
-    }
-    EXPECT_EQ(Follows(jumps[k], window, 0, false), "");
-    const size_t next = c.forward ? fx.Forward(t + 500000 + skip) : fx.Backward(t > skip ? t - skip : t);
-    if (k + 1 == jumps.size()) {
-      EXPECT_EQ(fx.times[next], t) << "the last jump is at the end of the cue table";
-    }
-    cue = next;
-  }
-}
-
-INSTANTIATE_TEST_SUITE_P(LongCues, ControlledScanTest,
-                         testing::Values(ScanCase{"FastForwardSpeed100", true, 100, 2000000},
-                                         ScanCase{"FastForwardSpeed300", true, 300, 1000000},
-                                         ScanCase{"RewindSpeed100", false, 100, 15000000},
-                                         ScanCase{"RewindSpeed250", false, 250, 22000000}),
-                         [](const testing::TestParamInfo<ScanCase>& info) { return info.param.name; });
 
 struct StressCase {
   const char* file;

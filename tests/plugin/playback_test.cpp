@@ -24,38 +24,34 @@
 
 namespace {
 
-using ebml::Bytes;
+using namespace ebml;
 
 // Info and Tracks of a file with one MP3 track (of another type if asked).
 Bytes AudioHeader(uint64_t track_type = 2) {
-  Bytes tracks = ebml::master(ebml::kTracks, {ebml::master(ebml::kTrackEntry, {
-      ebml::uinteger(ebml::kTrackNumber, 1), ebml::uinteger(ebml::kTrackUid, 1), ebml::uinteger(ebml::kTrackType, track_type),
-      ebml::str(ebml::kCodecId, "A_MPEG/L3"),
-      ebml::master(ebml::kAudio, {ebml::f64(ebml::kSamplingFrequency, 44100), ebml::uinteger(ebml::kChannels, 1)})})});
-  return ebml::cat({ebml::master(ebml::kInfo, {ebml::uinteger(ebml::kTimecodeScale, 1000000)}), tracks});
+  Bytes tracks = master(kTracks, {master(kTrackEntry, {uinteger(kTrackNumber, 1), uinteger(kTrackUid, 1),
+      uinteger(kTrackType, track_type), str(kCodecId, "A_MPEG/L3"),
+      master(kAudio, {f64(kSamplingFrequency, 44100), uinteger(kChannels, 1)})})});
+  return cat({master(kInfo, {uinteger(kTimecodeScale, 1000000)}), tracks});
 }
 
-Bytes MatroskaFile(const Bytes& segment) {
-  return ebml::cat({ebml::ebml_header(), ebml::element(ebml::kSegment, segment)});
-}
+Bytes MatroskaFile(const Bytes& segment) { return cat({ebml_header(), element(kSegment, segment)}); }
 
 // Clusters 100 ms apart with one one-frame block each; `between[i]` follows Cluster i.
 Bytes AudioFile(const std::vector<Bytes>& between) {
   Bytes segment = AudioHeader();
   for (size_t i = 0; i <= between.size(); ++i) {
     Bytes frame(100 + i, static_cast<uint8_t>(i + 1));
-    segment = ebml::cat({segment, ebml::master(ebml::kCluster, {ebml::uinteger(ebml::kTimecode, 100 * i),
-                                                                ebml::simple_block(1, 0, ebml::kKeyFrame, {frame})})});
-    if (i < between.size()) segment = ebml::cat({segment, between[i]});
+    segment = cat({segment, master(kCluster, {uinteger(kTimecode, 100 * i), simple_block(1, 0, kKeyFrame, {frame})})});
+    if (i < between.size()) segment = cat({segment, between[i]});
   }
   return MatroskaFile(segment);
 }
 
 // One Cluster that holds `blocks`.
 Bytes OneCluster(std::initializer_list<Bytes> blocks, uint64_t track_type = 2) {
-  Bytes cluster = ebml::uinteger(ebml::kTimecode, 0);
-  for (const Bytes& block : blocks) cluster = ebml::cat({cluster, block});
-  return MatroskaFile(ebml::cat({AudioHeader(track_type), ebml::element(ebml::kCluster, cluster)}));
+  Bytes cluster = uinteger(kTimecode, 0);
+  for (const Bytes& block : blocks) cluster = cat({cluster, block});
+  return MatroskaFile(cat({AudioHeader(track_type), element(kCluster, cluster)}));
 }
 
 std::string WriteTemp(const Bytes& bytes, const std::string& name) {
@@ -64,30 +60,28 @@ std::string WriteTemp(const Bytes& bytes, const std::string& name) {
   return path;
 }
 
-struct Trace {
-  std::vector<uint32_t> types;  // property types, 0 for a buffer element
-  uint32_t largest = 0;         // most elements in one output buffer
-};
-
+// Each element's property type (0 for a buffer element), as the sinks consumed them.
 void Record(void* user, int32_t, MmfMra* mra) {
-  auto* trace = static_cast<Trace*>(user);
-  uint32_t kind = 0, i = 0;
-  for (; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
-    uint32_t type = 0, low = 0;
-    uint16_t high = 0;
-    if (kind == kMmfElementProperty && MmfGetMraPropertyElement(mra, i, &type, &low, &high) == 0) {
-      trace->types.push_back(type);
-    } else {
-      trace->types.push_back(0);
-    }
+  uint32_t kind = 0, type = 0, low = 0;
+  uint16_t high = 0;
+  for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
+    const bool property = kind == kMmfElementProperty && MmfGetMraPropertyElement(mra, i, &type, &low, &high) == 0;
+    static_cast<std::vector<uint32_t>*>(user)->push_back(property ? type : 0);
   }
-  trace->largest = std::max(trace->largest, i);
+}
+
+host::RunResult Play(const std::string& path, std::vector<uint32_t>* trace, uint32_t buffer_size = 65536,
+                     host::RunnerOptions options = {}) {
+  options.input_buffer_size = buffer_size;
+  options.on_buffer = Record;
+  options.user = trace;
+  return host::RunGraph(plugin_test::HostPlugin(), path, options);
 }
 
 // Skip marks (37) and runs of buffer elements (0), in order.
-std::vector<uint32_t> SkipMarksAndFrames(const Trace& trace) {
+std::vector<uint32_t> SkipMarksAndFrames(const std::vector<uint32_t>& trace) {
   std::vector<uint32_t> seen;
-  for (uint32_t type : trace.types) {
+  for (uint32_t type : trace) {
     if ((type == kMmfPropSkipMark || type == 0) && (seen.empty() || seen.back() != type || type != 0)) {
       seen.push_back(type);
     }
@@ -96,19 +90,14 @@ std::vector<uint32_t> SkipMarksAndFrames(const Trace& trace) {
 }
 
 TEST(PlaybackCasesTest, ElementsBetweenClustersMarkTheNextBlockAsSkippedAfter) {
-  const Bytes tags = ebml::master(ebml::kTags, {ebml::master(ebml::kTag, {ebml::master(ebml::kSimpleTag, {
-      ebml::str(ebml::kTagName, "TITLE"), ebml::str(ebml::kTagString, "between")})})});
-  const Bytes cues = ebml::master(ebml::kCues, {ebml::master(ebml::kCuePoint, {ebml::uinteger(ebml::kCueTime, 0)})});
-  const Bytes void_element = ebml::element(ebml::kVoid, ebml::filler(3000));
-  const std::string path = WriteTemp(AudioFile({tags, cues, void_element}), "between_clusters.mkv");
+  const Bytes tags =
+      master(kTags, {master(kTag, {master(kSimpleTag, {str(kTagName, "TITLE"), str(kTagString, "between")})})});
+  const Bytes cues = master(kCues, {master(kCuePoint, {uinteger(kCueTime, 0)})});
+  const std::string path = WriteTemp(AudioFile({tags, cues, element(kVoid, filler(3000))}), "between_clusters.mkv");
   for (uint32_t size : {100u, 1000u, 32768u}) {
     SCOPED_TRACE(size);
-    Trace trace;
-    host::RunnerOptions options;
-    options.input_buffer_size = size;
-    options.on_buffer = Record;
-    options.user = &trace;
-    host::RunResult result = host::RunGraph(plugin_test::HostPlugin(), path, options);
+    std::vector<uint32_t> trace;
+    host::RunResult result = Play(path, &trace, size);
     ASSERT_TRUE(result.ok) << result.error;
     ASSERT_EQ(result.channels.size(), 1u);
     EXPECT_EQ(result.channels[0].frames.size(), 4u);
@@ -136,19 +125,15 @@ TEST_P(PlaybackLaceTest, DeliversEveryFrameOnceAndPassesOverTheRest) {
   for (const Bytes& f : c.frames) want.emplace_back(f.size(), testing_support::Adler32(f.data(), f.size()));
   for (uint32_t size : {7u, 64u, 4096u}) {
     SCOPED_TRACE(size);
-    Trace trace;
+    std::vector<uint32_t> trace;
     testing_support::LogRecorder log;
-    host::RunnerOptions options;
-    options.input_buffer_size = size;
-    options.on_buffer = Record;
-    options.user = &trace;
-    host::RunResult result = host::RunGraph(plugin_test::HostPlugin(), path, options);
+    host::RunResult result = Play(path, &trace, size);
     ASSERT_TRUE(result.ok) << result.error;
     std::vector<std::pair<uint32_t, uint32_t>> got;
     for (const host::RunFrame& f : result.channels[0].frames) got.emplace_back(f.size, f.adler32);
     EXPECT_EQ(got, want);
     for (uint32_t type : {kMmfPropVideoTime, kMmfPropAudioTime, kMmfPropSubtitleTime}) {
-      EXPECT_EQ(std::count(trace.types.begin(), trace.types.end(), type) != 0, type == c.time_type) << type;
+      EXPECT_EQ(std::count(trace.begin(), trace.end(), type) != 0, type == c.time_type) << type;
     }
     EXPECT_EQ(log.Contains(3, "kelvane:  Unsupported channel type."), c.unsupported);
   }
@@ -162,29 +147,29 @@ Bytes FixedLaceWithRemainder() {
       0x84,        // key frame, fixed-size lacing
       0x02,        // 3 frames
   };
-  for (uint8_t value : {0x11, 0x22, 0x33}) body = ebml::cat({body, Bytes(10, value)});
+  for (uint8_t value : {0x11, 0x22, 0x33}) body = cat({body, Bytes(10, value)});
   body.push_back(0xEE);
   body.push_back(0xEF);
-  return ebml::element(ebml::kSimpleBlock, body);
+  return element(kSimpleBlock, body);
 }
 
 INSTANTIATE_TEST_SUITE_P(
     Laces, PlaybackLaceTest,
     testing::Values(
         LaceCase{"FixedLaceRemainder",
-                 OneCluster({FixedLaceWithRemainder(), ebml::simple_block(1, 10, ebml::kKeyFrame, {Bytes(12, 0x55)})}),
+                 OneCluster({FixedLaceWithRemainder(), simple_block(1, 10, kKeyFrame, {Bytes(12, 0x55)})}),
                  {Bytes(10, 0x11), Bytes(10, 0x22), Bytes(10, 0x33), Bytes(12, 0x55)}},
         LaceCase{"EmptyFrameInLace",
-                 OneCluster({ebml::ebml_laced_block(1, 0, ebml::kKeyFrame, {Bytes{}, Bytes(9, 0x44), Bytes(5, 0x45)}),
-                             ebml::simple_block(1, 10, ebml::kKeyFrame, {Bytes(12, 0x55)})}),
+                 OneCluster({ebml_laced_block(1, 0, kKeyFrame, {Bytes{}, Bytes(9, 0x44), Bytes(5, 0x45)}),
+                             simple_block(1, 10, kKeyFrame, {Bytes(12, 0x55)})}),
                  {Bytes(9, 0x44), Bytes(5, 0x45), Bytes(12, 0x55)}},
         LaceCase{"EveryFrameEmpty",
-                 OneCluster({ebml::xiph_laced_block(1, 0, ebml::kKeyFrame, {Bytes{}, Bytes{}, Bytes{}}),
-                             ebml::simple_block(1, 10, ebml::kKeyFrame, {Bytes(12, 0x55)})}),
+                 OneCluster({xiph_laced_block(1, 0, kKeyFrame, {Bytes{}, Bytes{}, Bytes{}}),
+                             simple_block(1, 10, kKeyFrame, {Bytes(12, 0x55)})}),
                  {Bytes(12, 0x55)}},
-        LaceCase{"SubtitleTrack", OneCluster({ebml::simple_block(1, 0, ebml::kKeyFrame, {Bytes(12, 0x55)})}, 17),
+        LaceCase{"SubtitleTrack", OneCluster({simple_block(1, 0, kKeyFrame, {Bytes(12, 0x55)})}, 17),
                  {Bytes(12, 0x55)}, kMmfPropSubtitleTime},
-        LaceCase{"ComplexTrackTimedAsAudio", OneCluster({ebml::simple_block(1, 0, ebml::kKeyFrame, {Bytes(12, 0x55)})}, 3),
+        LaceCase{"ComplexTrackTimedAsAudio", OneCluster({simple_block(1, 0, kKeyFrame, {Bytes(12, 0x55)})}, 3),
                  {Bytes(12, 0x55)}, kMmfPropAudioTime, true}),
     [](const testing::TestParamInfo<LaceCase>& info) { return info.param.name; });
 
@@ -251,15 +236,13 @@ class PropertyHeavyUpstream {
 TEST(PlaybackCasesTest, InputWithMorePropertiesThanRoomResumesAtTheSameElement) {
   const std::string name = "tiny_avc";
   PropertyHeavyUpstream upstream(testing_support::ReadFixtureBytes(name), 1500);
-  Trace trace;
+  std::vector<uint32_t> trace;
   host::RunnerOptions options;
   options.upstream = PropertyHeavyUpstream::Ops();
   options.upstream_output = upstream.output();
-  options.on_buffer = Record;
-  options.user = &trace;
-  host::RunResult result = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), options);
+  host::RunResult result = Play(plugin_test::FixtureFile(name), &trace, 65536, options);
   ASSERT_TRUE(result.ok) << result.error;
-  size_t copied = std::count(trace.types.begin(), trace.types.end(), kMmfPropFileOffset);
+  size_t copied = std::count(trace.begin(), trace.end(), kMmfPropFileOffset);
   EXPECT_EQ(copied, 1500u) << "every input property is copied once: none lost, none repeated";
   EXPECT_GE(result.channels[0].buffers, 4u) << "1500 properties need three output buffers besides the configuration";
   const testing_support::FixtureExpectation fixture = testing_support::LoadFixture(name);
