@@ -6,12 +6,14 @@
 
 #include <mutex>
 #include <random>
+#include <span>
 #include <thread>
 
 #include <gtest/gtest.h>
 
 #include "filter/mkv_context.h"
 #include "host/graph_runner.h"
+#include "host/memory_pools.h"
 #include "platform/mmf_status.h"
 #include "tests/plugin/graph_harness.h"
 #include "tests/support/playback_expectations.h"
@@ -93,12 +95,11 @@ struct PrerollTimes {
   std::map<int32_t, std::vector<uint64_t>> values;
   static void Record(void* user, int32_t channel, MmfMra* mra) {
     auto* self = static_cast<PrerollTimes*>(user);
-    uint32_t kind = 0, type = 0, low = 0;
-    uint16_t high = 0;
-    for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
-      if (kind != kMmfElementProperty || MmfGetMraPropertyElement(mra, i, &type, &low, &high) != 0) continue;
-      std::lock_guard<std::mutex> lock(self->mutex);
-      if (type == kMmfPropPrerollTime) self->values[channel].push_back(MmfPropertyValue(low, high));
+    std::lock_guard<std::mutex> lock(self->mutex);
+    for (const host::MraElement& e : std::span(host::MraElements(mra), mra->ElementCount)) {
+      if (e.kind == kMmfElementProperty && e.type == kMmfPropPrerollTime) {
+        self->values[channel].push_back(MmfPropertyValue(e.low, e.high));
+      }
     }
   }
 };

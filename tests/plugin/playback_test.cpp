@@ -7,6 +7,7 @@
 #include <algorithm>
 #include <cstdio>
 #include <fstream>
+#include <span>
 #include <string>
 #include <vector>
 
@@ -62,11 +63,8 @@ std::string WriteTemp(const Bytes& bytes, const std::string& name) {
 
 // Each element's property type (0 for a buffer element), as the sinks consumed them.
 void Record(void* user, int32_t, MmfMra* mra) {
-  uint32_t kind = 0, type = 0, low = 0;
-  uint16_t high = 0;
-  for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
-    const bool property = kind == kMmfElementProperty && MmfGetMraPropertyElement(mra, i, &type, &low, &high) == 0;
-    static_cast<std::vector<uint32_t>*>(user)->push_back(property ? type : 0);
+  for (const host::MraElement& e : std::span(host::MraElements(mra), mra->ElementCount)) {
+    static_cast<std::vector<uint32_t>*>(user)->push_back(e.kind == kMmfElementProperty ? e.type : 0);
   }
 }
 

@@ -6,6 +6,7 @@
 // channel delivers only the first TrickTime of media after each jump.
 
 #include <algorithm>
+#include <span>
 
 #include <gtest/gtest.h>
 
@@ -82,21 +83,15 @@ class TrickPlayTest : public testing::Test {
       MmfMra* mra = nullptr;
       result = host::FileStreamer::Ops()->NextBuffer(connected_.streamer->output(), &mra);
       if (result != kMmfBufferDelivered) break;
-      uint32_t type = 0, low = 0, element = 0;
-      uint16_t high = 0;
       uint64_t offset = 0;
-      for (uint32_t i = 0; MmfGetMraPropertyElement(mra, i, &type, &low, &high) == 0; ++i, ++element) {
-        if (type == kMmfPropTimeMarker) reads.push_back({MmfPropertyValue(low, high), 0, 0});
-        if (type == kMmfPropFileOffset) offset = MmfPropertyValue(low, high);
-      }
-      MmfPoolBuffer* pool_buffer = nullptr;
-      uint8_t* address = nullptr;
-      uint32_t size = 0;
-      EXPECT_EQ(MmfGetMraBufferElement(mra, element, &pool_buffer, &address, &size), 0);
-      if (!reads.empty()) {
+      for (const host::MraElement& e : std::span(host::MraElements(mra), mra->ElementCount)) {
+        const uint64_t value = MmfPropertyValue(e.low, e.high);
+        if (e.kind == kMmfElementProperty && e.type == kMmfPropTimeMarker) reads.push_back({value, 0, 0});
+        if (e.kind == kMmfElementProperty && e.type == kMmfPropFileOffset) offset = value;
+        if (e.kind != kMmfElementBuffer || reads.empty()) continue;
         if (reads.back().bytes == 0) reads.back().offset = offset;
         EXPECT_EQ(offset, reads.back().offset + reads.back().bytes) << "a request is read in one stretch";
-        reads.back().bytes += size;
+        reads.back().bytes += e.size;
       }
       MmfReleaseMra(mra);
     }
@@ -348,22 +343,16 @@ TEST_F(TrickPlayTest, ScanForwardDeliversTheFirstTrickTimeAfterEachJump) {
   int result;
   MmfMra* mra = nullptr;
   while ((result = plugin.output()->NextBuffer(video, &mra)) == kMmfBufferDelivered) {
-    uint32_t kind = 0;
-    for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
-      if (kind == kMmfElementProperty) {
-        uint32_t type = 0, low = 0;
-        uint16_t high = 0;
-        MmfGetMraPropertyElement(mra, i, &type, &low, &high);
-        if (type == kMmfPropConfigCount) i += low;
-        if (type == kMmfPropVideoTime) time = MmfPropertyValue(low, high);
-        EXPECT_NE(type, kMmfPropFramePart) << "no frame of the windows is cut by the end of a request";
+    const auto elements = std::span(host::MraElements(mra), mra->ElementCount);
+    for (size_t i = 0; i < elements.size(); ++i) {
+      const host::MraElement& e = elements[i];
+      if (e.kind == kMmfElementBuffer) {
+        got.push_back({time, e.size, testing_support::Adler32(e.address, e.size)});
         continue;
       }
-      MmfPoolBuffer* buffer = nullptr;
-      uint8_t* address = nullptr;
-      uint32_t size = 0;
-      MmfGetMraBufferElement(mra, i, &buffer, &address, &size);
-      got.push_back({time, size, testing_support::Adler32(address, size)});
+      if (e.type == kMmfPropConfigCount) i += e.low;
+      if (e.type == kMmfPropVideoTime) time = MmfPropertyValue(e.low, e.high);
+      EXPECT_NE(e.type, kMmfPropFramePart) << "no frame of the windows is cut by the end of a request";
     }
     MmfReleaseMra(mra);
   }
