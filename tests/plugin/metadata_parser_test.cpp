@@ -58,33 +58,6 @@ Found Query(MmfMetadata* block, const char* key, uint32_t occurrence) {
   return found;
 }
 
-// Every fixture's offered tags under their keys, with mkvinfo's texts; the
-// stream is left at 0.
-TEST(ParserParseMetadataTest, TagValuesEqualTheFixtureTags) {
-  const std::map<std::string, std::string> key_of_tag = {
-      {"TITLE", "Name"}, {"ARTIST", "Artist"}, {"GENRE", "Genre"}, {"ALBUM", "Album"}, {"COMMENT", "Comment"}};
-  int compared = 0;
-  for (const std::string& name : testing_support::FixtureNames()) {
-    const testing_support::FixtureExpectation fixture = LoadFixture(name);
-    if (fixture.doc_type != "matroska") continue;
-    SCOPED_TRACE(name);
-    ParsedBlock parsed(name);
-    ASSERT_EQ(parsed.result, 0);
-    EXPECT_EQ(parsed.stream->Tell(), 0);
-    std::map<std::string, int> seen;
-    for (const auto& [tag, string] : fixture.tags) {
-      auto key = key_of_tag.find(tag);
-      if (key == key_of_tag.end()) continue;
-      Found found = Query(parsed.block, key->second.c_str(), seen[tag]++);
-      ASSERT_EQ(found.answer, 1) << key->second;
-      EXPECT_EQ(found.value.Type, uint32_t{kMmfMetadataUtf8});
-      EXPECT_EQ(Text(found.value), string) << key->second;
-      ++compared;
-    }
-  }
-  EXPECT_GE(compared, 5);
-}
-
 // Not Matroska (also WebM), an EBML header with nothing after it, and a
 // stream that cannot go back to 0: no block, nothing leaked, the stream at 0.
 TEST(ParserParseMetadataTest, RefusedInputLeavesNoBlock) {
