@@ -61,11 +61,9 @@ Found Query(MmfMetadata* block, const char* key, uint32_t occurrence) {
 // Not Matroska (also WebM), an EBML header with nothing after it, and a
 // stream that cannot go back to 0: no block, nothing leaked, the stream at 0.
 TEST(ParserParseMetadataTest, RefusedInputLeavesNoBlock) {
-  std::vector<uint8_t> readme(4096, 'x');
-  std::vector<uint8_t> header = testing_support::ReadFixtureBytes("tiny_avc");
-  header.resize(5 + (header.at(4) & 0x7F));
-  std::vector<uint8_t> tiny = testing_support::ReadFixtureBytes("tiny_avc");
-  std::vector<uint8_t> webm = testing_support::ReadFixtureBytes("webm_vp8_vorbis");
+  const std::vector<uint8_t> readme(4096, 'x'), tiny = testing_support::ReadFixtureBytes("tiny_avc");
+  const std::vector<uint8_t> header(tiny.begin(), tiny.begin() + 5 + (tiny.at(4) & 0x7F));
+  const std::vector<uint8_t> webm = testing_support::ReadFixtureBytes("webm_vp8_vorbis");
   const struct {
     const char* name;
     const std::vector<uint8_t>& bytes;
@@ -84,19 +82,13 @@ TEST(ParserParseMetadataTest, RefusedInputLeavesNoBlock) {
     const int64_t live_before = host::LiveBlockCount();
     auto stream = host::MakeMemoryStream(c.bytes.data(), c.bytes.size(), c.seekable, c.name);
     uint8_t first[16];
-    if (!c.seekable) {
-      ASSERT_EQ(stream->Read(first, sizeof first), 16);  // away from 0, and no way back
-    }
-    auto* untouched = reinterpret_cast<MmfMetadata*>(0x1234);
+    ASSERT_TRUE(c.seekable || stream->Read(first, sizeof first) == 16);  // away from 0, and no way back
+    auto* const untouched = reinterpret_cast<MmfMetadata*>(0x1234);
     MmfMetadata* block = untouched;
     EXPECT_EQ(Ops().Parser_ParseMetadata(stream->record(), 0, &block), c.answer);
     EXPECT_EQ(block, untouched);
-    if (c.seekable) {
-      EXPECT_EQ(stream->Tell(), 0);
-    }
-    if (c.notice) {
-      EXPECT_TRUE(log.Contains(5, c.notice));
-    }
+    EXPECT_TRUE(!c.seekable || stream->Tell() == 0);
+    EXPECT_TRUE(!c.notice || log.Contains(5, c.notice));
     stream.reset();
     EXPECT_EQ(host::LiveBlockCount(), live_before);
   }
