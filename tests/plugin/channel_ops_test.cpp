@@ -36,11 +36,11 @@ struct Sequence {
   int32_t channel = 0;
 };
 
-// avc_aac offers two channels; nothing is acquired by the set-up.
-Connected Unconfigured() {
+// avc_aac (unless named) offers two channels; nothing is acquired by the set-up.
+Connected Unconfigured(const char* fixture = "avc_aac") {
   host::SetupOptions options;
   options.configure_outputs = false;
-  return ConnectFile("avc_aac", true, options);
+  return ConnectFile(fixture, true, options);
 }
 
 TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {
@@ -69,9 +69,7 @@ TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {
   host::MemoryPool pool(4096, 4);
   for (const Sequence& sequence : sequences) {
     SCOPED_TRACE(sequence.name);
-    host::SetupOptions options;
-    options.configure_outputs = false;
-    Connected c = ConnectFile(sequence.fixture, true, options);
+    Connected c = Unconfigured(sequence.fixture);
     ASSERT_EQ(c.channel_count(), 2);
     MmfChannel* channel = AsFrameworkChannel(&c.channel(sequence.channel));
     MmfMediaFormat format = c.channel(0).Format;
