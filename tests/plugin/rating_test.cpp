@@ -47,8 +47,7 @@ const std::map<std::string, std::string> kOfferedCodecs = {
 };
 
 uint32_t Fourcc(const std::string& code) {
-  return uint32_t(uint8_t(code[0])) << 24 | uint32_t(uint8_t(code[1])) << 16 | uint32_t(uint8_t(code[2])) << 8 |
-         uint8_t(code[3]);
+  return uint32_t(code.at(0)) << 24 | uint32_t(code.at(1)) << 16 | uint32_t(code.at(2)) << 8 | uint32_t(code.at(3));
 }
 
 void CheckDecoderConfig(const ExpectedTrack& track, const MkvChannel& channel) {

@@ -100,6 +100,9 @@ class TrickPlayTest : public testing::Test {
   }
 
   MkvContext* context() { return connected_.context(); }
+  int Scan(bool forward, uint32_t speed) {
+    return forward ? Trick().ScanForward(handle_, speed) : Trick().ScanBackward(handle_, speed);
+  }
 
   playback_test::CueModel cues_{"long_cues"};
   host::MemoryPool pool_{65536, 8};
@@ -143,7 +146,7 @@ TEST_P(ScanTest, EveryStepReadsTheClusterOfTheExpectedCuePoint) {
     if (cues_.times.at(next) == t || !skips) break;
     cue = next;
   }
-  ASSERT_EQ(k.forward ? Trick().ScanForward(handle_, k.speed) : Trick().ScanBackward(handle_, k.speed), 0);
+  ASSERT_EQ(Scan(k.forward, k.speed), 0);
   EXPECT_EQ(context()->TrickMode, !skips ? 0u : k.forward ? 512u : 1024u);
   EXPECT_EQ(context()->CurrentReadList->Request->Length, int32_t(kBufferSize));
   int end = 0;
@@ -205,7 +208,7 @@ TEST_F(TrickPlayTest, ScanEndPutsANormalRequestInTheScansDirectionAndStreamsOnFr
     Connect("long_cues", {0, 1});
     context()->ByteRate = 2000;
     clock_.Consumed(4000000);
-    ASSERT_EQ(forward ? Trick().ScanForward(handle_, 100) : Trick().ScanBackward(handle_, 100), 0);
+    ASSERT_EQ(Scan(forward, 100), 0);
     (void)Reads(3);
     clock_.Consumed(12250000);
     ASSERT_EQ(Trick().ScanEnd(handle_), 0);
@@ -256,9 +259,7 @@ TEST_F(TrickPlayTest, AFailedFrameworkCallFailsEveryScanAndSaysSo) {
     const char* names[] = {"ScanForward", "ScanBackward", "ScanEnd"};
     for (int op = 0; op < 3; ++op) {
       if (row.call != host::FrameworkCall::kCount) host::FailNextCall(row.call, row.error);
-      EXPECT_EQ(op == 0 ? Trick().ScanForward(handle_, 100) : op == 1 ? Trick().ScanBackward(handle_, 100)
-                                                                       : Trick().ScanEnd(handle_),
-                row.error);
+      EXPECT_EQ(op < 2 ? Scan(op == 0, 100) : Trick().ScanEnd(handle_), row.error);
       EXPECT_TRUE(log.Contains(2, std::string("kelvane: ") + names[op] + row.message)) << names[op];
       EXPECT_EQ(context()->TrickMode, row.modes[op]) << names[op];
     }
