@@ -166,6 +166,7 @@ struct CueModel {
     }
   }
 
+  // The cue point that a forward (backward) seek or scan to t chooses.
   size_t Forward(uint64_t t) const { return testing_support::ChosenCue(times, t, true); }
   size_t Backward(uint64_t t) const { return testing_support::ChosenCue(times, t, false); }
   // Index in `track`'s frames of its first frame in the Cluster of cue point
