@@ -1,7 +1,7 @@
 // The host's memory pools and media buffers: reference-counted pool buffers,
 // elements and their bounds, frames of one pool buffer sharing a reference,
-// and what every framework operation of the host answers to a call it cannot
-// serve. Both pools under many threads are exercised by the
+// and what every framework operation and input stream of the host answers to
+// a call it cannot serve. Both pools under many threads are exercised by the
 // plug-in's threaded playback and control stress tests.
 
 #include <chrono>
@@ -41,6 +41,8 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
   MmfMraPool* mras = host::MakeMraPool(1, 4);
   const uint8_t file[100] = {};
   auto source = host::MakeMemoryStream(file, sizeof file, true);
+  auto memory = host::MakeMemoryStream(file, sizeof file, true), pipe = host::MakeMemoryStream(file, 50, false);
+  uint8_t scratch[20];
   host::FileStreamer streamer(source.get(), {10, 8});
   host::GraphClock clock;
   auto* graph = reinterpret_cast<MmfGraph*>(&clock);  // any distinct address names a graph
@@ -148,6 +150,10 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
       {"read list: list mode of an unconnected channel", [&] { return MmfStreamerSetListMode(list, 1); }, 4044},
       {"read list: list mode of no list", [&] { return MmfStreamerSetListMode(nullptr, 1); }, 22},
       {"read list freed", [&] { return MmfFreeReadlist(list); }, 0},
+      {"input: a pipe read", [&] { return pipe->Read(scratch, 10); }, 10},
+      {"input: a pipe reads nothing alongside behind it", [&] { return pipe->ReadAtAlongside(0, scratch, 10); }, -1},
+      {"input: memory read alongside, staying", [&] { return memory->ReadAtAlongside(90, scratch, 20) + memory->Tell(); }, 10},
+      {"input: no such file", [&] { return host::OpenFileStream("/nonexistent/kelvane.mkv", true) == nullptr; }, 1},
       {"graph clock: none attached", [&] { return MmfGetGraphClock(graph, &clock_handle, &clock_ops); }, 4044},
       {"graph clock: no graph", [&] { return MmfGetGraphClock(nullptr, &clock_handle, &clock_ops); }, 22},
       {"graph clock: attached", [&] { return host::AttachGraphClock(graph, &clock), MmfGetGraphClock(graph, &clock_handle, &clock_ops); }, 0},
