@@ -17,14 +17,14 @@ namespace {
 
 using Bytes = std::vector<uint8_t>;
 
-// Codec headers written bit by bit, most significant first.
-class BitWriter {
- public:
+// Codec headers written bit by bit, most significant first; the last byte padded with zeros.
+struct BitWriter {
+  Bytes bytes;
+  uint64_t bit_count = 0;
   BitWriter& Bits(unsigned count, uint64_t value) {
-    for (unsigned i = count; i-- > 0;) {
-      if (bit_count_ % 8 == 0) bytes_.push_back(0);
-      if ((value >> i) & 1) bytes_.back() |= static_cast<uint8_t>(0x80 >> (bit_count_ % 8));
-      ++bit_count_;
+    for (unsigned i = count; i-- > 0; ++bit_count) {
+      if (bit_count % 8 == 0) bytes.push_back(0);
+      if ((value >> i) & 1) bytes.back() |= static_cast<uint8_t>(0x80 >> (bit_count % 8));
     }
     return *this;
   }
@@ -36,12 +36,6 @@ class BitWriter {
   BitWriter& SignedGolomb(int64_t value) {  // se(v)
     return Golomb(value > 0 ? 2 * static_cast<uint64_t>(value) - 1 : 2 * static_cast<uint64_t>(-value));
   }
-  // The bits so far, the last byte padded with zeros.
-  const Bytes& bytes() const { return bytes_; }
-
- private:
-  Bytes bytes_;
-  uint64_t bit_count_ = 0;
 };
 
 // An H.264 RBSP as a NAL unit payload: 03 after every 00 00 that precedes 00..03.
@@ -98,7 +92,7 @@ Bytes sps_nal(const Sps& s, uint8_t header = 0x67) {
   if (s.aspect_idc >= 0) w.Bits(8, static_cast<uint64_t>(s.aspect_idc));
   if (s.aspect_idc == 255) w.Bits(16, s.sar_width).Bits(16, s.sar_height);
   w.Bits(9, 1);  // the rest of the VUI absent, stop bit
-  return EscapeRbsp(w.bytes());
+  return EscapeRbsp(w.bytes);
 }
 
 Bytes avc(const Sps& s) { return avc_record(sps_nal(s)); }
@@ -124,7 +118,7 @@ Bytes vol(const Vol& v) {
   if (v.shape == 3 && v.verid > 1) w.Bits(4, 0);
   w.Bits(1, 1).Bits(16, v.time_resolution).Bits(1, 1).Bits(1, v.increment_bits != 0).Bits(v.increment_bits, 1);
   if (v.shape == 0) w.Bits(1, 1).Bits(13, 352).Bits(1, 1).Bits(13, 288).Bits(1, 1);
-  return w.bytes();
+  return w.bytes;
 }
 
 Bytes patched(Bytes bytes, size_t at, uint8_t value) { return bytes[at] = value, bytes; }
