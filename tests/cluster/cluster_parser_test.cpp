@@ -22,19 +22,13 @@ using namespace ebml;
 // each block's data and applying each skip between calls as the caller does.
 Outcome ParseAfterBlocks(Record& record, const Bytes& bytes, int blocks_before) {
   mkvinbuff in1 = View(bytes, 0, bytes.size());
-  Outcome out;
   for (int blocks = 0;;) {
-    out = cluster_testing::Call(record, &in1, nullptr);
-    if (out.result == kClusterBlockReady && blocks++ < blocks_before) {
-      auto data = static_cast<uint32_t>(record.c.block_data_left);
-      in1.buff_pos += data;
-      in1.buff_left -= data;
-    } else if (out.result == kClusterSkip && blocks < blocks_before) {
-      in1.buff_pos += static_cast<uint32_t>(out.skip);
-      in1.buff_left -= static_cast<uint32_t>(out.skip);
-    } else {
-      return out;
-    }
+    const Outcome out = cluster_testing::Call(record, &in1, nullptr);
+    const bool block = out.result == kClusterBlockReady && blocks++ < blocks_before;
+    if (!block && (out.result != kClusterSkip || blocks >= blocks_before)) return out;
+    const auto consumed = static_cast<uint32_t>(block ? uint64_t(record.c.block_data_left) : out.skip);
+    in1.buff_pos += consumed;
+    in1.buff_left -= consumed;
   }
 }
 
