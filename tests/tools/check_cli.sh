@@ -6,8 +6,6 @@
 #   check_cli.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
 source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 
-work=$(mktemp -d)
-trap 'rm -rf "$work"' EXIT
 cd "$work" || exit 1
 ln -s "$fixtures/avc_aac.mkv" ./-dash.mkv
 mkv=$fixtures/avc_aac.mkv
@@ -191,8 +189,4 @@ else
   fail "python3 is needed to validate the --json output"
 fi
 
-if ((failures)); then
-  echo "$failures failures"
-  exit 1
-fi
-echo "kelvane help, errors, exit codes and JSON output as documented"
+finish "kelvane help, errors, exit codes and JSON output as documented"

@@ -15,8 +15,6 @@
 # without it the check fails.
 #   check_extract.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
 source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
-work=$(mktemp -d)
-trap 'rm -rf "$work"' EXIT
 
 command -v ffmpeg >/dev/null || { echo "FAIL ffmpeg is missing (scripts/install-deps.sh test installs it)"; exit 1; }
 
@@ -139,8 +137,4 @@ done <<EOF2
 EOF2
 "${kelvane[@]}" extract --help | grep -q '^  kelvane extract movie.mkv' || fail "--help shows no example"
 
-if ((failures)); then
-  echo "$failures failures"
-  exit 1
-fi
-echo "kelvane extract: $checked extracted tracks decode like the originals"
+finish "kelvane extract: $checked extracted tracks decode like the originals"

@@ -9,8 +9,6 @@
 # and agrees with mkvinfo's up to there.
 #   check_info.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
 source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
-work=$(mktemp -d)
-trap 'rm -rf "$work"' EXIT
 
 args=()
 for expected in "$source_dir/samples/sample.expected" "$fixtures"/*.expected; do
@@ -88,5 +86,4 @@ PY
 head -c 6000 "$fixtures/avc_aac.mkv" >"$work/cut.mkv"
 out=$("${kelvane[@]}" info --tree "$work/cut.mkv" 2>/dev/null)
 [[ $? == 1 && $out == *"stopped at byte 5610: the file ends inside SimpleBlock at 5610"* ]] || fail "a cut file's tree: $(tail -1 <<<"$out")"
-echo "$failures mismatches"
-((failures == 0))
+finish "kelvane info agrees with mkvinfo on every fixture"

@@ -4,13 +4,6 @@
 #   check_metadata.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
 source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 
-expect() {  # what, expected, actual
-  if [[ "$2" != "$3" ]]; then
-    echo "FAIL $1: expected '$2', kelvane metadata printed '$3'"
-    failures=$((failures + 1))
-  fi
-}
-
 run() {  # name -> output of kelvane metadata
   "${kelvane[@]}" metadata "$fixtures/$1.mkv" 2>&1 || echo "exit code $?"
 }
@@ -36,5 +29,4 @@ expect "avc_aac entry count" "$(grep -c '^  ' <<<"$out")" "$(sed -n 's/^Entries:
 "${kelvane[@]}" metadata "$source_dir/README.md" >/dev/null 2>&1
 expect "exit code for a non-Matroska file" 1 $?
 
-echo "$failures mismatches"
-((failures == 0))
+finish "kelvane metadata matches the fixtures"

@@ -7,8 +7,6 @@
 # line up to 26 of those frames may be missing, one output buffer's worth.
 #   check_packets.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
 source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
-work=$(mktemp -d)
-trap 'rm -rf "$work"' EXIT
 
 # track time size adler, grouped by track in file order, for the tracks in $2.
 expected() {  # name tracks
@@ -65,8 +63,4 @@ fi
 "${kelvane[@]}" packets --buffer-size 0 "$fixtures/avc_aac.mkv" >/dev/null 2>&1
 [[ $? == 2 ]] || fail "--buffer-size 0 is not a usage error"
 
-if ((failures)); then
-  echo "$failures failures"
-  exit 1
-fi
-echo "kelvane packets matches the fixtures' blocks"
+finish "kelvane packets matches the fixtures' blocks"
