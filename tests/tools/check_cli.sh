@@ -12,7 +12,7 @@ mkv=$fixtures/avc_aac.mkv
 not_mkv=$source_dir/README.md
 missing=$work/missing.mkv
 
-# exit code | stream (out, err) | expected substring | arguments (words; $mkv, $not_mkv, $missing, $work expand)
+# exit code | stream (out, err) | expected substring | arguments (words; $mkv, $fixtures, $not_mkv, $missing, $work expand)
 table=$(cat <<'EOF'
 0|out|usage: kelvane COMMAND|--help
 0|out|kelvane 0.|--version
@@ -66,6 +66,7 @@ table=$(cat <<'EOF'
 2|err|kelvane packets: --channels: '0,0' is not a list of distinct|packets --channels 0,0 $mkv
 2|err|offers no channel 2; its channels: 0 (track 1), 1 (track 2)|packets --channels 2 $mkv
 2|err|kelvane packets: --seek: '1@x' is not TIME[@AT]|packets --seek 1@x $mkv
+2|err|kelvane packets: --seek: 'x' is not TIME[@AT]|packets --seek x $mkv
 2|err|kelvane packets: --ff: '-3' is not SPEED[@AT]|packets --ff -3 $mkv
 2|err|kelvane packets: --trick-time: '0' is not MS|packets --trick-time 0 $mkv
 2|err|kelvane packets: --scan-end needs a value|packets $mkv --scan-end
@@ -86,6 +87,16 @@ table=$(cat <<'EOF'
 1|err|kelvane metadata: cannot read $work: Is a directory|metadata $work
 1|err|kelvane metadata: $not_mkv: not a Matroska file|metadata $not_mkv
 0|out|Width (NUM4): 160|metadata $mkv
+0|out|  kelvane extract movie.mkv|extract --help
+2|err|offers no track 9 (offered: 1 2 3 4)|extract $fixtures/multi_audio.mkv -t 9 -o $work/none
+2|err|try 'kelvane extract --help'|extract $mkv
+2|err|kelvane extract: unknown option '--bogus'|extract --bogus $mkv -o $work/none
+2|err|kelvane extract: --buffer-size: '0' is not a number of bytes from 1 to 67108864|extract --buffer-size=0 $mkv -o $work/none
+2|err|kelvane extract: --track: 'x' is not a list of track numbers|extract $mkv --track x -o $work/none
+2|err|kelvane extract: FILE cannot be standard input|extract - -o $work/none
+1|err|kelvane extract: cannot open $missing|extract $missing -o $work/none
+1|err|kelvane extract: $not_mkv: not a Matroska file|extract $not_mkv -o $work/none
+1|err|webm_vp8_vorbis.mkv: DocType webm is not played|extract $fixtures/webm_vp8_vorbis.mkv -o $work/none
 EOF
 )
 

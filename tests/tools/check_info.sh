@@ -80,9 +80,7 @@ for expected, info_path, tree_path in zip(*[iter(sys.argv[1:])] * 3):
 sys.exit(bad > 0)
 PY
 
-# A file that is not Matroska is refused with exit code 1; a damaged one lists what it could read.
-"${kelvane[@]}" info "$source_dir/README.md" >/dev/null 2>&1
-[[ $? == 1 ]] || fail "README.md: info exit code $? for a file that is not Matroska"
+# A damaged file lists what it could read.
 head -c 6000 "$fixtures/avc_aac.mkv" >"$work/cut.mkv"
 out=$("${kelvane[@]}" info --tree "$work/cut.mkv" 2>/dev/null)
 [[ $? == 1 && $out == *"stopped at byte 5610: the file ends inside SimpleBlock at 5610"* ]] || fail "a cut file's tree: $(tail -1 <<<"$out")"
