@@ -42,16 +42,14 @@ compare_decoded() {  # label original stream extracted type codec
     [[ $(ff -i "$2" -map "0:$3" -f md5 -) == $(ff -i "$4" -f md5 -) ]] || fail "$1: decoded PCM differs"
     return
   fi
-  local want got
+  local want got last_want last_got bytes
   want=$(frames -i "$2" -map "0:$3")
   got=$(frames -i "$4")
   [[ -n "$want" ]] || { fail "$1: ffmpeg decodes nothing from the original"; return; }
   [[ "$want" == "$got" ]] && return
-  local last_want last_got
   last_want=$(tail -n1 <<<"$want")
   last_got=$(tail -n1 <<<"$got")
   if [[ $5 == audio && $(head -n-1 <<<"$want") == $(head -n-1 <<<"$got") && ${last_want%% *} -lt ${last_got%% *} ]]; then
-    local bytes
     bytes=$(samples -i "$2" -map "0:$3" | wc -c)
     [[ $(samples -i "$2" -map "0:$3" | md5sum) == $(samples -i "$4" | head -c "$bytes" | md5sum) ]] && return
   fi

@@ -46,14 +46,11 @@ for name in avc_aac lace_xiph lace_fixed blockgroups multi_audio timescale_100us
   done
 done
 
-# One channel acquired, no hashes, JSON: the same frames of that track only.
+# One channel acquired, no hashes, JSON (which check_cli.sh parses): the same frames of that track only.
 out=$("${kelvane[@]}" packets --channels 1 --no-hash --json "$fixtures/avc_aac.mkv" 2>/dev/null)
 count=$(grep -c '"time_us"' <<<"$out")
 want=$(awk '$1 == 2 { n += split($5, f, ",") } END { print n }' "$fixtures/avc_aac.blocks")
 [[ "$count" == "$want" ]] || fail "avc_aac --channels 1 --json: $count frames, expected $want"
 grep -q '"adler32"' <<<"$out" && fail "avc_aac --no-hash: a checksum was printed"
-if command -v python3 >/dev/null; then
-  python3 -m json.tool <<<"$out" >/dev/null || fail "avc_aac --json: not valid JSON"
-fi
 
 finish "kelvane packets matches the fixtures' blocks"
