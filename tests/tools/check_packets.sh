@@ -22,7 +22,9 @@ same_frames() {  # name
       for (t in printed) {
         i = 1
         for (j = 1; j <= printed[t]; j++) {
-          if (got[t, j] ~ /^gap /) { for (k = 0; k < 26 && i <= wanted[t] && want[t, i] != got[t, j + 1]; k++) i++; continue }
+          if (got[t, j] ~ /^gap /) {
+            for (k = 0; k < 26 && i <= wanted[t] && want[t, i] != got[t, j + 1]; k++) i++
+            continue }
           if (want[t, i++] != got[t, j]) exit 1 }
         if (i <= wanted[t]) exit 1 } }' "$fixtures/$1.expected" "$fixtures/$1.blocks" -
 }

@@ -7,9 +7,9 @@
 source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 
 # The codecs the plug-in offers, as four-character codes; others are left out.
-declare -A fourcc=([V_MPEG4/ISO/AVC]=AVC1 [V_MPEG4/ISO/ASP]=MP4V [V_MPEG4/MS/V3]=MP43 [V_MPEG1]=MP1V [V_MPEG2]=MP2V
-  [V_THEORA]=THEO [A_MPEG/L3]=M2A3 [A_MPEG/L2]=M2A2 [A_PCM/INT/LIT]=RAWA [A_PCM/INT/BIG]=RAWA [A_DTS]=DTSA
-  [A_VORBIS]=VRBS [A_FLAC]=FLAC [A_AAC]=M4AC [A_AC3]=AC3A)
+declare -A fourcc=([V_MPEG4/ISO/AVC]=AVC1 [V_MPEG4/ISO/ASP]=MP4V [V_MPEG4/MS/V3]=MP43 [V_MPEG1]=MP1V
+  [V_MPEG2]=MP2V [V_THEORA]=THEO [A_MPEG/L3]=M2A3 [A_MPEG/L2]=M2A2 [A_PCM/INT/LIT]=RAWA [A_PCM/INT/BIG]=RAWA
+  [A_DTS]=DTSA [A_VORBIS]=VRBS [A_FLAC]=FLAC [A_AAC]=M4AC [A_AC3]=AC3A)
 key() { sed -n "s/.* $1=\([^ ]*\).*/\1/p" <<<"$2"; }
 
 for expected in "$fixtures"/*.expected; do
