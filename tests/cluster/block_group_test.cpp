@@ -29,6 +29,7 @@ struct GroupCase {
   uint64_t reference_priority = 0;
   uint64_t block_duration = 0;
   Bytes codec_state = {};
+  uint64_t failing_allocation = 0;  // the nth of the parse fails; nothing may leak
 };
 
 void PrintTo(const GroupCase& c, std::ostream* os) { *os << c.name; }
@@ -47,20 +48,30 @@ const GroupCase kGroupCases[] = {
           bin(kSlices, block(9, 0, 0, {})), bin(kBlockVirtual, block(9, 0, 0, {})), uinteger(kDiscardPadding, 5),
           uinteger(kReferenceVirtual, 1), bin(kCrc32, {0xA1, 0x81, 0x81, 0x00})}),
      kClusterBlockReady},
+    {"FailedCodecStateCopyIsOutOfMemory", bin(kCodecState, {1, 2}), kClusterNoMemory, 0, 0, 0, {}, 1},
+    {"FailedFrameTableIsOutOfMemory", {}, kClusterNoMemory, 0, 0, 0, {}, 1},
 };
 
 class GroupChildrenTest : public testing::TestWithParam<GroupCase> {};
 
 TEST_P(GroupChildrenTest, AreReadAsTheirCaseSays) {
   const GroupCase& c = GetParam();
-  Record record;
-  auto got = cluster_testing::ParseWhole(record, ClusterOf({master(kBlockGroup, {c.children, Block1()})}));
-  EXPECT_EQ(got.result, c.result);
-  EXPECT_EQ(got.track, c.result == kClusterBlockReady ? 1u : 0u);
-  EXPECT_EQ(record.c.reference_block, c.reference_block);
-  EXPECT_EQ(record.c.reference_priority, c.reference_priority);
-  EXPECT_EQ(record.c.block_duration, c.block_duration);
-  EXPECT_EQ(Bytes(record.c.codec_state, record.c.codec_state + record.c.codec_state_size), c.codec_state);
+  const int64_t live = host::LiveBlockCount();
+  {
+    Record record;
+    host::FailNthAllocation(c.failing_allocation);
+    auto got = cluster_testing::ParseWhole(record, ClusterOf({master(kBlockGroup, {c.children, Block1()})}));
+    host::FailNthAllocation(0);
+    EXPECT_EQ(got.result, c.result);
+    EXPECT_EQ(got.track, c.result == kClusterBlockReady ? 1u : 0u);
+    EXPECT_EQ(record.c.frame_sizes == nullptr, c.result != kClusterBlockReady);
+    EXPECT_EQ(record.c.reference_block, c.reference_block);
+    EXPECT_EQ(record.c.reference_priority, c.reference_priority);
+    EXPECT_EQ(record.c.block_duration, c.block_duration);
+    EXPECT_EQ(record.c.codec_state == nullptr, c.codec_state.empty());
+    EXPECT_EQ(Bytes(record.c.codec_state, record.c.codec_state + record.c.codec_state_size), c.codec_state);
+  }
+  EXPECT_EQ(host::LiveBlockCount(), live);
 }
 
 INSTANTIATE_TEST_SUITE_P(Children, GroupChildrenTest, testing::ValuesIn(kGroupCases),
@@ -81,23 +92,6 @@ TEST(ParseMkvBlockGroupTest, RunningOutInsideAChildLogsThePartialHeader) {
       {kAoLogNotice, "                 inbuff1->buff_fileoff = 0, inbuff2->buff_fileoff = " + std::to_string(cut - 1)},
   };
   EXPECT_EQ(log.messages(), want);
-}
-
-// The first allocation of each parse fails: the CodecState copy, the frame table.
-TEST(ParseMkvBlockGroupTest, FailedAllocationIsOutOfMemoryAndLeaksNothing) {
-  Bytes laced = xiph_laced_block(1, 0, 0, {filler(300), filler(20), filler(10)});
-  for (const Bytes& bytes : {ClusterOf({master(kBlockGroup, {bin(kCodecState, {1, 2}), Block1()})}), ClusterOf({laced})}) {
-    int64_t live = host::LiveBlockCount();
-    {
-      Record record;
-      host::FailNthAllocation(1);
-      EXPECT_EQ(cluster_testing::ParseWhole(record, bytes).result, kClusterNoMemory);
-      host::FailNthAllocation(0);
-      EXPECT_EQ(record.c.codec_state, nullptr);
-      EXPECT_EQ(record.c.frame_sizes, nullptr);
-    }
-    EXPECT_EQ(host::LiveBlockCount(), live);
-  }
 }
 
 }  // namespace

@@ -1,7 +1,5 @@
 #pragma once
-// Crafted bytes through parse_mkvcluster: in one buffer, split into inbuff1
-// and inbuff2 in one call, or cut into two calls (the first alone, the second
-// going on where it stopped).
+// Crafted bytes through parse_mkvcluster, in views of one buffer.
 
 #include <cstdint>
 #include <vector>
@@ -32,14 +30,11 @@ struct Record {
 struct Outcome {
   int result = 1;
   uint64_t skip = 0;
-  uint64_t position = 0;  // read position after the call
   uint64_t track = 0;
   int16_t timecode = 0;
-  uint8_t flags = 0;
   std::vector<int64_t> sizes;  // frame_sizes, when the result is 0
   int64_t data_left = 0;
   uint64_t cluster_timecode = 0;
-  bool operator==(const Outcome&) const = default;
 };
 
 inline Outcome Call(Record& record, mkvinbuff* in1, mkvinbuff* in2) {
@@ -48,12 +43,10 @@ inline Outcome Call(Record& record, mkvinbuff* in1, mkvinbuff* in2) {
   out.skip = 0xDEAD;
   out.result = parse_mkvcluster(in1, in2, &record.c, &out.skip);
   const mkvcluster& c = record.c;
-  out.position = mkvinbuff_position(in1, in2);
   out.cluster_timecode = c.cluster_timecode;
   if (out.result == kClusterBlockReady) {
     out.track = c.track_number;
     out.timecode = c.block_timecode;
-    out.flags = c.block_flags;
     out.sizes.assign(c.frame_sizes, c.frame_sizes + c.frame_count);
     out.data_left = c.block_data_left;
   }
@@ -63,22 +56,6 @@ inline Outcome Call(Record& record, mkvinbuff* in1, mkvinbuff* in2) {
 inline Outcome ParseWhole(Record& record, const Bytes& bytes) {
   mkvinbuff in1 = View(bytes, 0, bytes.size());
   return Call(record, &in1, nullptr);
-}
-
-inline Outcome ParseSplit(Record& record, const Bytes& bytes, size_t split) {
-  mkvinbuff in1 = View(bytes, 0, split), in2 = View(bytes, split, bytes.size());
-  return Call(record, &in1, &in2);
-}
-
-// The first call sees bytes[0, cut) alone. When it ran out inside a read, a
-// second call gets the rest and must go on from there.
-inline Outcome ParseCut(Record& record, const Bytes& bytes, size_t cut) {
-  mkvinbuff in1 = View(bytes, 0, cut);
-  Outcome first = Call(record, &in1, nullptr);
-  bool ran_out = first.result == kClusterChildShort || first.result == kClusterHeaderFailed;
-  if (!ran_out || in1.buff_left != 0 || record.c.resume.step == mkv_resume_step::none) return first;
-  mkvinbuff rest = View(bytes, cut, bytes.size());
-  return Call(record, &rest, nullptr);
 }
 
 }  // namespace cluster_testing

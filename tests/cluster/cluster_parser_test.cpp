@@ -1,5 +1,8 @@
-// parse_mkvcluster at Cluster and Segment level: what is skipped, what is
-// passed over, where Clusters begin and end, and what running out gives.
+// parse_mkvcluster at Cluster and Segment level (what is skipped, what is
+// passed over, where Clusters begin and end, what running out gives) and on
+// block headers and lace tables at the edges of lacing and with sizes that
+// overflow 32-bit arithmetic. Ordinary Xiph, EBML and fixed lacing are
+// compared with mkvinfo in the fixture test.
 
 #include <gtest/gtest.h>
 
@@ -15,25 +18,17 @@ using cluster_testing::Record;
 using cluster_testing::View;
 using namespace ebml;
 
-constexpr int kNoResult = 1;
-
 // Runs parse_mkvcluster over one buffer `blocks_before` + 1 times, consuming
 // each block's data and applying each skip between calls as the caller does.
 Outcome ParseAfterBlocks(Record& record, const Bytes& bytes, int blocks_before) {
   mkvinbuff in1 = View(bytes, 0, bytes.size());
-  Outcome out;
   for (int blocks = 0;;) {
-    out = cluster_testing::Call(record, &in1, nullptr);
-    if (out.result == kClusterBlockReady && blocks++ < blocks_before) {
-      auto data = static_cast<uint32_t>(record.c.block_data_left);
-      in1.buff_pos += data;
-      in1.buff_left -= data;
-    } else if (out.result == kClusterSkip && blocks < blocks_before) {
-      in1.buff_pos += static_cast<uint32_t>(out.skip);
-      in1.buff_left -= static_cast<uint32_t>(out.skip);
-    } else {
-      return out;
-    }
+    const Outcome out = cluster_testing::Call(record, &in1, nullptr);
+    const bool block = out.result == kClusterBlockReady && blocks++ < blocks_before;
+    if (!block && (out.result != kClusterSkip || blocks >= blocks_before)) return out;
+    const auto consumed = static_cast<uint32_t>(block ? uint64_t(record.c.block_data_left) : out.skip);
+    in1.buff_pos += consumed;
+    in1.buff_left -= consumed;
   }
 }
 
@@ -46,11 +41,22 @@ struct ClusterCase {
   uint64_t cluster_timecode = 0;
   uint64_t track = 0;
   const char* message = nullptr;  // a level-5 message the calls must log
+  int16_t timecode = 0;           // with sizes and data_left, compared when sizes are given
+  std::vector<int64_t> sizes = {};
+  int64_t data_left = 0;
 };
 
 void PrintTo(const ClusterCase& c, std::ostream* os) { *os << c.name; }
 
 Bytes Block(uint64_t track) { return simple_block(track, 0, kKeyFrame, {filler(3, 0xA3)}); }
+
+// A Cluster of unknown size (so that any block size fits) holding a SimpleBlock of
+// this header and lace table, `frame_bytes` of data and an element size (0: its own).
+Bytes Laced(const Bytes& header, size_t frame_bytes, uint64_t element_size = 0) {
+  Bytes body = cat({header, filler(frame_bytes, 0x5A)});
+  return unknown_size(kCluster, {uinteger(kTimecode, 7), id_bytes(kSimpleBlock),
+                                 size_bytes(element_size ? element_size : body.size(), 8), body});
+}
 
 const Bytes kCuesElement = master(kCues, {master(kCuePoint, {uinteger(kCueTime, 0)})});
 
@@ -87,6 +93,30 @@ const ClusterCase kCases[] = {
     {"InvalidByteBetweenClustersFails", Bytes{0x05, 0x81}, 0, kClusterHeaderFailed},
     {"InvalidByteBetweenBlocksFails", master(kCluster, {uinteger(kTimecode, 4), Block(1), Bytes{0x05}}), 1,
      kClusterHeaderFailed, 0xDEAD, 4},
+    // Lacing: track 1, timecode -2, three frames of 10 / 3; 256 frames each way; sizes past the data.
+    {"FixedRemainderStaysInTheBlock", Laced({0x81, 0xFF, 0xFE, 0x04, 0x02}, 10), 0, kClusterBlockReady, 0xDEAD, 7, 1,
+     nullptr, -2, {3, 3, 3}, 10},
+    {"Xiph256Frames", Laced(cat({{0x81, 0x00, 0x01, 0x82, 0xFF}, Bytes(255, 0x01)}), 256), 0, kClusterBlockReady,
+     0xDEAD, 7, 1, nullptr, 1, std::vector<int64_t>(256, 1), 256},
+    {"Ebml256Frames", Laced(cat({{0x81, 0x00, 0x01, 0x86, 0xFF, 0x81}, Bytes(254, 0xBF)}), 256), 0,
+     kClusterBlockReady, 0xDEAD, 7, 1, nullptr, 1, std::vector<int64_t>(256, 1), 256},
+    {"EbmlOneFrameCodesNoSize", Laced({0x81, 0x00, 0x00, 0x86, 0x00}, 7), 0, kClusterBlockReady, 0xDEAD, 7, 1,
+     nullptr, 0, {7}, 7},
+    {"TwoByteTrackNumber", Laced({0x40, 0x05, 0x00, 0x10, 0x00}, 5), 0, kClusterBlockReady, 0xDEAD, 7, 5, nullptr,
+     16, {5}, 5},
+    {"XiphSizeBeyondTheDataGivesNegativeLast", Laced({0x81, 0x00, 0x00, 0x02, 0x01, 0xFF, 0xFF, 0x05}, 10), 0,
+     kClusterBlockReady, 0xDEAD, 7, 1, nullptr, 0, {515, -505}, 10},
+    {"EbmlSizeOver32BitsCountsByItsLowBits",  // first size 0x100000005
+     Laced({0x81, 0x00, 0x00, 0x06, 0x01, 0x09, 0x00, 0x00, 0x00, 0x05}, 10), 0, kClusterBlockReady, 0xDEAD, 7, 1,
+     nullptr, 0, {0x100000005, 5}, 10},
+    {"ElementSizeFFFFFFFFWrapsNegative", Laced({0x81, 0x00, 0x00, 0x80}, 4, 0xFFFFFFFF), 0, kClusterBlockReady,
+     0xDEAD, 7, 1, nullptr, 0, {-5}, -5},
+    {"ElementSizeOver32BitsUsesItsLowBits", Laced({0x81, 0x00, 0x00, 0x80}, 10, (uint64_t{1} << 32) + 14), 0,
+     kClusterBlockReady, 0xDEAD, 7, 1, nullptr, 0, {10}, 10},
+    {"TrackNumberFirstByteZeroIsInvalid", Laced({0x00, 0x81, 0x00, 0x00, 0x80}, 4), 0, kClusterInvalid, 0xDEAD, 7},
+    {"EbmlFirstSizeZeroIsInvalid", Laced({0x81, 0x00, 0x00, 0x06, 0x01, 0x00}, 4), 0, kClusterInvalid, 0xDEAD, 7},
+    {"EbmlDifferenceZeroIsShort", Laced({0x81, 0x00, 0x00, 0x06, 0x02, 0x82, 0x00}, 4), 0, kClusterChildShort,
+     0xDEAD, 7},
 };
 
 class ParseMkvClusterTest : public testing::TestWithParam<ClusterCase> {};
@@ -102,6 +132,11 @@ TEST_P(ParseMkvClusterTest, GivesTheResultOfItsCase) {
   EXPECT_EQ(got.track, c.track);
   if (c.message) {
     EXPECT_TRUE(log.Contains(kAoLogNotice, c.message)) << c.message;
+  }
+  if (!c.sizes.empty()) {
+    EXPECT_EQ(got.timecode, c.timecode);
+    EXPECT_EQ(got.sizes, c.sizes);
+    EXPECT_EQ(got.data_left, c.data_left);
   }
 }
 

@@ -8,6 +8,8 @@
 #include <cmath>
 #include <cstdio>
 #include <cstring>
+#include <iomanip>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -42,23 +44,23 @@ Bytes repeat(int count, Make make) {
 
 // Fields that differ from the record's defaults, as "name value", or "defaults".
 struct Fields {
-  std::string out;
+  std::ostringstream out;
   template <typename T, typename D>
   Fields& add(const char* name, T value, D fallback) {
-    if (value != fallback) out += (out.empty() ? "" : " ") + std::string(name) + " " + format(value);
+    if (value == fallback) return *this;
+    out << (out.tellp() ? " " : "") << name << " " << std::setprecision(15);
+    if constexpr (std::is_arithmetic_v<T>) out << +value; else out << value;
     return *this;
   }
-  static std::string format(const char* s) { return s; }
-  static std::string format(const std::string& s) { return s; }
-  static std::string format(double v) {
-    char buffer[32];
-    std::snprintf(buffer, sizeof buffer, "%.15g", v);
-    return buffer;
-  }
-  template <typename T>
-  static std::string format(T v) { return std::to_string(v); }
-  std::string done() const { return out.empty() ? "defaults" : out; }
+  std::string done() { return out.tellp() ? out.str() : "defaults"; }
 };
+
+// Calls each(index, entry) for the entries of a queue of T.
+template <typename T, typename Each>
+void walk(const mkv_queue& queue, Each each) {
+  mkv_queue_node* node = queue.head;
+  for (uint32_t k = 0; k < queue.count; ++k, node = node->next) each(k, *static_cast<const T*>(node->data));
+}
 
 std::string info_of(const mkv_file_info& i) {
   const char* none = nullptr;
@@ -86,45 +88,35 @@ std::string track_of(const mkv_file_info& i) {
   f.add("scale", t.track_timecode_scale, 1.0);
   for (uint32_t e = 0; e < t.content_encoding_count; ++e) {
     const mkv_content_encoding& c = t.content_encodings[e];
-    f.out += " " + n(c.order) + "/" + n(c.scope) + "/" + n(c.comp_settings_size) + (c.enc_key_id ? "k" : "");
+    f.out << " " << c.order << "/" << c.scope << "/" << c.comp_settings_size << (c.enc_key_id ? "k" : "");
   }
   return f.done();
 }
 
 // List 0 as id@position in list order; the count and the flag.
 std::string seeks_of(const mkv_file_info& i) {
-  std::string out;
-  mkv_queue_node* node = i.seek_lists[0].head;
-  for (uint32_t k = 0; k < i.seek_lists[0].count; ++k, node = node->next) {
-    const auto* entry = static_cast<const mkv_seek_entry*>(node->data);
-    char id[16];
-    std::snprintf(id, sizeof id, "%X", entry->seek_id);
-    out += std::string(id) + "@" + n(entry->seek_position) + " ";
-  }
-  return out + "heads " + n(i.seek_head_count) + ((i.parse_flags & kMetSeekHead) ? " met" : "");
+  std::ostringstream out;
+  walk<mkv_seek_entry>(i.seek_lists[0], [&](uint32_t, const auto& e) {
+    out << std::hex << std::uppercase << e.seek_id << std::dec << "@" << e.seek_position << " ";
+  });
+  return out.str() + "heads " + n(i.seek_head_count) + ((i.parse_flags & kMetSeekHead) ? " met" : "");
 }
 
 // "time:track/cluster/block/state[ref,ref];track/..." per point, "|" between
 // points; the Cues flag; the Info flag set beforehand must stay.
 std::string cues_of(const mkv_file_info& i) {
-  std::string out;
-  mkv_queue_node* point_node = i.cue_points.head;
-  for (uint32_t p = 0; p < i.cue_points.count; ++p, point_node = point_node->next) {
-    const auto* point = static_cast<const mkv_cue_point*>(point_node->data);
-    out += (p ? "|" : "") + n(point->cue_time) + ":";
-    mkv_queue_node* node = point->track_positions.head;
-    for (uint32_t t = 0; t < point->track_positions.count; ++t, node = node->next) {
-      const auto* position = static_cast<const mkv_cue_track_position*>(node->data);
-      out += (t ? ";" : "") + n(position->cue_track) + "/" + n(position->cue_cluster_position) + "/" +
-             n(position->cue_block_number) + "/" + n(position->cue_codec_state) + "[";
-      mkv_queue_node* ref = position->references.head;
-      for (uint32_t r = 0; r < position->references.count; ++r, ref = ref->next) {
-        out += (r ? "," : "") + n(static_cast<const mkv_cue_reference*>(ref->data)->cue_ref_time);
-      }
-      out += "]";
-    }
-  }
-  return out + ((i.parse_flags & kMetCues) ? " met" : "") + ((i.parse_flags & kMetInfo) ? "" : " info lost");
+  std::ostringstream out;
+  walk<mkv_cue_point>(i.cue_points, [&](uint32_t p, const auto& point) {
+    out << (p ? "|" : "") << point.cue_time << ":";
+    walk<mkv_cue_track_position>(point.track_positions, [&](uint32_t t, const auto& position) {
+      out << (t ? ";" : "") << position.cue_track << "/" << position.cue_cluster_position << "/"
+          << position.cue_block_number << "/" << position.cue_codec_state << "[";
+      walk<mkv_cue_reference>(position.references,
+                              [&](uint32_t r, const auto& ref) { out << (r ? "," : "") << ref.cue_ref_time; });
+      out << "]";
+    });
+  });
+  return out.str() + ((i.parse_flags & kMetCues) ? " met" : "") + ((i.parse_flags & kMetInfo) ? "" : " info lost");
 }
 
 // Each entry as "name=string/binary/length", null fields as "-"; the first

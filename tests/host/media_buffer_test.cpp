@@ -1,7 +1,7 @@
 // The host's memory pools and media buffers: reference-counted pool buffers,
-// elements and their bounds, the zero-copy hand-over of input bytes to an
-// output buffer, and what every framework operation of the host answers to a
-// call it cannot serve. Both pools under many threads are exercised by the
+// elements and their bounds, frames of one pool buffer sharing a reference,
+// and what every framework operation and input stream of the host answers to
+// a call it cannot serve. Both pools under many threads are exercised by the
 // plug-in's threaded playback and control stress tests.
 
 #include <chrono>
@@ -41,6 +41,8 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
   MmfMraPool* mras = host::MakeMraPool(1, 4);
   const uint8_t file[100] = {};
   auto source = host::MakeMemoryStream(file, sizeof file, true);
+  auto memory = host::MakeMemoryStream(file, sizeof file, true), pipe = host::MakeMemoryStream(file, 50, false);
+  uint8_t scratch[20];
   host::FileStreamer streamer(source.get(), {10, 8});
   host::GraphClock clock;
   auto* graph = reinterpret_cast<MmfGraph*>(&clock);  // any distinct address names a graph
@@ -148,6 +150,10 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
       {"read list: list mode of an unconnected channel", [&] { return MmfStreamerSetListMode(list, 1); }, 4044},
       {"read list: list mode of no list", [&] { return MmfStreamerSetListMode(nullptr, 1); }, 22},
       {"read list freed", [&] { return MmfFreeReadlist(list); }, 0},
+      {"input: a pipe read", [&] { return pipe->Read(scratch, 10); }, 10},
+      {"input: a pipe reads nothing alongside behind it", [&] { return pipe->ReadAtAlongside(0, scratch, 10); }, -1},
+      {"input: memory read alongside, staying", [&] { return memory->ReadAtAlongside(90, scratch, 20) + memory->Tell(); }, 10},
+      {"input: no such file", [&] { return host::OpenFileStream("/nonexistent/kelvane.mkv", true) == nullptr; }, 1},
       {"graph clock: none attached", [&] { return MmfGetGraphClock(graph, &clock_handle, &clock_ops); }, 4044},
       {"graph clock: no graph", [&] { return MmfGetGraphClock(nullptr, &clock_handle, &clock_ops); }, 22},
       {"graph clock: attached", [&] { return host::AttachGraphClock(graph, &clock), MmfGetGraphClock(graph, &clock_handle, &clock_ops); }, 0},
@@ -186,22 +192,12 @@ TEST(MemoryPoolTest, WaitingAcquiresGetWhatAnotherThreadReleases) {
   MmfFreeMraPool(mras);
 }
 
-class MediaBufferTest : public testing::Test {
- protected:
-  void SetUp() override { ASSERT_EQ(MmfAcquireMra(mras_, &mra_, kMmfAcquireNoWait), 0); }
-  void TearDown() override {
-    if (mra_) MmfReleaseMra(mra_);
-    MmfFreeMraPool(mras_);
-  }
-  MmfMraPool* mras_ = host::MakeMraPool(2, 4);
-  MmfMra* mra_ = nullptr;
-  host::MemoryPool bytes_{256, 2};
-};
-
 // Frames of one pool buffer appended one after another share one reference;
 // whatever replaces elements, the pool buffer goes back exactly when the last
 // element on it is gone, and not before.
-TEST_F(MediaBufferTest, ElementsOnOnePoolBufferKeepItUntilTheLastOfThemGoes) {
+TEST(MediaBufferTest, ElementsOnOnePoolBufferKeepItUntilTheLastOfThemGoes) {
+  MmfMraPool* mras = host::MakeMraPool(1, 4);
+  host::MemoryPool bytes(256, 2);
   enum Set { kPropertyAt, kOnA, kOnB };
   struct Step {
     Set set;
@@ -223,43 +219,24 @@ TEST_F(MediaBufferTest, ElementsOnOnePoolBufferKeepItUntilTheLastOfThemGoes) {
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
-    MmfPoolBuffer* a = Acquire(bytes_);
-    MmfPoolBuffer* b = Acquire(bytes_);
-    ASSERT_TRUE(a && b);
+    MmfPoolBuffer *a = Acquire(bytes), *b = Acquire(bytes);
+    MmfMra* mra = nullptr;
+    ASSERT_TRUE(a && b && MmfAcquireMra(mras, &mra, kMmfAcquireNoWait) == 0);
     for (const Step& step : c.steps) {
       SCOPED_TRACE(step.index);
-      const int result = step.set == kPropertyAt ? MmfSetMraPropertyElement(mra_, step.index, kMmfPropSkipMark, 0, 0)
-                         : step.set == kOnA      ? MmfSetMraBufferElement(mra_, step.index, a, a->Data + step.index, 1)
-                                                 : MmfSetMraBufferElement(mra_, step.index, b, b->Data + step.index, 1);
+      const int result = step.set == kPropertyAt ? MmfSetMraPropertyElement(mra, step.index, kMmfPropSkipMark, 0, 0)
+                         : step.set == kOnA      ? MmfSetMraBufferElement(mra, step.index, a, a->Data + step.index, 1)
+                                                 : MmfSetMraBufferElement(mra, step.index, b, b->Data + step.index, 1);
       ASSERT_EQ(result, 0);
       EXPECT_EQ(host::BufferReferences(a), 1 + step.a_references);
       EXPECT_EQ(host::BufferReferences(b), 1 + step.b_references);
     }
     Ops().ReleaseBuffer(a);
     Ops().ReleaseBuffer(b);
-    ASSERT_EQ(MmfReleaseMra(mra_), 0);
-    EXPECT_EQ(bytes_.FreeCount(), 2u);  // both back, each once
-    ASSERT_EQ(MmfAcquireMra(mras_, &mra_, kMmfAcquireNoWait), 0);
+    ASSERT_EQ(MmfReleaseMra(mra), 0);
+    EXPECT_EQ(bytes.FreeCount(), 2u);  // both back, each once
   }
-}
-
-// The zero-copy path: an output media buffer refers to an input buffer's bytes
-// after the input media buffer and the producer's own reference are gone.
-TEST_F(MediaBufferTest, OutputReferenceKeepsInputBytesAfterTheInputIsReleased) {
-  MmfPoolBuffer* input_bytes = Acquire(bytes_);
-  std::memcpy(input_bytes->Data, "frame-bytes", 11);
-  MmfMra* input = nullptr;
-  ASSERT_EQ(MmfAcquireMra(mras_, &input, kMmfAcquireNoWait), 0);
-  ASSERT_EQ(MmfSetMraBufferElement(input, 0, input_bytes, input_bytes->Data, 256), 0);
-  Ops().ReleaseBuffer(input_bytes);  // the producer keeps no reference of its own
-  ASSERT_EQ(MmfSetMraBufferElement(mra_, 0, input_bytes, input_bytes->Data + 6, 5), 0);
-  EXPECT_EQ(host::BufferReferences(input_bytes), 2u);
-  ASSERT_EQ(MmfReleaseMra(input), 0);
-  EXPECT_EQ(bytes_.FreeCount(), 1u);  // still held by the output
-  EXPECT_EQ(std::memcmp(input_bytes->Data + 6, "bytes", 5), 0);
-  ASSERT_EQ(MmfReleaseMra(mra_), 0);
-  mra_ = nullptr;
-  EXPECT_EQ(bytes_.FreeCount(), 2u);
+  MmfFreeMraPool(mras);
 }
 
 }  // namespace

@@ -30,7 +30,7 @@
 
 namespace {
 
-using ebml::Bytes;
+using namespace ebml;
 
 constexpr uint64_t k2To32 = uint64_t{1} << 32;
 constexpr uint32_t kSomeUnknownId = 0x4FAB;  // a two-byte ID Matroska does not define
@@ -47,58 +47,52 @@ Bytes Frame(size_t size, uint8_t fill) { return Bytes(size, fill); }
 // A SimpleBlock of track 1 with a lace header written out: `sizes` are the
 // lace bytes after the frame-count byte, then `data` bytes of frame data.
 Bytes LacedBlock(uint8_t lacing, uint8_t frame_count_minus_1, const Bytes& sizes, size_t data) {
-  Bytes body = {0x81, 0x00, 0x00, static_cast<uint8_t>(ebml::kKeyFrame | lacing), frame_count_minus_1};
-  body = ebml::cat({body, sizes, Bytes(data, 0x33)});
-  return ebml::element(ebml::kSimpleBlock, body);
+  const Bytes head = {0x81, 0x00, 0x00, static_cast<uint8_t>(kKeyFrame | lacing), frame_count_minus_1};
+  return element(kSimpleBlock, cat({head, sizes, Bytes(data, 0x33)}));
 }
 
 // An EBML-lace size difference: the signed value biased as a `width`-byte variable-size integer.
 Bytes LaceDelta(int64_t delta, int width) {
   const int64_t bias = (int64_t{1} << (7 * width - 1)) - 1;
-  return ebml::size_bytes(static_cast<uint64_t>(delta + bias), width);
+  return size_bytes(static_cast<uint64_t>(delta + bias), width);
 }
 
 // Where a crafted child goes: first child of the master with this ID (0: none).
 struct Insert {
   uint32_t into = 0;
-  Bytes child;
+  Bytes child = {};
 };
 
 // A master that takes the insert as its first child when it is the target.
 Bytes In(const Insert& insert, uint32_t id, std::initializer_list<Bytes> children) {
   Bytes payload = insert.into == id ? insert.child : Bytes{};
-  return ebml::element(id, ebml::cat({payload, ebml::cat(children)}));
+  return element(id, cat({payload, cat(children)}));
 }
 
 struct Shape {
   uint64_t timecode_scale = 1000000;
   uint64_t cluster_time[2] = {0, 100};
-  Bytes codec_private;
-  Insert insert;
+  Bytes codec_private = {};
+  Insert insert = {};
 };
 
 Bytes File(const Shape& s) {
   const Insert& x = s.insert;
-  const Bytes header = In(x, ebml::kEbmlHeader, {ebml::uinteger(ebml::kEbmlVersion, 1),
-                                                 ebml::str(ebml::kDocType, "matroska")});
-  const Bytes info = In(x, ebml::kInfo, {ebml::uinteger(ebml::kTimecodeScale, s.timecode_scale),
-                                         ebml::str(ebml::kTitle, "crafted")});
-  const Bytes tracks = In(x, ebml::kTracks, {In(x, ebml::kTrackEntry, {
-      ebml::uinteger(ebml::kTrackNumber, 1), ebml::uinteger(ebml::kTrackUid, 1), ebml::uinteger(ebml::kTrackType, 2),
-      ebml::str(ebml::kCodecId, "A_MPEG/L3"), s.codec_private,
-      In(x, ebml::kAudio, {ebml::f64(ebml::kSamplingFrequency, 44100), ebml::uinteger(ebml::kChannels, 1)})})});
-  const Bytes tags = In(x, ebml::kTags, {In(x, ebml::kTag, {In(x, ebml::kSimpleTag, {
-      ebml::str(ebml::kTagName, "TITLE"), ebml::str(ebml::kTagString, "crafted")})})});
-  const Bytes cluster1 = In(x, ebml::kCluster, {ebml::uinteger(ebml::kTimecode, s.cluster_time[0]),
-                                                ebml::simple_block(1, 0, ebml::kKeyFrame, {Frame(100, 1)}),
-                                                In(x, ebml::kBlockGroup, {ebml::block(1, 20, 0, {Frame(101, 2)})})});
-  const Bytes cluster2 = In(x, ebml::kCluster, {ebml::uinteger(ebml::kTimecode, s.cluster_time[1]),
-                                                ebml::simple_block(1, 0, ebml::kKeyFrame, {Frame(102, 3)})});
-  const Bytes cues = In(x, ebml::kCues, {In(x, ebml::kCuePoint, {ebml::uinteger(ebml::kCueTime, 0),
-      In(x, ebml::kCueTrackPositions, {ebml::uinteger(ebml::kCueTrack, 1),
-                                       ebml::uinteger(ebml::kCueClusterPosition, 0)})})});
-  Bytes segment = In(x, ebml::kSegment, {info, tracks, tags, cluster1, cluster2, cues});
-  return ebml::cat({header, segment});
+  const Bytes header = In(x, kEbmlHeader, {uinteger(kEbmlVersion, 1), str(kDocType, "matroska")});
+  const Bytes info = In(x, kInfo, {uinteger(kTimecodeScale, s.timecode_scale), str(kTitle, "crafted")});
+  const Bytes tracks = In(x, kTracks, {In(x, kTrackEntry, {
+      uinteger(kTrackNumber, 1), uinteger(kTrackUid, 1), uinteger(kTrackType, 2), str(kCodecId, "A_MPEG/L3"),
+      s.codec_private, In(x, kAudio, {f64(kSamplingFrequency, 44100), uinteger(kChannels, 1)})})});
+  const Bytes tags = In(x, kTags, {In(x, kTag, {In(x, kSimpleTag, {str(kTagName, "TITLE"),
+                                                                   str(kTagString, "crafted")})})});
+  const Bytes cluster1 = In(x, kCluster, {uinteger(kTimecode, s.cluster_time[0]),
+                                          simple_block(1, 0, kKeyFrame, {Frame(100, 1)}),
+                                          In(x, kBlockGroup, {block(1, 20, 0, {Frame(101, 2)})})});
+  const Bytes cluster2 = In(x, kCluster, {uinteger(kTimecode, s.cluster_time[1]),
+                                          simple_block(1, 0, kKeyFrame, {Frame(102, 3)})});
+  const Bytes cues = In(x, kCues, {In(x, kCuePoint, {uinteger(kCueTime, 0), In(x, kCueTrackPositions, {
+      uinteger(kCueTrack, 1), uinteger(kCueClusterPosition, 0)})})});
+  return cat({header, In(x, kSegment, {info, tracks, tags, cluster1, cluster2, cues})});
 }
 
 // The undamaged file's three frames, by size.
@@ -108,147 +102,102 @@ const std::vector<uint32_t> kAllFrames = {100, 101, 102};
 
 // One Cluster whose size field claims `size`, holding the first frame, at the end of the file.
 Bytes ClusterClaiming(uint64_t size) {
-  return ebml::cat({File(Shape{}), ebml::master_sized(ebml::kCluster, size, {
-      ebml::uinteger(ebml::kTimecode, 200), ebml::simple_block(1, 0, ebml::kKeyFrame, {Frame(90, 4)})}, 8)});
+  return cat({File({}), master_sized(kCluster, size, {uinteger(kTimecode, 200),
+                                                      simple_block(1, 0, kKeyFrame, {Frame(90, 4)})}, 8)});
 }
 
 // A third Cluster whose SimpleBlock claims `size` bytes and carries 50.
 Bytes BlockClaiming(uint64_t size) {
-  Bytes body = {0x81, 0x00, 0x00, ebml::kKeyFrame};
-  body = ebml::cat({body, Frame(50, 5)});
-  const Bytes block = ebml::cat({ebml::id_bytes(ebml::kSimpleBlock), ebml::size_bytes(size, 8), body});
-  return ebml::cat({File(Shape{}), ebml::element(ebml::kCluster, ebml::cat({ebml::uinteger(ebml::kTimecode, 200),
-                                                                             block}))});
+  const Bytes block = cat({id_bytes(kSimpleBlock), size_bytes(size, 8), Bytes{0x81, 0x00, 0x00, kKeyFrame},
+                           Frame(50, 5)});
+  return cat({File({}), master(kCluster, {uinteger(kTimecode, 200), block})});
 }
 
 // A third Cluster with a crafted laced block, then a good block of 60 bytes.
 Bytes LacedCluster(const Bytes& laced) {
-  return ebml::cat({File(Shape{}), ebml::master(ebml::kCluster, {
-      ebml::uinteger(ebml::kTimecode, 200), laced, ebml::simple_block(1, 10, ebml::kKeyFrame, {Frame(60, 6)})})});
+  return cat({File({}), master(kCluster, {uinteger(kTimecode, 200), laced,
+                                          simple_block(1, 10, kKeyFrame, {Frame(60, 6)})})});
 }
 
 // `depth` masters of `id` inside each other around one TagName, inside a Tag
 // that sits before the Clusters.
 Bytes Nested(uint32_t outer, uint32_t id, int depth) {
-  Bytes inside = ebml::str(ebml::kTagName, "deep");
-  for (int i = 0; i < depth; ++i) inside = ebml::element(id, inside);
-  Shape s;
-  s.insert = {outer, inside};
-  return File(s);
-}
-
-Bytes WithScale(uint64_t scale) {
-  Shape s;
-  s.timecode_scale = scale;
-  return File(s);
-}
-
-Bytes WithClusterTimes(uint64_t first, uint64_t second) {
-  Shape s;
-  s.cluster_time[0] = first;
-  s.cluster_time[1] = second;
-  return File(s);
-}
-
-Bytes WithCodecPrivateClaiming(uint64_t size) {
-  Shape s;
-  s.codec_private = ebml::cat({ebml::id_bytes(ebml::kCodecPrivate), ebml::size_bytes(size, 8), Bytes(16, 0x77)});
-  return File(s);
-}
-
-Bytes WithInfoChild(const Bytes& child) {
-  Shape s;
-  s.insert = {ebml::kInfo, child};
-  return File(s);
+  Bytes inside = str(kTagName, "deep");
+  for (int i = 0; i < depth; ++i) inside = element(id, inside);
+  return File({.insert = {outer, inside}});
 }
 
 Bytes WithCue(uint64_t time, uint64_t position) {
-  Shape s;
-  s.insert = {ebml::kCues, ebml::master(ebml::kCuePoint, {ebml::uinteger(ebml::kCueTime, time),
-      ebml::master(ebml::kCueTrackPositions, {ebml::uinteger(ebml::kCueTrack, 1),
-                                              ebml::uinteger(ebml::kCueClusterPosition, position)})})};
-  return File(s);
+  return File({.insert = {kCues, master(kCuePoint, {uinteger(kCueTime, time), master(kCueTrackPositions, {
+                                            uinteger(kCueTrack, 1), uinteger(kCueClusterPosition, position)})})}});
 }
 
 // ---- The table.
 
 // kSome: frames of the undamaged file, in its order, none invented (damage may cost any of them).
-enum class Frames { kExactly, kSome };
+enum class Delivered { kExactly, kSome };
 
 struct Case {
   const char* name;
   Bytes file;
-  int parse;  // parse_mkvfile's answer
-  int rating;
-  Frames frames;
-  std::vector<uint32_t> sizes;  // the frames delivered, or those that may be
+  std::vector<uint32_t> sizes = kAllFrames;  // the frames delivered, or those that may be
+  int parse = kParseSucceeded;               // parse_mkvfile's answer
+  int rating = 80;
+  Delivered frames = Delivered::kExactly;
 };
 
 void PrintTo(const Case& c, std::ostream* out) { *out << c.name; }
 
 std::vector<Case> NamedCases() {
   const double kHuge = std::numeric_limits<double>::max();
+  const std::vector<uint32_t> kPlus90 = {100, 101, 102, 90};
   return {
-      {"Undamaged", File(Shape{}), kParseSucceeded, 80, Frames::kExactly, kAllFrames},
+      {"Undamaged", File({})},
       // Sizes at the 32-bit edge.
-      {"ClusterSizeFFFFFFFF", ClusterClaiming(0xFFFFFFFF), kParseSucceeded, 80, Frames::kExactly, {100, 101, 102, 90}},
-      {"ClusterSize2To32Plus1", ClusterClaiming(k2To32 + 1), kParseSucceeded, 80, Frames::kExactly,
-       {100, 101, 102, 90}},
+      {"ClusterSizeFFFFFFFF", ClusterClaiming(0xFFFFFFFF), kPlus90},
+      {"ClusterSize2To32Plus1", ClusterClaiming(k2To32 + 1), kPlus90},
       // A block that claims more than the file holds is never complete: its frame is not delivered.
-      {"SimpleBlockSizeFFFFFFFF", BlockClaiming(0xFFFFFFFF), kParseSucceeded, 80, Frames::kExactly, kAllFrames},
-      {"SimpleBlockSize2To32Plus1", BlockClaiming(k2To32 + 1), kParseSucceeded, 80, Frames::kExactly, kAllFrames},
+      {"SimpleBlockSizeFFFFFFFF", BlockClaiming(0xFFFFFFFF)},
+      {"SimpleBlockSize2To32Plus1", BlockClaiming(k2To32 + 1)},
       // Lace sizes are taken by their low 32 bits as signed, sums wrap in 32 bits, and a
       // frame below 1 byte is passed over. 0xFFFFFFFF is -1: the last frame gets 41 of the
       // block's 40 bytes, the next block is read one byte late, and the channel's error
       // drops the media buffer it was filling, which may hold any of the frames before.
-      {"EbmlLaceSizeFFFFFFFF",
-       LacedCluster(LacedBlock(ebml::kEbmlLacing, 1, ebml::size_bytes(0xFFFFFFFF, 5), 40)), kParseSucceeded, 80,
-       Frames::kSome, {100, 101, 102, 41}},
+      {"EbmlLaceSizeFFFFFFFF", LacedCluster(LacedBlock(kEbmlLacing, 1, size_bytes(0xFFFFFFFF, 5), 40)),
+       {100, 101, 102, 41}, kParseSucceeded, 80, Delivered::kSome},
       // 2^32 + 1 is a 1-byte frame, and the last one gets the other 39.
-      {"EbmlLaceSize2To32Plus1",
-       LacedCluster(LacedBlock(ebml::kEbmlLacing, 1, ebml::size_bytes(k2To32 + 1, 5), 40)), kParseSucceeded, 80,
-       Frames::kExactly, {100, 101, 102, 1, 39, 60}},
+      {"EbmlLaceSize2To32Plus1", LacedCluster(LacedBlock(kEbmlLacing, 1, size_bytes(k2To32 + 1, 5), 40)),
+       {100, 101, 102, 1, 39, 60}},
       // 2^31 and 2^31 + 4 are negative in 32 bits and passed over; their sum wraps to 4,
       // which leaves 36 bytes to the last frame.
       {"EbmlLaceSumAbove2To32",
-       LacedCluster(LacedBlock(ebml::kEbmlLacing, 2, ebml::cat({ebml::size_bytes(k2To32 / 2, 5), LaceDelta(4, 5)}),
-                               40)),
-       kParseSucceeded, 80, Frames::kExactly, {100, 101, 102, 36, 60}},
-      {"XiphLaceLongerThanTheBlock",
-       LacedCluster(LacedBlock(ebml::kXiphLacing, 1, Bytes(40, 0xFF), 10)), kParseSucceeded, 80, Frames::kExactly,
-       {100, 101, 102}},
-      {"FixedLaceOf256FramesInFiveBytes", LacedCluster(LacedBlock(ebml::kFixedLacing, 255, {}, 5)), kParseSucceeded,
-       80, Frames::kExactly, {100, 101, 102, 60}},
+       LacedCluster(LacedBlock(kEbmlLacing, 2, cat({size_bytes(k2To32 / 2, 5), LaceDelta(4, 5)}), 40)),
+       {100, 101, 102, 36, 60}},
+      {"XiphLaceLongerThanTheBlock", LacedCluster(LacedBlock(kXiphLacing, 1, Bytes(40, 0xFF), 10))},
+      {"FixedLaceOf256FramesInFiveBytes", LacedCluster(LacedBlock(kFixedLacing, 255, {}, 5)), {100, 101, 102, 60}},
       // A binary above the size limit ends the parse as a limit exceeded.
-      {"CodecPrivateOf2To32Minus1Declared", WithCodecPrivateClaiming(0xFFFFFFFF), kParseNoMemory, 0,
-       Frames::kExactly, {}},
+      {"CodecPrivateOf2To32Minus1Declared",
+       File({.codec_private = cat({id_bytes(kCodecPrivate), size_bytes(0xFFFFFFFF, 8), Bytes(16, 0x77)})}), {},
+       kParseNoMemory, 0},
       // Times and scales near the 64-bit limits.
-      {"TimecodeScaleMax", WithScale(UINT64_MAX), kParseSucceeded, 80, Frames::kExactly, kAllFrames},
-      {"TimecodeScale2To63", WithScale(uint64_t{1} << 63), kParseSucceeded, 80, Frames::kExactly, kAllFrames},
+      {"TimecodeScaleMax", File({.timecode_scale = UINT64_MAX})},
+      {"TimecodeScale2To63", File({.timecode_scale = uint64_t{1} << 63})},
       // Times wrap in 64 bits; a block whose time comes out below the start (0) is dropped:
       // ticks of 2^64 - 1 and 2^64 - 2 are -1 and -2 ms, the Block 20 ticks later is at 19 ms.
-      {"ClusterTimesMax", WithClusterTimes(UINT64_MAX, UINT64_MAX - 1), kParseSucceeded, 80, Frames::kExactly, {101}},
+      {"ClusterTimesMax", File({.cluster_time = {UINT64_MAX, UINT64_MAX - 1}}), {101}},
       // INT64_MAX ms is -1 ms in 64 bits, 2^63 ms is 0.
-      {"ClusterTimesAroundInt64Max", WithClusterTimes(uint64_t{INT64_MAX}, uint64_t{INT64_MAX} + 1), kParseSucceeded,
-       80, Frames::kExactly, {101, 102}},
-      {"DurationLargestDouble", WithInfoChild(ebml::f64(ebml::kDuration, kHuge)), kParseSucceeded, 80,
-       Frames::kExactly, kAllFrames},
-      {"DurationInfinite", WithInfoChild(ebml::f64(ebml::kDuration, INFINITY)), kParseSucceeded, 80, Frames::kExactly,
-       kAllFrames},
-      {"DurationNotANumber", WithInfoChild(ebml::f64(ebml::kDuration, NAN)), kParseSucceeded, 80, Frames::kExactly,
-       kAllFrames},
-      {"DurationNegative", WithInfoChild(ebml::f64(ebml::kDuration, -1e30)), kParseSucceeded, 80, Frames::kExactly,
-       kAllFrames},
-      {"CueTimeAndPositionMax", WithCue(UINT64_MAX, UINT64_MAX), kParseSucceeded, 80, Frames::kExactly, kAllFrames},
+      {"ClusterTimesAroundInt64Max", File({.cluster_time = {uint64_t{INT64_MAX}, uint64_t{INT64_MAX} + 1}}),
+       {101, 102}},
+      {"DurationLargestDouble", File({.insert = {kInfo, f64(kDuration, kHuge)}})},
+      {"DurationInfinite", File({.insert = {kInfo, f64(kDuration, INFINITY)}})},
+      {"DurationNotANumber", File({.insert = {kInfo, f64(kDuration, NAN)}})},
+      {"DurationNegative", File({.insert = {kInfo, f64(kDuration, -1e30)}})},
+      {"CueTimeAndPositionMax", WithCue(UINT64_MAX, UINT64_MAX)},
       // Nesting thousands of levels deep.
-      {"SimpleTagsNested5000Deep", Nested(ebml::kTag, ebml::kSimpleTag, 5000), kParseSucceeded, 80, Frames::kExactly,
-       kAllFrames},
-      {"ClustersNested3000Deep", Nested(ebml::kSegment, ebml::kCluster, 3000), kParseSucceeded, 80, Frames::kExactly,
-       kAllFrames},
-      {"BlockGroupsNested3000Deep", Nested(ebml::kCluster, ebml::kBlockGroup, 3000), kParseSucceeded, 80,
-       Frames::kExactly, kAllFrames},
-      {"UnknownMastersNested3000Deep", Nested(ebml::kSegment, kSomeUnknownId, 3000), kParseSucceeded, 80,
-       Frames::kExactly, kAllFrames},
+      {"SimpleTagsNested5000Deep", Nested(kTag, kSimpleTag, 5000)},
+      {"ClustersNested3000Deep", Nested(kSegment, kCluster, 3000)},
+      {"BlockGroupsNested3000Deep", Nested(kCluster, kBlockGroup, 3000)},
+      {"UnknownMastersNested3000Deep", Nested(kSegment, kSomeUnknownId, 3000)},
   };
 }
 
@@ -261,38 +210,34 @@ std::vector<Case> EveryLevelCases() {
     std::vector<std::pair<const char*, uint32_t>> children;
   };
   const std::vector<Level> levels = {
-      {"EbmlHeader", ebml::kEbmlHeader, {{"DocType", ebml::kDocType}, {"EbmlVersion", ebml::kEbmlVersion}}},
-      {"Segment", ebml::kSegment, {{"Info", ebml::kInfo}, {"Tracks", ebml::kTracks}, {"Cluster", ebml::kCluster},
-                                   {"Cues", ebml::kCues}, {"Tags", ebml::kTags}, {"SeekHead", ebml::kSeekHead},
-                                   {"Void", ebml::kVoid}, {"Unknown", kSomeUnknownId}}},
-      {"Info", ebml::kInfo, {{"TimecodeScale", ebml::kTimecodeScale}, {"Duration", ebml::kDuration},
-                             {"Title", ebml::kTitle}}},
-      {"Tracks", ebml::kTracks, {{"TrackEntry", ebml::kTrackEntry}}},
-      {"TrackEntry", ebml::kTrackEntry, {{"TrackNumber", ebml::kTrackNumber}, {"CodecId", ebml::kCodecId},
-                                         {"CodecPrivate", ebml::kCodecPrivate}, {"Audio", ebml::kAudio},
-                                         {"Video", ebml::kVideo}, {"ContentEncodings", ebml::kContentEncodings}}},
-      {"Audio", ebml::kAudio, {{"SamplingFrequency", ebml::kSamplingFrequency}, {"Channels", ebml::kChannels}}},
-      {"Cluster", ebml::kCluster, {{"Timecode", ebml::kTimecode}, {"SimpleBlock", ebml::kSimpleBlock},
-                                   {"BlockGroup", ebml::kBlockGroup}, {"Unknown", kSomeUnknownId}}},
-      {"BlockGroup", ebml::kBlockGroup, {{"Block", ebml::kBlock}, {"BlockDuration", ebml::kBlockDuration},
-                                         {"ReferenceBlock", ebml::kReferenceBlock}}},
-      {"Cues", ebml::kCues, {{"CuePoint", ebml::kCuePoint}}},
-      {"CuePoint", ebml::kCuePoint, {{"CueTime", ebml::kCueTime}, {"CueTrackPositions", ebml::kCueTrackPositions}}},
-      {"CueTrackPositions", ebml::kCueTrackPositions, {{"CueTrack", ebml::kCueTrack},
-                                                       {"CueClusterPosition", ebml::kCueClusterPosition}}},
-      {"Tags", ebml::kTags, {{"Tag", ebml::kTag}}},
-      {"Tag", ebml::kTag, {{"SimpleTag", ebml::kSimpleTag}}},
-      {"SimpleTag", ebml::kSimpleTag, {{"TagName", ebml::kTagName}, {"TagString", ebml::kTagString}}},
+      {"EbmlHeader", kEbmlHeader, {{"DocType", kDocType}, {"EbmlVersion", kEbmlVersion}}},
+      {"Segment", kSegment, {{"Info", kInfo}, {"Tracks", kTracks}, {"Cluster", kCluster}, {"Cues", kCues},
+                             {"Tags", kTags}, {"SeekHead", kSeekHead}, {"Void", kVoid}, {"Unknown", kSomeUnknownId}}},
+      {"Info", kInfo, {{"TimecodeScale", kTimecodeScale}, {"Duration", kDuration}, {"Title", kTitle}}},
+      {"Tracks", kTracks, {{"TrackEntry", kTrackEntry}}},
+      {"TrackEntry", kTrackEntry, {{"TrackNumber", kTrackNumber}, {"CodecId", kCodecId}, {"CodecPrivate", kCodecPrivate},
+                                   {"Audio", kAudio}, {"Video", kVideo}, {"ContentEncodings", kContentEncodings}}},
+      {"Audio", kAudio, {{"SamplingFrequency", kSamplingFrequency}, {"Channels", kChannels}}},
+      {"Cluster", kCluster, {{"Timecode", kTimecode}, {"SimpleBlock", kSimpleBlock}, {"BlockGroup", kBlockGroup},
+                             {"Unknown", kSomeUnknownId}}},
+      {"BlockGroup", kBlockGroup, {{"Block", kBlock}, {"BlockDuration", kBlockDuration},
+                                   {"ReferenceBlock", kReferenceBlock}}},
+      {"Cues", kCues, {{"CuePoint", kCuePoint}}},
+      {"CuePoint", kCuePoint, {{"CueTime", kCueTime}, {"CueTrackPositions", kCueTrackPositions}}},
+      {"CueTrackPositions", kCueTrackPositions, {{"CueTrack", kCueTrack}, {"CueClusterPosition", kCueClusterPosition}}},
+      {"Tags", kTags, {{"Tag", kTag}}},
+      {"Tag", kTag, {{"SimpleTag", kSimpleTag}}},
+      {"SimpleTag", kSimpleTag, {{"TagName", kTagName}, {"TagString", kTagString}}},
   };
   std::vector<Case> cases;
   for (const Level& level : levels) {
     for (const auto& [child_name, id] : level.children) {
       for (bool unknown : {false, true}) {
-        Shape s;
-        s.insert = {level.into, unknown ? ebml::unknown_size(id, {}) : ebml::element(id, {})};
         static std::vector<std::string> names;  // the cases keep pointers to their names
         names.push_back(std::string(unknown ? "UnknownSize" : "ZeroSize") + child_name + "In" + level.name);
-        cases.push_back({names.back().c_str(), File(s), 0, 0, Frames::kSome, kAllFrames});
+        const Bytes child = unknown ? unknown_size(id, {}) : element(id, {});
+        cases.push_back({names.back().c_str(), File({.insert = {level.into, child}}), kAllFrames, 0, 0,
+                         Delivered::kSome});
       }
     }
   }
@@ -321,9 +266,7 @@ void RunCase(const Case& c, bool named) {
     testing_support::HeaderParse parse(c.file);
     const int result = parse.Parse();
     EXPECT_TRUE(DeclaredParse(result)) << result;
-    if (named) {
-      EXPECT_EQ(result, c.parse);
-    }
+    EXPECT_TRUE(!named || result == c.parse) << result;
   }
   const std::string path = WriteTemp(c.file, c.name);
   for (uint32_t buffer_size : {7u, 4096u}) {
@@ -332,16 +275,14 @@ void RunCase(const Case& c, bool named) {
     options.input_buffer_size = buffer_size;
     const host::RunResult run = host::RunGraph(HostPlugin(), path, options);
     EXPECT_TRUE(run.rating == 0 || run.rating == 80) << run.rating;
-    if (named) {
-      EXPECT_EQ(run.rating, c.rating);
-    }
+    EXPECT_TRUE(!named || run.rating == c.rating) << run.rating;
     std::vector<uint32_t> sizes;
     for (const host::ChannelRun& channel : run.channels) {
       EXPECT_TRUE(channel.end_result == 2 || channel.end_result == 1) << channel.end_result;
       EXPECT_EQ(channel.foreign_elements, 0u);
       for (const host::RunFrame& frame : channel.frames) sizes.push_back(frame.size);
     }
-    if (c.frames == Frames::kExactly) {
+    if (c.frames == Delivered::kExactly) {
       EXPECT_EQ(sizes, c.sizes);
     } else {
       size_t matched = 0;

@@ -63,15 +63,9 @@ Bytes bin(uint32_t id, const Bytes& payload) { return element(id, payload); }
 Bytes filler(size_t n, uint8_t fill) { return Bytes(n, fill); }
 
 Bytes ebml_header(std::string_view doc_type) {
-  return master(kEbmlHeader, {
-                                 uinteger(kEbmlVersion, 1),
-                                 uinteger(kEbmlReadVersion, 1),
-                                 uinteger(kEbmlMaxIdLength, 4),
-                                 uinteger(kEbmlMaxSizeLength, 8),
-                                 str(kDocType, doc_type),
-                                 uinteger(kDocTypeVersion, 4),
-                                 uinteger(kDocTypeReadVersion, 2),
-                             });
+  return master(kEbmlHeader, {uinteger(kEbmlVersion, 1), uinteger(kEbmlReadVersion, 1), uinteger(kEbmlMaxIdLength, 4),
+                              uinteger(kEbmlMaxSizeLength, 8), str(kDocType, doc_type), uinteger(kDocTypeVersion, 4),
+                              uinteger(kDocTypeReadVersion, 2)});
 }
 
 }  // namespace ebml

@@ -1,5 +1,7 @@
 #include "tests/support/log_recorder.h"
 
+#include <algorithm>
+
 #include "host/log_control.h"
 
 namespace testing_support {
@@ -19,11 +21,8 @@ std::vector<std::pair<int, std::string>> LogRecorder::messages() const {
 }
 
 bool LogRecorder::Contains(int level, const std::string& text) const {
-  std::lock_guard lock(mutex_);
-  for (const auto& [l, t] : messages_) {
-    if (l == level && t == text) return true;
-  }
-  return false;
+  const auto all = messages();
+  return std::find(all.begin(), all.end(), std::pair<int, std::string>(level, text)) != all.end();
 }
 
 }  // namespace testing_support

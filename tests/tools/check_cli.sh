@@ -6,16 +6,27 @@
 #   check_cli.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
 source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 
-work=$(mktemp -d)
-trap 'rm -rf "$work"' EXIT
 cd "$work" || exit 1
 ln -s "$fixtures/avc_aac.mkv" ./-dash.mkv
 mkv=$fixtures/avc_aac.mkv
 not_mkv=$source_dir/README.md
 missing=$work/missing.mkv
 
-# exit code | stream (out, err) | expected substring | arguments (words; $mkv, $not_mkv, $missing, $work expand)
-table=$(cat <<'EOF'
+# exit code | stream (out, err) | expected substring | arguments (words; $mkv, $fixtures, $not_mkv, $missing, $work expand)
+while IFS='|' read -r code stream want args; do
+  want=${want//\$missing/$missing}; want=${want//\$not_mkv/$not_mkv}; want=${want//\$work/$work}
+  args=${args//\$mkv/$mkv}; args=${args//\$fixtures/$fixtures}; args=${args//\$missing/$missing}; args=${args//\$not_mkv/$not_mkv}; args=${args//\$work/$work}
+  # shellcheck disable=SC2086
+  "${kelvane[@]}" $args </dev/null >"$work/out" 2>"$work/err"
+  got=$?
+  [[ $got == "$code" ]] || fail "kelvane $args: exit code $got, expected $code"
+  grep -qF -- "$want" "$work/$stream" || fail "kelvane $args: no '$want' on std$stream: $(head -c 300 "$work/$stream")"
+  # The framework's names and answer codes only with KELVANE_LOG.
+  ! grep -qE 'answered|answer -?[0-9]|Sniff|Parser_|Mmf|rating [0-9]' "$work/err" || fail "kelvane $args: framework words: $(cat "$work/err")"
+  # Help goes to standard output only; errors to standard error only.
+  [[ $code != 0 || ! -s $work/err ]] || fail "kelvane $args: succeeded but wrote to stderr: $(head -c 200 "$work/err")"
+  [[ $code != 2 || ! -s $work/out ]] || fail "kelvane $args: usage error but wrote to stdout"
+done <<'EOF'
 0|out|usage: kelvane COMMAND|--help
 0|out|kelvane 0.|--version
 0|out|kelvane 0.|info --version
@@ -68,6 +79,7 @@ table=$(cat <<'EOF'
 2|err|kelvane packets: --channels: '0,0' is not a list of distinct|packets --channels 0,0 $mkv
 2|err|offers no channel 2; its channels: 0 (track 1), 1 (track 2)|packets --channels 2 $mkv
 2|err|kelvane packets: --seek: '1@x' is not TIME[@AT]|packets --seek 1@x $mkv
+2|err|kelvane packets: --seek: 'x' is not TIME[@AT]|packets --seek x $mkv
 2|err|kelvane packets: --ff: '-3' is not SPEED[@AT]|packets --ff -3 $mkv
 2|err|kelvane packets: --trick-time: '0' is not MS|packets --trick-time 0 $mkv
 2|err|kelvane packets: --scan-end needs a value|packets $mkv --scan-end
@@ -88,26 +100,17 @@ table=$(cat <<'EOF'
 1|err|kelvane metadata: cannot read $work: Is a directory|metadata $work
 1|err|kelvane metadata: $not_mkv: not a Matroska file|metadata $not_mkv
 0|out|Width (NUM4): 160|metadata $mkv
+0|out|  kelvane extract movie.mkv|extract --help
+2|err|offers no track 9 (offered: 1 2 3 4)|extract $fixtures/multi_audio.mkv -t 9 -o $work/none
+2|err|try 'kelvane extract --help'|extract $mkv
+2|err|kelvane extract: unknown option '--bogus'|extract --bogus $mkv -o $work/none
+2|err|kelvane extract: --buffer-size: '0' is not a number of bytes from 1 to 67108864|extract --buffer-size=0 $mkv -o $work/none
+2|err|kelvane extract: --track: 'x' is not a list of track numbers|extract $mkv --track x -o $work/none
+2|err|kelvane extract: FILE cannot be standard input|extract - -o $work/none
+1|err|kelvane extract: cannot open $missing|extract $missing -o $work/none
+1|err|kelvane extract: $not_mkv: not a Matroska file|extract $not_mkv -o $work/none
+1|err|webm_vp8_vorbis.mkv: DocType webm is not played|extract $fixtures/webm_vp8_vorbis.mkv -o $work/none
 EOF
-)
-
-while IFS='|' read -r code stream want args; do
-  want=${want//\$missing/$missing}; want=${want//\$not_mkv/$not_mkv}; want=${want//\$work/$work}
-  args=${args//\$mkv/$mkv}; args=${args//\$fixtures/$fixtures}; args=${args//\$missing/$missing}; args=${args//\$not_mkv/$not_mkv}; args=${args//\$work/$work}
-  # shellcheck disable=SC2086
-  "${kelvane[@]}" $args </dev/null >"$work/out" 2>"$work/err"
-  got=$?
-  [[ $got == "$code" ]] || fail "kelvane $args: exit code $got, expected $code"
-  grep -qF -- "$want" "$work/$stream" || fail "kelvane $args: no '$want' on std$stream: $(head -c 300 "$work/$stream")"
-  # The framework's names and answer codes only with KELVANE_LOG.
-  ! grep -qE 'answered|answer -?[0-9]|Sniff|Parser_|Mmf|rating [0-9]' "$work/err" || fail "kelvane $args: framework words: $(cat "$work/err")"
-  # Help goes to standard output only; errors to standard error only.
-  if [[ $code == 0 ]]; then
-    [[ ! -s $work/err ]] || fail "kelvane $args: succeeded but wrote to stderr: $(head -c 200 "$work/err")"
-  elif [[ $code == 2 ]]; then
-    [[ ! -s $work/out ]] || fail "kelvane $args: usage error but wrote to stdout"
-  fi
-done <<<"$table"
 
 # --until and --frames end playback early: the audio frames before 0.5 s as mkvinfo lists them, 3 per channel.
 want=$(awk '$1 == 2 && $2 < 500 { n += split($5, f, ",") } END { print n }' "$fixtures/avc_aac.blocks")
@@ -149,8 +152,21 @@ done
 # common header fields, and the file name back exactly as given, with the
 # bytes that are not UTF-8 replaced by U+FFFD. One reader checks every
 # document: arguments come in threes (command, file, document).
-check_json() {
-  python3 -c '
+odd=$work/$'odd "name" \\ \x01\t\x7f \xff\xc3( caf\xc3\xa9.mkv'
+ln -s "$(cd "$fixtures" && pwd)/tags.mkv" "$odd"
+documents=()
+for file in "$fixtures"/*.mkv "$odd"; do
+  for command in info probe metadata packets; do
+    json=$work/doc${#documents[@]}.json
+    "${kelvane[@]}" "$command" --json $([[ $command == packets ]] && echo --no-hash) "$file" >"$json" 2>/dev/null
+    status=$?
+    [[ $file == "$odd" && $status != 0 ]] && fail "$command --json on the oddly named file: exit code $status"
+    # A refused or damaged file still gets its document from probe and packets.
+    [[ $status == 0 || ($command == probe || $command == packets) && $status == 1 ]] &&
+      documents+=("$command" "$file" "$json")
+  done
+done
+python3 - "${documents[@]}" <<'PY' || failures=$((failures + 1))
 import json, sys
 def refuse(name): raise ValueError("not JSON: " + name)
 args, bad = sys.argv[1:], 0
@@ -166,33 +182,6 @@ for command, name, path in zip(args[0::3], args[1::3], args[2::3]):
         print("FAIL %s --json %r: %s" % (command, name, error))
         bad += 1
 sys.exit(bad > 0)
-' "$@"
-}
-if command -v python3 >/dev/null; then
-  odd=$work/$'odd "name" \\ \x01\t\x7f \xff\xc3( caf\xc3\xa9.mkv'
-  ln -s "$(cd "$fixtures" && pwd)/tags.mkv" "$odd"
-  documents=()
-  for file in "$fixtures"/*.mkv "$odd"; do
-    for command in info probe metadata packets; do
-      extra=()
-      [[ $command == packets ]] && extra=(--no-hash)
-      json=$work/doc${#documents[@]}.json
-      "${kelvane[@]}" "$command" --json "${extra[@]}" "$file" >"$json" 2>/dev/null
-      status=$?
-      [[ $file == "$odd" && $status != 0 ]] && fail "$command --json on the oddly named file: exit code $status"
-      # A refused or damaged file still gets its document from probe and packets.
-      if [[ $status == 0 || ($command == probe || $command == packets) && $status == 1 ]]; then
-        documents+=("$command" "$file" "$json")
-      fi
-    done
-  done
-  check_json "${documents[@]}" || failures=$((failures + 1))
-else
-  fail "python3 is needed to validate the --json output"
-fi
+PY
 
-if ((failures)); then
-  echo "$failures failures"
-  exit 1
-fi
-echo "kelvane help, errors, exit codes and JSON output as documented"
+finish "kelvane help, errors, exit codes and JSON output as documented"

@@ -9,8 +9,6 @@
 # and agrees with mkvinfo's up to there.
 #   check_info.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
 source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
-work=$(mktemp -d)
-trap 'rm -rf "$work"' EXIT
 
 args=()
 for expected in "$source_dir/samples/sample.expected" "$fixtures"/*.expected; do
@@ -82,11 +80,8 @@ for expected, info_path, tree_path in zip(*[iter(sys.argv[1:])] * 3):
 sys.exit(bad > 0)
 PY
 
-# A file that is not Matroska is refused with exit code 1; a damaged one lists what it could read.
-"${kelvane[@]}" info "$source_dir/README.md" >/dev/null 2>&1
-[[ $? == 1 ]] || fail "README.md: info exit code $? for a file that is not Matroska"
+# A damaged file lists what it could read.
 head -c 6000 "$fixtures/avc_aac.mkv" >"$work/cut.mkv"
 out=$("${kelvane[@]}" info --tree "$work/cut.mkv" 2>/dev/null)
 [[ $? == 1 && $out == *"stopped at byte 5610: the file ends inside SimpleBlock at 5610"* ]] || fail "a cut file's tree: $(tail -1 <<<"$out")"
-echo "$failures mismatches"
-((failures == 0))
+finish "kelvane info agrees with mkvinfo on every fixture"
