@@ -7,7 +7,8 @@ what=${1:-test}
 packages=(cmake make g++ googletest libgtest-dev libgmock-dev zlib1g-dev)
 if [[ $what == test ]]; then
   # mkvtoolnix: mkvextract's attachments, chapters and timestamps, against which extract's are checked.
-  packages+=(g++-arm-linux-gnueabihf qemu-user clang libclang-rt-14-dev libbenchmark-dev ffmpeg mkvtoolnix)
+  # python3: the tool checks read the JSON documents with it.
+  packages+=(g++-arm-linux-gnueabihf qemu-user clang libclang-rt-14-dev libbenchmark-dev ffmpeg mkvtoolnix python3)
 fi
 
 missing=()
