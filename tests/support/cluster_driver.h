@@ -104,12 +104,9 @@ class Driver {
     return view;
   }
 
-  // The parser waits for the bytes after inbuff1, as the output path takes it.
-  bool waits(int result) const {
-    return mkvcluster_answer(cluster_.get(), result) == cluster_answer::need_more_data && in1_.buff_left == 0;
-  }
-
-  void fail(int result) {
+  // The parser waits for the bytes after inbuff1, as the output path takes it; any other answer fails.
+  void wait_or_fail(int result) {
+    if (mkvcluster_answer(cluster_.get(), result) == cluster_answer::need_more_data && in1_.buff_left == 0) return;
     outcome_.failed = true;
     outcome_.failure = result;
   }
@@ -148,8 +145,7 @@ class Driver {
       skip_left_ = skip;
       return apply_skip();
     }
-    if (waits(result)) return;
-    fail(result);
+    wait_or_fail(result);
   }
 
   void read_group_tail() {
@@ -165,8 +161,7 @@ class Driver {
       finish_group_tail();
       return start_block();
     }
-    if (waits(result)) return;
-    fail(result);
+    wait_or_fail(result);
   }
 
   void finish_group_tail() {

@@ -20,17 +20,11 @@ std::string FixturePath(const std::string& file) {
 
 namespace {
 
-bool ReadWholeFile(const std::string& path, std::string* text) {
-  std::ifstream in(path, std::ios::binary);
-  if (!in) return false;
-  text->assign(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
-  return !in.bad();
-}
-
+// FILE's bytes; empty (with ADD_FAILURE) when it cannot be read.
 std::string ReadTextOrFail(const std::string& file) {
-  std::string text;
-  if (!ReadWholeFile(FixturePath(file), &text)) ADD_FAILURE() << "cannot read fixture file " << FixturePath(file);
-  return text;
+  std::ifstream in(FixturePath(file), std::ios::binary);
+  if (!in) ADD_FAILURE() << "cannot read fixture file " << FixturePath(file);
+  return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
 }
 
 // Whole-token number parsers: a sign, trailing characters or an empty token fail.
@@ -215,11 +209,7 @@ std::vector<ExpectedFullFrame> LoadFullFrames(const std::string& name) {
 }
 
 std::vector<uint8_t> ReadFixtureBytes(const std::string& name) {
-  std::string bytes;
-  if (!ReadWholeFile(FixturePath(name + ".mkv"), &bytes)) {
-    ADD_FAILURE() << "cannot read fixture file " << FixturePath(name + ".mkv");
-    return {};
-  }
+  const std::string bytes = ReadTextOrFail(name + ".mkv");
   return std::vector<uint8_t>(bytes.begin(), bytes.end());
 }
 
