@@ -18,10 +18,12 @@
 #include <algorithm>
 #include <cstdio>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
 #include <iterator>
 #include <map>
 #include <memory>
+#include <set>
 #include <string>
 #include <tuple>
 #include <vector>
@@ -324,5 +326,16 @@ TEST_P(ConformanceTest, EveryFailedAllocationEndsWithoutLeaking) {
 
 INSTANTIATE_TEST_SUITE_P(Fixtures, ConformanceTest, testing::ValuesIn(testing_support::FixtureNames()),
                          [](const testing::TestParamInfo<std::string>& info) { return info.param; });
+
+// Every fixture on disk is listed in index.txt once, so every one is played here.
+TEST(FixtureIndexTest, ListsEveryFileOnce) {
+  std::vector<std::string> names = testing_support::FixtureNames();
+  std::set<std::string> listed(names.begin(), names.end()), on_disk;
+  EXPECT_EQ(listed.size(), names.size());
+  for (const auto& entry : std::filesystem::directory_iterator(testing_support::FixturePath("."))) {
+    if (entry.path().extension() == ".mkv") on_disk.insert(entry.path().stem().string());
+  }
+  EXPECT_EQ(listed, on_disk);
+}
 
 }  // namespace
