@@ -175,12 +175,9 @@ void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
   // As many input buffers as the runner gives a graph: the ring's plus what frames still point into.
   const uint32_t buffers = std::clamp<uint32_t>((16u << 20) / header.buffer_size, 48, 2048);
   host::FileStreamer streamer(source.get(), host::StreamerConfig{header.buffer_size, buffers});
-  host::SetupOptions setup;
-  setup.buffer_size = header.buffer_size;
-  setup.configure_outputs = false;
-  setup.upstream = host::FileStreamer::Ops();
-  setup.input_pool = host::MemoryPool::Ops();
-  setup.input_pool_param = prefix_pool.handle();
+  const host::SetupOptions setup{.buffer_size = header.buffer_size, .configure_outputs = false,
+                                 .upstream = host::FileStreamer::Ops(), .input_pool = host::MemoryPool::Ops(),
+                                 .input_pool_param = prefix_pool.handle()};
   host::FilterGraph graph(*plugin, *rating_stream, setup);
   Check(OneOf(graph.rating(), {0, kMmfRatingAccepted}), "rating", graph.rating());
   if (!graph.rated() || graph.outputs().empty()) return;
@@ -252,9 +249,7 @@ void PlayThreaded(const uint8_t* file, size_t size, const Header& header) {
   size_t outputs = 0;
   {
     auto stream = host::MakeMemoryStream(file, size, true, "fuzz");
-    host::SetupOptions setup;
-    setup.configure_outputs = false;
-    host::FilterGraph graph(*plugin, *stream, setup);
+    host::FilterGraph graph(*plugin, *stream, {.configure_outputs = false});
     if (!graph.rated()) return;
     for (const host::OutputChannelSetup& output : graph.outputs()) outputs += output.formats_offered > 0;
   }

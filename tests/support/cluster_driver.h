@@ -44,7 +44,6 @@ struct DriveOptions {
 struct DriveOutcome {
   std::vector<DrivenBlock> blocks;
   bool failed = false;    // a result that was neither a block, a skip nor "ran out" with inbuff1 used up
-  int failure = 0;        // that result
   bool complete = false;  // every byte was consumed and no read or frame was left half done
 };
 
@@ -108,7 +107,6 @@ class Driver {
   void wait_or_fail(int result) {
     if (mkvcluster_answer(cluster_.get(), result) == cluster_answer::need_more_data && in1_.buff_left == 0) return;
     outcome_.failed = true;
-    outcome_.failure = result;
   }
 
   void apply_skip() {
@@ -265,7 +263,7 @@ inline uint64_t FirstClusterOffset(const uint8_t* file, size_t size) {
 }
 
 inline DriveOutcome DriveClusters(const uint8_t* file, size_t size, uint64_t start, const DriveOptions& options) {
-  if (start >= size) return DriveOutcome{{}, false, 0, true};
+  if (start >= size) return DriveOutcome{{}, false, true};
   return cluster_driver_detail::Driver(file, size, start, options).run();
 }
 
