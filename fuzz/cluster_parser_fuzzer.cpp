@@ -7,21 +7,16 @@
 // tails read, buffers of 7 bytes, no allocation failure). Dictionary:
 // fuzz/cluster_parser.dict.
 
-#include <cstdint>
-#include <cstdio>
-#include <cstdlib>
-#include <string>
-
-#include "host/log_control.h"
+#include "fuzz/fuzz_input.h"
 #include "tests/support/cluster_fuzz_input.h"
 
+extern "C" int LLVMFuzzerInitialize(int*, char***) {
+  host::SetLogThreshold(0);
+  return 0;
+}
+
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  static const bool quiet = (host::SetLogThreshold(0), true);
-  (void)quiet;
-  std::string broken = testing_support::RunClusterFuzzInput(data, size);
-  if (!broken.empty()) {
-    std::fprintf(stderr, "cluster parser: %s\n", broken.c_str());
-    std::abort();
-  }
+  const std::string broken = testing_support::RunClusterFuzzInput(data, size);
+  fuzz_input::Check(broken.empty(), broken.c_str());
   return 0;
 }

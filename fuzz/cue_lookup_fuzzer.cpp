@@ -13,8 +13,6 @@
 // cue's ticks and up to 4 positions (track, cluster, codec state), then
 // queries of one op byte and one number each until the input ends.
 
-#include <cstdint>
-#include <cstdlib>
 #include <memory>
 #include <string>
 #include <vector>
@@ -26,8 +24,6 @@
 #include "filter/rating.h"
 #include "filter/time_converter.h"
 #include "fuzz/fuzz_input.h"
-#include "host/heap_control.h"
-#include "host/log_control.h"
 #include "tests/support/cue_rules.h"
 
 namespace {
@@ -39,28 +35,39 @@ constexpr int kMaxQueries = 256;
 constexpr int kNoConversion = 4002;
 constexpr int kNoCueingData = 48;
 
+using fuzz_input::Check;
+
 // What the filter logged during the current query, as "level text".
 std::vector<std::string> logged;
 
-void Check(bool condition) {
-  if (!condition) std::abort();
-}
-
-struct ModelPosition {
-  uint64_t track, cluster;
-};
-struct ModelCue {
-  uint64_t ticks;
-  std::vector<ModelPosition> positions;
-};
-struct ModelChannel {
-  uint64_t track;
-  bool acquired;
-};
+struct ModelPosition { uint64_t track, cluster; };
+struct ModelCue { uint64_t ticks; std::vector<ModelPosition> positions; };
+struct ModelChannel { uint64_t track; bool acquired; };
 
 // The search and conversion rules over plain vectors, in list order, and the
 // messages each logs.
 struct Model {
+  explicit Model(fuzz_input::Reader& in) {
+    const uint8_t flags = in.Byte();
+    has_cues = flags & 1;
+    preroll = flags & 2;
+    scale = in.Number();
+    segment = in.Number();
+    first_cluster = in.Number();
+    for (int32_t k = in.Byte() % (kMaxChannels + 1); k > 0; --k) {
+      const uint8_t b = in.Byte();
+      channels.push_back({static_cast<uint64_t>(b & 7), (b & 8) != 0});
+    }
+    const uint32_t cue_count = in.Byte() % (kMaxCues + 1);
+    for (uint32_t i = 0; i < cue_count && !in.empty(); ++i) {
+      cues.push_back({in.Number(), {}});
+      for (uint32_t j = in.Byte() % (kMaxPositionsPerCue + 1); j > 0; --j) {
+        const uint64_t track = in.Byte() & 7;
+        cues.back().positions.push_back({track, in.Number()});
+      }
+    }
+  }
+
   bool has_cues = false;
   bool preroll = false;
   uint64_t scale = 0, segment = 0, first_cluster = 0;
@@ -72,7 +79,9 @@ struct Model {
 
   uint64_t Time(const ModelCue& cue) const { return cue.ticks * (scale / 1000); }
 
+  // Once per table: when no position names an acquired channel's track, every channel's counts.
   void Validate() {
+    if (validated) return;
     validated = true;
     for (const ModelCue& cue : cues) {
       for (const ModelPosition& p : cue.positions) {
@@ -97,7 +106,7 @@ struct Model {
       return kNoCueingData;
     }
     *position = kNoCuePosition;
-    if (!validated) Validate();
+    Validate();
     if (cues.empty()) return 0;
     std::vector<uint64_t> times;
     for (const ModelCue& cue : cues) times.push_back(Time(cue));
@@ -146,9 +155,11 @@ struct Model {
       log.push_back("5 kelvane: ConvertToTime() no cueing data.");
       return position == first_cluster ? 0 : kNoConversion;
     }
-    if (!validated) Validate();
+    Validate();
     uint64_t cue_time = 0, previous = 0;
-    if (const ModelPosition* p = AtOrAfter(position, &cue_time, &previous)) *time = segment + p->cluster == position ? cue_time : previous;
+    if (const ModelPosition* p = AtOrAfter(position, &cue_time, &previous)) {
+      *time = segment + p->cluster == position ? cue_time : previous;
+    }
     return 0;
   }
 
@@ -193,15 +204,15 @@ struct FilterUnderTest {
     info.parse_flags = model.has_cues ? kMetCues : 0;
     for (const ModelCue& row : model.cues) {
       auto* cue = mem_new_zeroed<mkv_cue_point>();
-      Check(cue != nullptr);
+      Check(cue != nullptr, "cue point");
       cue->cue_time = row.ticks;
       for (const ModelPosition& p : row.positions) {
         auto* position = mem_new_zeroed<mkv_cue_track_position>();
-        Check(position != nullptr);
+        Check(position != nullptr, "cue position");
         *position = {p.track, p.cluster, 0, p.track & 1, {}};
-        Check(mkv_queue_append(&cue->track_positions, position));
+        Check(mkv_queue_append(&cue->track_positions, position), "cue position");
       }
-      Check(mkv_queue_append(&info.cue_points, cue));
+      Check(mkv_queue_append(&info.cue_points, cue), "cue point");
     }
   }
   ~FilterUnderTest() { free_cue_points(&context->FileInfo.cue_points); }
@@ -217,32 +228,6 @@ struct FilterUnderTest {
   std::vector<mkv_track_info> tracks;
 };
 
-Model ReadModel(fuzz_input::Reader& in) {
-  Model model;
-  const uint8_t flags = in.Byte();
-  model.has_cues = flags & 1;
-  model.preroll = flags & 2;
-  model.scale = in.Number();
-  model.segment = in.Number();
-  model.first_cluster = in.Number();
-  const auto channel_count = static_cast<int32_t>(in.Byte() % (kMaxChannels + 1));
-  for (int32_t k = 0; k < channel_count; ++k) {
-    const uint8_t b = in.Byte();
-    model.channels.push_back({static_cast<uint64_t>(b & 7), (b & 8) != 0});
-  }
-  const uint32_t cue_count = in.Byte() % (kMaxCues + 1);
-  for (uint32_t i = 0; i < cue_count && !in.empty(); ++i) {
-    ModelCue cue{in.Number(), {}};
-    const uint32_t positions = in.Byte() % (kMaxPositionsPerCue + 1);
-    for (uint32_t j = 0; j < positions; ++j) {
-      const uint64_t track = in.Byte() & 7;
-      cue.positions.push_back({track, in.Number()});
-    }
-    model.cues.push_back(cue);
-  }
-  return model;
-}
-
 void RunQueries(fuzz_input::Reader& in, Model& model, FilterUnderTest& under_test) {
   MkvFilter* filter = &under_test.filter;
   MkvContext* context = under_test.context.get();
@@ -251,59 +236,53 @@ void RunQueries(fuzz_input::Reader& in, Model& model, FilterUnderTest& under_tes
     model.log.clear();
     const uint8_t op = in.Byte();
     const uint64_t value = in.Number();
+    uint64_t want_out = 0x5A5A, got_out = 0x5A5A, want_time = value, got_time = value;
     switch (op % 7) {
       case 0:
       case 1: {
         const bool forward = op % 7 == 1;
-        uint64_t want_time = value, want_position = 0xA5A5;
-        uint64_t got_time = value, got_position = 0xA5A5;
-        const int want = model.Search(&want_time, forward, &want_position);
-        const int got = GetCueingPosition(filter, &got_time, forward ? 1 : 0, &got_position);
-        Check(got == want && got_time == want_time && got_position == want_position);
+        const int want = model.Search(&want_time, forward, &want_out);
+        const int got = GetCueingPosition(filter, &got_time, forward ? 1 : 0, &got_out);
+        Check(got == want && got_time == want_time && got_out == want_out, "GetCueingPosition", got);
         break;
       }
       case 2: {
-        uint64_t want_position = 0x5A5A, got_position = 0x5A5A;
-        const int want = model.ToPosition(value, &want_position);
-        const int got = ConvertToPosition(filter, value, &got_position);
-        Check(got == want && got_position == want_position && context->LastPositionTime == value);
+        const int want = model.ToPosition(value, &want_out);
+        const int got = ConvertToPosition(filter, value, &got_out);
+        Check(got == want && got_out == want_out && context->LastPositionTime == value, "ConvertToPosition", got);
         break;
       }
       case 3: {
-        uint64_t want_time = 0x5A5A, got_time = 0x5A5A;
-        const int want = model.ToTime(value, &want_time);
-        const int got = ConvertToTime(filter, value, &got_time);
-        Check(got == want && got_time == want_time && context->LastPositionTime == model.last_position_time);
+        const int want = model.ToTime(value, &want_out);
+        const int got = ConvertToTime(filter, value, &got_out);
+        Check(got == want && got_out == want_out && context->LastPositionTime == model.last_position_time,
+              "ConvertToTime", got);
         break;
       }
-      case 4: {
-        Check(Seek(filter, value, value ^ 0x55) == 0);
+      case 4:
+        Check(Seek(filter, value, value ^ 0x55) == 0, "Seek");
         model.Seek(value ^ 0x55);
         for (size_t k = 0; k < model.channels.size(); ++k) {
-          if (!model.preroll || !model.channels[k].acquired) continue;
-          Check(under_test.states[k].PrerollTime == value && under_test.states[k].PrerollPending == 1);
+          Check(!model.preroll || !model.channels[k].acquired ||
+                    (under_test.states[k].PrerollTime == value && under_test.states[k].PrerollPending == 1),
+                "preroll after Seek");
         }
         break;
-      }
-      case 5: {
-        const int32_t want = model.ByteRate();
+      case 5:
         CalcOverallByteRate(filter);
-        Check(context->ByteRate == want);
+        Check(context->ByteRate == model.ByteRate(), "CalcOverallByteRate", context->ByteRate);
         break;
-      }
-      default: {
+      default:
         // Acquisition may change after the table was validated; the flags stay.
         if (model.channels.empty()) break;
         const size_t k = value % model.channels.size();
         model.channels[k].acquired = !model.channels[k].acquired;
         under_test.Acquire(k, model.channels[k].acquired);
-        break;
-      }
     }
-    Check(logged == model.log);
+    Check(logged == model.log, "logged messages");
     const uint32_t flags = context->CueTableFlags;
-    Check(((flags & kCueTableValidated) != 0) == model.validated);
-    Check(!model.validated || ((flags & kCueTableAllTracksCount) != 0) == model.all_tracks);
+    Check(((flags & kCueTableValidated) != 0) == model.validated, "validated flag");
+    Check(!model.validated || ((flags & kCueTableAllTracksCount) != 0) == model.all_tracks, "all-tracks flag");
   }
 }
 
@@ -316,13 +295,11 @@ extern "C" int LLVMFuzzerInitialize(int*, char***) {
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  const int64_t live_before = host::LiveBlockCount();
-  {
+  fuzz_input::ExpectNoBlockLeft([&] {
     fuzz_input::Reader in(data, size);
-    Model model = ReadModel(in);
+    Model model(in);
     FilterUnderTest under_test(model);
     RunQueries(in, model, under_test);
-  }
-  Check(host::LiveBlockCount() == live_before);
+  });
   return 0;
 }

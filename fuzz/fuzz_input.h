@@ -1,13 +1,39 @@
 #pragma once
-// Reading a fuzz input as a sequence of choices. Exhausted input reads as
-// zeros, so every input decodes to something. Numbers come in a few shapes
-// picked by a tag byte, so that values next to the 32- and 64-bit limits
-// turn up as often as small ones.
+// What the fuzz targets share: reading an input as a sequence of choices,
+// checks that abort with what failed, and the heap's balance around a run.
+// Exhausted input reads as zeros, so every input decodes to something.
+// Numbers come in a few shapes picked by a tag byte, so that values next to
+// the 32- and 64-bit limits turn up as often as small ones.
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <initializer_list>
+
+#include "host/heap_control.h"
+#include "host/log_control.h"
 
 namespace fuzz_input {
+
+inline void Check(bool condition, const char* what, long value = 0) {
+  if (condition) return;
+  std::fprintf(stderr, "fuzz check failed: %s (%ld)\n", what, value);
+  std::abort();
+}
+
+inline bool OneOf(int value, std::initializer_list<int> allowed) {
+  return std::find(allowed.begin(), allowed.end(), value) != allowed.end();
+}
+
+// Runs `run` and checks that it freed every block it allocated.
+template <typename Run>
+void ExpectNoBlockLeft(Run run) {
+  const int64_t live = host::LiveBlockCount();
+  run();
+  Check(host::LiveBlockCount() == live, "blocks left allocated", static_cast<long>(host::LiveBlockCount() - live));
+}
 
 class Reader {
  public:

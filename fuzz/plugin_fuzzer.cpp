@@ -14,8 +14,7 @@
 //           mode plays (one without a format: its operations are tried);
 //   byte 1: input buffer size code; byte 2: TrickTime code (0: default);
 //   then commands of an op byte and an argument (see Command).
-// KELVANE_FUZZ_SINGLE=1 forces the deterministic mode, to reproduce a crash;
-// KELVANE_FUZZ_VERBOSE=1 prints what each run did.
+// KELVANE_FUZZ_SINGLE=1 forces the deterministic mode, to reproduce a crash.
 //
 // Every answer must be a specified one, every frame element must lie inside
 // the buffer it names (threaded runs: inside an input buffer), and after
@@ -23,13 +22,8 @@
 
 #include <unistd.h>
 
-#include <algorithm>
 #include <chrono>
-#include <cstdint>
-#include <cstdio>
-#include <cstdlib>
 #include <cstring>
-#include <initializer_list>
 #include <memory>
 #include <string>
 #include <thread>
@@ -40,9 +34,7 @@
 #include "host/graph_clock.h"
 #include "host/graph_runner.h"
 #include "host/graph_setup.h"
-#include "host/heap_control.h"
 #include "host/input_streams.h"
-#include "host/log_control.h"
 #include "host/memory_pools.h"
 #include "host/playback_control.h"
 #include "host/plugin_loader.h"
@@ -62,26 +54,15 @@ constexpr int kMaxShortInputs = 64;
 constexpr size_t kHeaderSearch = 64;
 constexpr size_t kHeaderWithoutMagic = 8;
 
-void Fail(const char* what, long value) {
-  std::fprintf(stderr, "plugin fuzzer: %s (%ld)\n", what, value);
-  std::abort();
-}
-void Check(bool condition, const char* what, long value = 0) {
-  if (!condition) Fail(what, value);
-}
-bool OneOf(int value, std::initializer_list<int> allowed) {
-  return std::find(allowed.begin(), allowed.end(), value) != allowed.end();
-}
+using fuzz_input::Check;
+using fuzz_input::OneOf;
 
 const host::Plugin* plugin = nullptr;
-bool verbose = false;
 std::string scratch_path;
 
 // What NextBuffer may end with: an error, the end of the stream, a short
 // input, or the stopped state.
 bool SpecifiedEnd(int result) { return OneOf(result, {1, kMmfEndOfStream, 4, 16}); }
-bool SpecifiedScan(int result) { return OneOf(result, {0, 48, kMmfInvalidArgument, kMmfNotAvailable, 12}); }
-bool SpecifiedSeek(int result) { return OneOf(result, {0, kMmfNoConversion}); }
 bool SpecifiedControl(int result) { return OneOf(result, {0, kMmfStoppedAfterError}); }
 
 struct Command {
@@ -101,16 +82,6 @@ struct Header {
   std::vector<Command> commands;
 };
 
-Command ReadCommand(fuzz_input::Reader& in) {
-  const uint8_t op = in.Byte();
-  Command command{static_cast<Command::Kind>(op % 9), 0, 0, 0};
-  // A seek mostly within the first ten seconds, sometimes anywhere.
-  command.time_us = op & 0x80 ? in.Number() : uint64_t{in.Byte()} * 40000;
-  command.speed = op & 0x40 ? static_cast<uint32_t>(in.Number()) : 100u * (1 + in.Byte() % 16);
-  command.amount = in.Byte();
-  return command;
-}
-
 Header ReadHeader(const uint8_t* data, size_t size) {
   fuzz_input::Reader in(data, size);
   Header header;
@@ -122,8 +93,16 @@ Header ReadHeader(const uint8_t* data, size_t size) {
   header.buffer_size = code < 128 ? code + 1u : (code - 127u) * 512u;
   const uint8_t trick = in.Byte();
   header.trick_time_ms = trick ? 500 + trick * 2 : 0;
-  while (!in.empty() && header.commands.size() < kMaxCommands) header.commands.push_back(ReadCommand(in));
-  const char* single = std::getenv("KELVANE_FUZZ_SINGLE");
+  while (!in.empty() && header.commands.size() < kMaxCommands) {
+    const uint8_t op = in.Byte();
+    Command command{static_cast<Command::Kind>(op % 9), 0, 0, 0};
+    // A seek mostly within the first ten seconds, sometimes anywhere.
+    command.time_us = op & 0x80 ? in.Number() : uint64_t{in.Byte()} * 40000;
+    command.speed = op & 0x40 ? static_cast<uint32_t>(in.Number()) : 100u * (1 + in.Byte() % 16);
+    command.amount = in.Byte();
+    header.commands.push_back(command);
+  }
+  const char* single = std::getenv("KELVANE_FUZZ_SINGLE");  // reproduces a crash on one thread
   if (single && *single && *single != '0') header.threads = 0;
   return header;
 }
@@ -138,68 +117,56 @@ size_t FileStart(const uint8_t* data, size_t size) {
   return std::min(size, kHeaderWithoutMagic);
 }
 
-// The buffer elements of a delivered media buffer, each checked.
-uint64_t CheckBufferElements(MmfMra* mra) {
-  uint64_t count = 0;
-  uint32_t kind = 0;
-  for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
-    if (kind != kMmfElementBuffer) continue;
-    MmfPoolBuffer* handle = nullptr;
-    uint8_t* address = nullptr;
-    uint32_t size = 0;
-    if (MmfGetMraBufferElement(mra, i, &handle, &address, &size) != 0) continue;
-    Check(handle && address >= handle->Data && size <= handle->Size &&
-              static_cast<size_t>(address - handle->Data) <= handle->Size - size,
-          "a buffer element outside its buffer", static_cast<long>(size));
-    ++count;
-  }
-  return count;
-}
-
-uint64_t LastTime(MmfMra* mra) {
+// A delivered media buffer: each buffer element inside the buffer it names;
+// the time of its last timestamp property (0: none).
+uint64_t CheckedLastTime(MmfMra* mra) {
   uint64_t time = 0;
-  uint32_t kind = 0;
+  uint32_t kind = 0, type = 0, low = 0, size = 0;
+  uint16_t high = 0;
+  MmfPoolBuffer* handle = nullptr;
+  uint8_t* address = nullptr;
   for (uint32_t i = 0; MmfGetMraElementType(mra, i, &kind) == 0; ++i) {
-    uint32_t type = 0, low = 0;
-    uint16_t high = 0;
-    if (kind != kMmfElementProperty || MmfGetMraPropertyElement(mra, i, &type, &low, &high) != 0) continue;
-    if (type == kMmfPropVideoTime || type == kMmfPropAudioTime || type == kMmfPropSubtitleTime) {
+    if (kind == kMmfElementBuffer && MmfGetMraBufferElement(mra, i, &handle, &address, &size) == 0) {
+      Check(handle && address >= handle->Data && size <= handle->Size &&
+                static_cast<size_t>(address - handle->Data) <= handle->Size - size,
+            "a buffer element outside its buffer", static_cast<long>(size));
+    } else if (kind == kMmfElementProperty && MmfGetMraPropertyElement(mra, i, &type, &low, &high) == 0 &&
+               OneOf(static_cast<int>(type), {kMmfPropVideoTime, kMmfPropAudioTime, kMmfPropSubtitleTime})) {
       time = MmfPropertyValue(low, high);
     }
   }
   return time;
 }
 
-// One channel pulled on the calling thread, the commands done between pulls:
-// the same input always takes the same path.
-// The commands both modes send the same way: seeks, pauses and scans through
-// the playback controller. False for the ones each mode does its own way.
+// The commands both modes send the same way, through the playback controller,
+// each answer checked. False for the ones each mode does its own way.
 bool ApplyControlCommand(host::PlaybackControl& playback, const Command& command) {
+  const std::initializer_list<int> scan_answers = {0, 48, kMmfInvalidArgument, kMmfNotAvailable, 12};
   switch (command.kind) {
     case Command::kSeek:
-      Check(SpecifiedSeek(playback.Seek(command.time_us)), "seek");
-      break;
+      Check(OneOf(playback.Seek(command.time_us), {0, kMmfNoConversion}), "seek");
+      return true;
     case Command::kPause:
-      Check(SpecifiedControl(playback.Pause()), "pause");
-      break;
     case Command::kResume:
-      Check(SpecifiedControl(playback.Resume()), "resume");
-      break;
+      Check(SpecifiedControl(command.kind == Command::kPause ? playback.Pause() : playback.Resume()), "pause");
+      return true;
     case Command::kScanForward:
-      Check(SpecifiedScan(playback.ScanForward(command.speed)), "scan forward");
-      break;
     case Command::kScanBackward:
-      Check(SpecifiedScan(playback.ScanBackward(command.speed)), "scan backward");
-      break;
+      Check(OneOf(command.kind == Command::kScanForward ? playback.ScanForward(command.speed)
+                                                        : playback.ScanBackward(command.speed),
+                  scan_answers),
+            "scan");
+      return true;
     case Command::kScanEnd:
-      Check(SpecifiedScan(playback.ScanEnd()), "scan end");
-      break;
+      Check(OneOf(playback.ScanEnd(), scan_answers), "scan end");
+      return true;
     default:
       return false;
   }
-  return true;
 }
 
+// One channel pulled on the calling thread, the commands done between pulls:
+// the same input always takes the same path.
 void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
   auto rating_stream = host::MakeMemoryStream(file, size, true, "fuzz");
   auto source = host::MakeMemoryStream(file, size, true, "fuzz");
@@ -208,12 +175,9 @@ void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
   // As many input buffers as the runner gives a graph: the ring's plus what frames still point into.
   const uint32_t buffers = std::clamp<uint32_t>((16u << 20) / header.buffer_size, 48, 2048);
   host::FileStreamer streamer(source.get(), host::StreamerConfig{header.buffer_size, buffers});
-  host::SetupOptions setup;
-  setup.buffer_size = header.buffer_size;
-  setup.configure_outputs = false;
-  setup.upstream = host::FileStreamer::Ops();
-  setup.input_pool = host::MemoryPool::Ops();
-  setup.input_pool_param = prefix_pool.handle();
+  const host::SetupOptions setup{.buffer_size = header.buffer_size, .configure_outputs = false,
+                                 .upstream = host::FileStreamer::Ops(), .input_pool = host::MemoryPool::Ops(),
+                                 .input_pool_param = prefix_pool.handle()};
   host::FilterGraph graph(*plugin, *rating_stream, setup);
   Check(OneOf(graph.rating(), {0, kMmfRatingAccepted}), "rating", graph.rating());
   if (!graph.rated() || graph.outputs().empty()) return;
@@ -228,10 +192,11 @@ void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
   const auto* flush = plugin->Get<MmfMediaFlushOps>("MediaFlush");
   const host::OutputChannelSetup& chosen = graph.outputs()[header.channel % graph.outputs().size()];
   MmfChannel* channel = chosen.channel;
+  MmfMra* mra = nullptr;
   if (chosen.formats_offered == 0) {  // a record counted for a track that was left out: it cannot play
-    MmfMra* mra = nullptr;
-    Check(output->AcquireOutputChannel(channel) == kMmfNotAvailable && output->NextBuffer(channel, &mra) == kMmfNotAvailable &&
-              !mra && output->ReleaseOutputChannel(channel) == kMmfNotAvailable,
+    Check(output->AcquireOutputChannel(channel) == kMmfNotAvailable &&
+              output->NextBuffer(channel, &mra) == kMmfNotAvailable && !mra &&
+              output->ReleaseOutputChannel(channel) == kMmfNotAvailable,
           "an operation on a channel without a format");
     return;
   }
@@ -252,16 +217,12 @@ void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
     host::ControlTables tables{control, flush, plugin->converter(), plugin->seeker(),
                                plugin->Get<MmfTrickPlayOps>("MediaTrickPlay")};
     host::PlaybackControl playback(tables, handle, &streamer, &clock, 0);
-    int pulls = 0, last_result = 0;
-    uint64_t elements = 0;
+    int pulls = 0;
     auto pull = [&](int count) {
       for (int short_inputs = 0; count > 0 && pulls < kMaxPulls; --count, ++pulls) {
-        MmfMra* mra = nullptr;
         const int result = output->NextBuffer(channel, &mra);
-        last_result = result;
         if (result == kMmfBufferDelivered && mra) {
-          elements += CheckBufferElements(mra);
-          clock.Consumed(LastTime(mra));
+          clock.Consumed(CheckedLastTime(mra));
           (void)MmfReleaseMra(mra);
           continue;
         }
@@ -271,25 +232,11 @@ void PlayDeterministic(const uint8_t* file, size_t size, const Header& header) {
     };
     for (const Command& command : header.commands) {
       if (ApplyControlCommand(playback, command)) continue;
-      switch (command.kind) {
-        case Command::kFlush:
-          Check(flush->Flush(handle) == kMmfOk, "flush");
-          break;
-        case Command::kStop:
-          Check(SpecifiedControl(control->Stop(handle)), "stop");
-          break;
-        case Command::kWait:
-          pull(command.amount);
-          break;
-        default:
-          break;
-      }
+      if (command.kind == Command::kFlush) Check(flush->Flush(handle) == kMmfOk, "flush");
+      if (command.kind == Command::kStop) Check(SpecifiedControl(control->Stop(handle)), "stop");
+      if (command.kind == Command::kWait) pull(static_cast<int>(command.amount));
     }
     pull(kMaxPulls);
-    if (verbose) {
-      std::fprintf(stderr, "one thread: %s, %d output buffers, %llu buffer elements, ended with %d\n", channel->Name,
-                   pulls, static_cast<unsigned long long>(elements), last_result);
-    }
     (void)control->Stop(handle);
   }
   (void)flush->Flush(handle);
@@ -302,15 +249,12 @@ void PlayThreaded(const uint8_t* file, size_t size, const Header& header) {
   size_t outputs = 0;
   {
     auto stream = host::MakeMemoryStream(file, size, true, "fuzz");
-    host::SetupOptions setup;
-    setup.configure_outputs = false;
-    host::FilterGraph graph(*plugin, *stream, setup);
+    host::FilterGraph graph(*plugin, *stream, {.configure_outputs = false});
     if (!graph.rated()) return;
     for (const host::OutputChannelSetup& output : graph.outputs()) outputs += output.formats_offered > 0;
   }
   FILE* out = std::fopen(scratch_path.c_str(), "wb");
-  Check(out != nullptr, "scratch file");
-  Check(std::fwrite(file, 1, size, out) == size, "scratch write");
+  Check(out != nullptr && std::fwrite(file, 1, size, out) == size, "scratch file");
   std::fclose(out);
 
   host::RunnerOptions options;
@@ -326,18 +270,13 @@ void PlayThreaded(const uint8_t* file, size_t size, const Header& header) {
     options.script = [&](host::PlaybackControl& playback) {
       for (const Command& command : header.commands) {
         if (ApplyControlCommand(playback, command)) continue;
-        switch (command.kind) {
-          case Command::kFlush:  // a flush happens only inside a sequence on a running graph
-            Check(SpecifiedScan(playback.ScanEnd()), "scan end");
-            break;
-          case Command::kWait:
-            std::this_thread::sleep_for(std::chrono::microseconds(250 * (command.amount % 8)));
-            break;
-          case Command::kStop:
-            Check(SpecifiedControl(playback.Stop()), "stop");
-            return;  // stopped sinks end; no sequence may follow
-          default:
-            break;
+        if (command.kind == Command::kFlush) {  // a flush happens only inside a sequence on a running graph
+          Check(OneOf(playback.ScanEnd(), {0, 48, kMmfInvalidArgument, kMmfNotAvailable, 12}), "scan end");
+        } else if (command.kind == Command::kWait) {
+          std::this_thread::sleep_for(std::chrono::microseconds(250 * (command.amount % 8)));
+        } else if (command.kind == Command::kStop) {
+          Check(SpecifiedControl(playback.Stop()), "stop");
+          return;  // stopped sinks end; no sequence may follow
         }
       }
     };
@@ -345,10 +284,6 @@ void PlayThreaded(const uint8_t* file, size_t size, const Header& header) {
   host::RunResult run = host::RunGraph(*plugin, scratch_path, options);
   Check(OneOf(run.rating, {0, kMmfRatingAccepted}), "rating", run.rating);
   for (const host::ChannelRun& channel : run.channels) {
-    if (verbose) {
-      std::fprintf(stderr, "thread of %s: %zu frames, %zu sequences, ended with %d\n", channel.name.c_str(),
-                   channel.frames.size(), channel.seeks.size(), channel.end_result);
-    }
     Check(channel.foreign_elements == 0, "a frame element outside every input buffer",
           static_cast<long>(channel.foreign_elements));
     if (channel.buffers > 0 || run.error.empty()) Check(SpecifiedEnd(channel.end_result), "end", channel.end_result);
@@ -361,13 +296,8 @@ extern "C" int LLVMFuzzerInitialize(int*, char***) {
   host::SetLogThreshold(0);
   std::string error;
   static std::unique_ptr<host::Plugin> loaded = host::Plugin::Load(KELVANE_PLUGIN_PATH, &error);
-  if (!loaded) {
-    std::fprintf(stderr, "plugin fuzzer: %s\n", error.c_str());
-    std::abort();
-  }
+  Check(loaded != nullptr, error.c_str());
   plugin = loaded.get();
-  const char* print = std::getenv("KELVANE_FUZZ_VERBOSE");
-  verbose = print && *print && *print != '0';
   const char* dir = access("/dev/shm", W_OK) == 0 ? "/dev/shm" : "/tmp";
   scratch_path = std::string(dir) + "/kelvane_plugin_fuzz_" + std::to_string(getpid()) + ".mkv";
   std::atexit([] { std::remove(scratch_path.c_str()); });
@@ -376,19 +306,16 @@ extern "C" int LLVMFuzzerInitialize(int*, char***) {
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   const size_t start = FileStart(data, size);
-  const Header header = ReadHeader(data, start);
-  const uint8_t* file = data + start;
+  Header header = ReadHeader(data, start);
   const size_t file_size = std::min(size - start, kMaxFileBytes);
-  Header bounded = header;
   const size_t least = (file_size + kMaxInputBuffers - 1) / kMaxInputBuffers;
-  bounded.buffer_size = static_cast<uint32_t>(std::max<size_t>(header.buffer_size, least));
-  const int64_t live_before = host::LiveBlockCount();
-  if (header.threads == 0) {
-    PlayDeterministic(file, file_size, bounded);
-  } else {
-    PlayThreaded(file, file_size, bounded);
-  }
-  Check(host::LiveBlockCount() == live_before, "blocks left after teardown",
-        static_cast<long>(host::LiveBlockCount() - live_before));
+  header.buffer_size = static_cast<uint32_t>(std::max<size_t>(header.buffer_size, least));
+  fuzz_input::ExpectNoBlockLeft([&] {
+    if (header.threads == 0) {
+      PlayDeterministic(data + start, file_size, header);
+    } else {
+      PlayThreaded(data + start, file_size, header);
+    }
+  });
   return 0;
 }

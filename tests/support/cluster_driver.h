@@ -44,7 +44,6 @@ struct DriveOptions {
 struct DriveOutcome {
   std::vector<DrivenBlock> blocks;
   bool failed = false;    // a result that was neither a block, a skip nor "ran out" with inbuff1 used up
-  int failure = 0;        // that result
   bool complete = false;  // every byte was consumed and no read or frame was left half done
 };
 
@@ -104,14 +103,10 @@ class Driver {
     return view;
   }
 
-  // The parser waits for the bytes after inbuff1, as the output path takes it.
-  bool waits(int result) const {
-    return mkvcluster_answer(cluster_.get(), result) == cluster_answer::need_more_data && in1_.buff_left == 0;
-  }
-
-  void fail(int result) {
+  // The parser waits for the bytes after inbuff1, as the output path takes it; any other answer fails.
+  void wait_or_fail(int result) {
+    if (mkvcluster_answer(cluster_.get(), result) == cluster_answer::need_more_data && in1_.buff_left == 0) return;
     outcome_.failed = true;
-    outcome_.failure = result;
   }
 
   void apply_skip() {
@@ -148,8 +143,7 @@ class Driver {
       skip_left_ = skip;
       return apply_skip();
     }
-    if (waits(result)) return;
-    fail(result);
+    wait_or_fail(result);
   }
 
   void read_group_tail() {
@@ -165,8 +159,7 @@ class Driver {
       finish_group_tail();
       return start_block();
     }
-    if (waits(result)) return;
-    fail(result);
+    wait_or_fail(result);
   }
 
   void finish_group_tail() {
@@ -270,7 +263,7 @@ inline uint64_t FirstClusterOffset(const uint8_t* file, size_t size) {
 }
 
 inline DriveOutcome DriveClusters(const uint8_t* file, size_t size, uint64_t start, const DriveOptions& options) {
-  if (start >= size) return DriveOutcome{{}, false, 0, true};
+  if (start >= size) return DriveOutcome{{}, false, true};
   return cluster_driver_detail::Driver(file, size, start, options).run();
 }
 

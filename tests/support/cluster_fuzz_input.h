@@ -14,10 +14,12 @@
 // must leave the cluster record exactly as parse_mkvcluster does, for each
 // track met taken as the channel's own.
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <set>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "core/cluster/cluster_status.h"
@@ -56,16 +58,12 @@ inline std::string BrokenInvariant(int result, const mkvcluster& c, bool group_t
 }
 
 inline bool SameBlocks(const DriveOutcome& a, const DriveOutcome& b, bool keys) {
-  if (a.blocks.size() != b.blocks.size()) return false;
-  for (size_t i = 0; i < a.blocks.size(); ++i) {
-    const DrivenBlock& x = a.blocks[i];
-    const DrivenBlock& y = b.blocks[i];
-    if (x.track != y.track || x.ticks != y.ticks || x.flags != y.flags || x.frame_sizes != y.frame_sizes ||
-        x.adler32 != y.adler32 || (keys && x.key != y.key)) {
-      return false;
-    }
-  }
-  return true;
+  auto same = [keys](const DrivenBlock& x, const DrivenBlock& y) {
+    return std::tie(x.track, x.ticks, x.flags, x.frame_sizes, x.adler32) ==
+               std::tie(y.track, y.ticks, y.flags, y.frame_sizes, y.adler32) &&
+           (!keys || x.key == y.key);
+  };
+  return std::equal(a.blocks.begin(), a.blocks.end(), b.blocks.begin(), b.blocks.end(), same);
 }
 
 // The record's fields one after another, owned tables by their contents, then

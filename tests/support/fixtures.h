@@ -20,12 +20,11 @@ namespace testing_support {
 // have no typed member, such as display_width or compression).
 struct ExpectedTrack {
   uint64_t number = 0;
-  uint64_t uid = 0;
-  std::string type, codec, language;  // type: video, audio, subtitles or other
+  std::string type, codec;  // type: video, audio, subtitles or other
   uint32_t codec_private_size = 0;
   uint64_t width = 0, height = 0, default_duration = 0;  // default_duration in ns
   double sampling_frequency = 0;
-  uint64_t channels = 0, bit_depth = 0;
+  uint64_t channels = 0;
   uint32_t sar_num = 0, sar_den = 0, flac_sample_rate = 0, flac_channels = 0, flac_bits = 0;
   std::map<std::string, std::string> fields;
 };
@@ -53,11 +52,9 @@ struct ExpectedBlock {
 };
 
 struct FixtureExpectation {
-  std::string name, path, doc_type, title, muxing_app, writing_app;
+  std::string name, path, doc_type;
   uint64_t timecode_scale = 0, duration_ns = 0, file_size = 0;
-  bool has_duration = false;
   std::vector<ExpectedTrack> tracks;  // in file order
-  uint32_t cue_point_count = 0;
   uint64_t damaged_at = 0;  // the first byte the recipe zeroed, or the length it cut the file to; 0: none
   std::vector<ExpectedCue> cues;
   std::vector<std::pair<std::string, std::string>> tags;  // every SimpleTag: name, string
