@@ -312,7 +312,7 @@ TEST(HeaderParseTest, ElementsAreStoredAnsweredAndLogged) {
       // SeekHead: entries sorted by position keeping file order of ties; a
       // SeekHead without a Seek is not counted; a damaged one is dropped and
       // a value that cannot be read fails it.
-      {"Seek: sorted by position, ties in file order", kSeekH, cat({seek(kTags, 70), seek(kCues, 70), seek(kInfo, 9), seek(kTracks, 70)}), kStatusOk,
+      {"Seek: sorted by position, ties in file order", kSeekH, cat({seek(kTags, 70), seek(kCues, 70), seek(kTracks, 70), seek(kInfo, 9)}), kStatusOk,
        "1549A966@9 1254C367@70 1C53BB6B@70 1654AE6B@70 heads 1 met"},
       {"Seek: position over 32 bits", kSeekH, seek(kCues, 12345678901ull), kStatusOk, "1C53BB6B@12345678901 heads 1 met"},
       {"Seek: no SeekPosition is the segment's start", kSeekH, cat({seek(kTags, 4), master(kSeek, {element(kSeekId, id_bytes(kCues))})}),
