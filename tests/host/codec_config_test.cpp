@@ -59,7 +59,7 @@ constexpr uint32_t kAvc1 = 0x41564331, kMp4v = 0x4D503456;
 struct Sps {
   uint32_t chroma_format_idc = 1;
   bool scaling_lists = false;
-  uint32_t bit_depth_minus8 = 0, poc_type = 0, poc_cycle = 3, crop_right = 0, width_in_mbs = 20, level = 40;
+  uint32_t bit_depth_minus8 = 0, poc_type = 0, poc_cycle = 3, crop_right = 0, width_in_mbs = 20, level = 40, id = 0;
   int aspect_idc = 14;
   uint32_t sar_width = 0, sar_height = 0;
 };
@@ -72,7 +72,7 @@ Bytes avc_record(const Bytes& sps) {
 
 Bytes sps_nal(const Sps& s, uint8_t header = 0x67) {
   BitWriter w;
-  w.Bits(8, header).Bits(8, 100).Bits(8, 0).Bits(8, s.level).Golomb(0).Golomb(s.chroma_format_idc);
+  w.Bits(8, header).Bits(8, 100).Bits(8, 0).Bits(8, s.level).Golomb(s.id).Golomb(s.chroma_format_idc);
   if (s.chroma_format_idc == 3) w.Bits(1, 0);
   w.Golomb(s.bit_depth_minus8).Golomb(s.bit_depth_minus8).Bits(1, 0).Bits(1, s.scaling_lists);
   for (int i = 0; s.scaling_lists && i < (s.chroma_format_idc == 3 ? 12 : 8); ++i) {
@@ -180,6 +180,8 @@ TEST(DecoderConfigTest, ConfigurationsGiveTheirPictureShape) {
       {"no aspect_ratio_info", avc({.aspect_idc = -1}), kAvc1, true, {320, 240, 33, 44}},
       {"no VUI", avc({.aspect_idc = -2}), kAvc1, true, {320, 240, 33, 44}},
       {"chroma_format_idc 4", avc({.chroma_format_idc = 4}), kAvc1, false, {11, 22, 33, 44}},
+      {"parameter set 31, the last", avc({.id = 31}), kAvc1, true, {320, 240, 4, 3}},
+      {"parameter set 32", avc({.id = 32}), kAvc1, false, {11, 22, 33, 44}},
       {"bit depth 14", avc({.bit_depth_minus8 = 6}), kAvc1, true, {320, 240, 4, 3}},
       {"bit depth 15", avc({.bit_depth_minus8 = 7}), kAvc1, false, {11, 22, 33, 44}},
       {"picture order type 3", avc({.poc_type = 3}), kAvc1, false, {11, 22, 33, 44}},
