@@ -88,24 +88,14 @@ TEST(FrameLinesTest, EveryChannelsLinesComeOutWholeAndInOrder) {
     for (size_t k = 0; k < c.frames.size(); ++k) {
       sinks.emplace_back([&, k] {
         const auto channel = static_cast<int32_t>(k);
-        if (c.in_place) {
-          for (size_t i = 0; i < c.frames[k];) {
-            size_t room = 0;
-            host::RunFrame* at = FrameLines::Room(&lines, channel, &room);
-            const size_t n = std::min({room, c.batch, c.frames[k] - i});
-            for (size_t j = 0; j < n; ++j) at[j] = FrameOf(k, i + j);
-            FrameLines::OnFrames(&lines, channel, at, n);
-            i += n;
-          }
-          return;
-        }
-        std::vector<host::RunFrame> batch;
-        for (size_t i = 0; i < c.frames[k]; ++i) {
-          batch.push_back(FrameOf(k, i));
-          if (batch.size() == c.batch || i + 1 == c.frames[k]) {
-            FrameLines::OnFrames(&lines, channel, batch.data(), batch.size());
-            batch.clear();
-          }
+        std::vector<host::RunFrame> copied(c.in_place ? 0 : c.batch);  // the sink's own batch
+        for (size_t i = 0; i < c.frames[k];) {
+          size_t room = copied.size();
+          host::RunFrame* at = c.in_place ? FrameLines::Room(&lines, channel, &room) : copied.data();
+          const size_t n = std::min({room, c.batch, c.frames[k] - i});
+          for (size_t j = 0; j < n; ++j) at[j] = FrameOf(k, i + j);
+          FrameLines::OnFrames(&lines, channel, at, n);
+          i += n;
         }
       });
     }
