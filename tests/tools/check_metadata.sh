@@ -4,9 +4,7 @@
 #   check_metadata.sh SOURCE_DIR [EMULATOR ARGS...] KELVANE
 source "$(dirname "${BASH_SOURCE[0]}")/check_common.sh" "$@"
 
-run() {  # name -> output of kelvane metadata
-  "${kelvane[@]}" metadata "$fixtures/$1.mkv" 2>&1 || echo "exit code $?"
-}
+run() { "${kelvane[@]}" metadata "$fixtures/$1.mkv" 2>&1 || echo "exit code $?"; }  # NAME: what the tool prints
 
 # The tags fixture: each offered tag under its key, with the text of .expected.
 out=$(run tags)
