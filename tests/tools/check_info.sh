@@ -39,8 +39,9 @@ for expected, info_path, tree_path in zip(*[iter(sys.argv[1:])] * 3):
         same(name, key, value(key), got)
     names = dict(v.split(" ", 1) for k, v in lines if k == "track_name")
     tracks = [dict(f.split("=", 1) for f in v.split(" ")) for k, v in lines if k == "track"]
-    want = [(t["number"], t["uid"], t["codec"], names.get(t["number"]), t.get("language", "eng"), t.get("language_ietf"),
-             t.get("flag_default", "1"), t.get("flag_enabled", "1"), t.get("flag_forced", "0")) for t in tracks]
+    want = [(t["number"], t["uid"], t["codec"], names.get(t["number"]), t.get("language", "eng"),
+             t.get("language_ietf"), t.get("flag_default", "1"), t.get("flag_enabled", "1"),
+             t.get("flag_forced", "0")) for t in tracks]
     same(name, "tracks", want, [(str(t["number"]), str(t["uid"]), t["codec_id"], t["name"], t["language"], t["language_ietf"],
          str(int(t["flag_default"])), str(int(t["flag_enabled"])), str(int(t["flag_forced"]))) for t in info["tracks"]])
     want, target = [], None
