@@ -120,11 +120,6 @@ Bytes Nested(uint32_t outer, uint32_t id, int depth) {
   return File({.insert = {outer, inside}});
 }
 
-Bytes WithCue(uint64_t time, uint64_t position) {
-  return File({.insert = {kCues, master(kCuePoint, {uinteger(kCueTime, time), master(kCueTrackPositions, {
-                                            uinteger(kCueTrack, 1), uinteger(kCueClusterPosition, position)})})}});
-}
-
 // ---- The table.
 
 // kSome: frames of the undamaged file, in its order, none invented (damage may cost any of them).
@@ -186,7 +181,8 @@ std::vector<Case> NamedCases() {
       {"DurationInfinite", File({.insert = {kInfo, f64(kDuration, INFINITY)}})},
       {"DurationNotANumber", File({.insert = {kInfo, f64(kDuration, NAN)}})},
       {"DurationNegative", File({.insert = {kInfo, f64(kDuration, -1e30)}})},
-      {"CueTimeAndPositionMax", WithCue(UINT64_MAX, UINT64_MAX)},
+      {"CueTimeAndPositionMax", File({.insert = {kCues, master(kCuePoint, {uinteger(kCueTime, UINT64_MAX),
+          master(kCueTrackPositions, {uinteger(kCueTrack, 1), uinteger(kCueClusterPosition, UINT64_MAX)})})}})},
       // Nesting thousands of levels deep.
       {"SimpleTagsNested5000Deep", Nested(kTag, kSimpleTag, 5000)},
       {"ClustersNested3000Deep", Nested(kSegment, kCluster, 3000)},

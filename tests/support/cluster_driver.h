@@ -20,7 +20,6 @@ namespace testing_support {
 struct DrivenBlock {
   uint64_t track = 0;
   int64_t ticks = 0;  // Cluster timecode + the block's relative timecode
-  bool simple = true;
   bool key = false;  // SimpleBlock: flag 0x80; Block: its group has no ReferenceBlock
   uint8_t flags = 0;
   std::vector<int64_t> frame_sizes;  // as parsed
@@ -46,14 +45,6 @@ struct DriveOutcome {
   bool failed = false;    // a result that was neither a block, a skip nor "ran out" with inbuff1 used up
   bool complete = false;  // every byte was consumed and no read or frame was left half done
 };
-
-// File offset of the first Cluster (the EBML header and the Segment's other
-// children before it are stepped over), or `size` when there is none.
-uint64_t FirstClusterOffset(const uint8_t* file, size_t size);
-
-DriveOutcome DriveClusters(const uint8_t* file, size_t size, uint64_t start, const DriveOptions& options);
-
-// ---------------------------------------------------------------------------
 
 namespace cluster_driver_detail {
 
@@ -169,15 +160,11 @@ class Driver {
 
   void start_block() {
     const mkvcluster& c = *cluster_;
-    DrivenBlock block;
-    block.track = c.track_number;
-    block.ticks = static_cast<int64_t>(c.cluster_timecode) + c.block_timecode;
-    block.simple = c.in_blockgroup == 0;
-    block.flags = c.block_flags;
-    block.key = block.simple && (c.block_flags & 0x80);
-    block.frame_sizes.assign(c.frame_sizes, c.frame_sizes + c.frame_count);
-    outcome_.blocks.push_back(std::move(block));
-    if (!outcome_.blocks.back().simple && options_.read_group_tail) {
+    const bool simple = c.in_blockgroup == 0;
+    outcome_.blocks.push_back({c.track_number, static_cast<int64_t>(c.cluster_timecode) + c.block_timecode,
+                               simple && (c.block_flags & 0x80), c.block_flags,
+                               std::vector<int64_t>(c.frame_sizes, c.frame_sizes + c.frame_count), {}});
+    if (!simple && options_.read_group_tail) {
       group_tail_pending_ = true;
       group_block_ = outcome_.blocks.size() - 1;
     }
@@ -186,7 +173,6 @@ class Driver {
     frame_left_ = 0;
     consumed_ = 0;
     data_left_ = c.block_data_left;
-    adler_ = Adler32Sum{};
   }
 
   // Frames of the current block from inbuff1; a frame cut by the buffer's end
@@ -247,6 +233,8 @@ class Driver {
 
 }  // namespace cluster_driver_detail
 
+// File offset of the first Cluster (the EBML header and the Segment's other
+// children before it are stepped over), or `size` when there is none.
 inline uint64_t FirstClusterOffset(const uint8_t* file, size_t size) {
   using cluster_driver_detail::read_vint;
   constexpr uint64_t kSegment = 0x18538067, kCluster = 0x1F43B675;

@@ -157,9 +157,8 @@ inline std::string RunClusterFuzzInput(const uint8_t* data, size_t size) {
   if (!broken.empty()) return broken;
   if (host::LiveBlockCount() != live) return "blocks leaked";
 
-  DriveOptions whole_options = options;
-  whole_options.buffer_sizes = {file_size};
-  DriveOutcome whole = DriveClusters(file, file_size, start, whole_options);
+  options.buffer_sizes = {file_size};
+  DriveOutcome whole = DriveClusters(file, file_size, start, options);
   if (!broken.empty()) return broken + " (one buffer)";
   if (host::LiveBlockCount() != live) return "blocks leaked (one buffer)";
   if (fail_at == 0 && split.complete && whole.complete && !SameBlocks(split, whole, options.read_group_tail)) {
