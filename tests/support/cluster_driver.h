@@ -110,13 +110,9 @@ class Driver {
   void parse_buffer() {
     apply_skip();
     while (in1_.buff_left && !outcome_.failed) {
-      if (block_) {
-        consume_frames();
-      } else if (group_tail_pending_) {
-        read_group_tail();
-      } else {
-        call_parser();
-      }
+      if (block_) consume_frames();
+      else if (group_tail_pending_) read_group_tail();
+      else call_parser();
     }
   }
 
