@@ -247,13 +247,10 @@ TEST_P(CraftedFileTest, EndsAsDeclared) {
       EXPECT_EQ(channel.foreign_elements, 0u);
       for (const host::RunFrame& frame : channel.frames) sizes.push_back(frame.size);
     }
-    if (c.frames == Delivered::kExactly) {
-      EXPECT_EQ(sizes, c.sizes);
-    } else {
-      size_t matched = 0;
-      for (size_t i = 0; i < c.sizes.size() && matched < sizes.size(); ++i) matched += c.sizes[i] == sizes[matched];
-      EXPECT_EQ(matched, sizes.size()) << testing::PrintToString(sizes);
-    }
+    size_t matched = 0;  // of the frames delivered, those that are in order the row's (all: a subsequence)
+    for (size_t i = 0; i < c.sizes.size() && matched < sizes.size(); ++i) matched += c.sizes[i] == sizes[matched];
+    EXPECT_TRUE(matched == sizes.size() && (c.frames == Delivered::kSome || sizes.size() == c.sizes.size()))
+        << testing::PrintToString(sizes);
   }
   std::remove(path.c_str());
   EXPECT_EQ(host::LiveBlockCount(), live);
