@@ -34,6 +34,7 @@ namespace {
 using namespace ebml;
 
 constexpr uint64_t k2To32 = uint64_t{1} << 32;
+constexpr uint64_t kBias5 = (uint64_t{1} << 34) - 1;  // of a 5-byte signed EBML lace difference
 constexpr uint32_t kSomeUnknownId = 0x4FAB;  // a two-byte ID Matroska does not define
 
 const host::Plugin& HostPlugin() {
@@ -160,7 +161,7 @@ std::vector<Case> NamedCases() {
       // 2^31 and 2^31 + 4 are negative in 32 bits and passed over; their sum wraps to 4,
       // which leaves 36 bytes to the last frame.
       {"EbmlLaceSumAbove2To32",
-       LacedCluster(LacedBlock(kEbmlLacing, 2, cat({size_bytes(k2To32 / 2, 5), signed_lace_number(4)}), 40)),
+       LacedCluster(LacedBlock(kEbmlLacing, 2, cat({size_bytes(k2To32 / 2, 5), size_bytes(kBias5 + 4, 5)}), 40)),
        {100, 101, 102, 36, 60}},
       {"XiphLaceLongerThanTheBlock", LacedCluster(LacedBlock(kXiphLacing, 1, Bytes(40, 0xFF), 10))},
       {"FixedLaceOf256FramesInFiveBytes", LacedCluster(LacedBlock(kFixedLacing, 255, {}, 5)), {100, 101, 102, 60}},

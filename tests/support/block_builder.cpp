@@ -6,6 +6,17 @@ namespace ebml {
 
 namespace {
 
+// A signed EBML lace difference: the shortest length whose biased value is
+// not all ones.
+Bytes signed_lace_number(int64_t difference) {
+  for (int length = 1; length <= 8; ++length) {
+    int64_t bias = (int64_t{1} << (7 * length - 1)) - 1;
+    int64_t raw = difference + bias;
+    if (raw >= 0 && raw < (int64_t{1} << (7 * length)) - 1) return size_bytes(static_cast<uint64_t>(raw), length);
+  }
+  std::abort();
+}
+
 // The lace table of `frames` as `lacing` codes it (no frame-count byte).
 Bytes lace_table(uint8_t lacing, const Frames& frames) {
   Bytes out;
@@ -34,15 +45,6 @@ Bytes block_body(uint64_t track, int16_t timecode, uint8_t flags, const Frames& 
 }
 
 }  // namespace
-
-Bytes signed_lace_number(int64_t difference) {
-  for (int length = 1; length <= 8; ++length) {
-    int64_t bias = (int64_t{1} << (7 * length - 1)) - 1;
-    int64_t raw = difference + bias;
-    if (raw >= 0 && raw < (int64_t{1} << (7 * length)) - 1) return size_bytes(static_cast<uint64_t>(raw), length);
-  }
-  std::abort();
-}
 
 Bytes simple_block(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames) {
   return element(kSimpleBlock, block_body(track, timecode, flags, frames));

@@ -41,9 +41,6 @@ Bytes ebml_laced_block(uint64_t track, int16_t timecode, uint8_t flags, const Fr
 // The Block (0xA1) of a BlockGroup.
 Bytes block(uint64_t track, int16_t timecode, uint8_t flags, const Frames& frames);
 
-// A signed EBML lace difference: the shortest length whose biased value is not all ones.
-Bytes signed_lace_number(int64_t difference);
-
 // `count` frames of `size` bytes, each filled with its own index + `seed`.
 Frames numbered_frames(size_t count, size_t size, uint8_t seed = 0);
 
