@@ -247,7 +247,8 @@ TEST(GroupChildrenTest, AreReadAsTheirCaseSays) {
       auto got = ParseAfterBlocks(record, ClusterOf({master(kBlockGroup, {c.children, Block1()})}));
       host::FailNthAllocation(0);
       const mkvcluster& r = record.c;
-      EXPECT_EQ(std::make_tuple(got.result, got.track), std::make_tuple(c.result, c.result == kClusterBlockReady ? 1u : 0u));
+      EXPECT_EQ(std::make_tuple(got.result, got.track),
+                std::make_tuple(c.result, c.result == kClusterBlockReady ? 1u : 0u));
       EXPECT_EQ(r.frame_sizes == nullptr, c.result != kClusterBlockReady);
       EXPECT_EQ(std::tie(r.reference_block, r.reference_priority, r.block_duration),
                 std::tie(c.reference_block, c.reference_priority, c.block_duration));

@@ -37,11 +37,6 @@ constexpr uint64_t k2To32 = uint64_t{1} << 32;
 constexpr uint64_t kBias5 = (uint64_t{1} << 34) - 1;  // of a 5-byte signed EBML lace difference
 constexpr uint32_t kSomeUnknownId = 0x4FAB;  // a two-byte ID Matroska does not define
 
-const host::Plugin& HostPlugin() {
-  host::SetLogThreshold(0);  // the damaged files' complaints are expected
-  return plugin_test::HostPlugin();
-}
-
 // ---- The undamaged file: one MP3 track, two Clusters, three frames, Cues, Tags.
 
 // A SimpleBlock of track 1 with a lace header written out: `sizes` are the
@@ -94,23 +89,21 @@ const std::vector<uint32_t> kAllFrames = {100, 101, 102};
 
 // ---- Damage that a row names.
 
-// One Cluster whose size field claims `size`, holding the first frame, at the end of the file.
-Bytes ClusterClaiming(uint64_t size) {
-  return cat({File({}), master_sized(kCluster, size, {uinteger(kTimecode, 200),
-                                                      simple_block(1, 0, kKeyFrame, {filler(90, 4)})}, 8)});
+// The undamaged file and a third Cluster of these children; an 8-byte size field claims `claimed` when given.
+Bytes ThirdCluster(const Bytes& children, uint64_t claimed = 0) {
+  const Bytes payload = cat({uinteger(kTimecode, 200), children});
+  return cat({File({}), id_bytes(kCluster), size_bytes(claimed ? claimed : payload.size(), claimed ? 8 : 0), payload});
 }
 
-// A third Cluster whose SimpleBlock claims `size` bytes and carries 50.
+// A SimpleBlock that claims `size` bytes and carries 50.
 Bytes BlockClaiming(uint64_t size) {
-  const Bytes block = cat({id_bytes(kSimpleBlock), size_bytes(size, 8), Bytes{0x81, 0x00, 0x00, kKeyFrame},
-                           filler(50, 5)});
-  return cat({File({}), master(kCluster, {uinteger(kTimecode, 200), block})});
+  return ThirdCluster(
+      cat({id_bytes(kSimpleBlock), size_bytes(size, 8), Bytes{0x81, 0x00, 0x00, kKeyFrame}, filler(50, 5)}));
 }
 
-// A third Cluster with a crafted laced block, then a good block of 60 bytes.
+// A crafted laced block, then a good block of 60 bytes.
 Bytes LacedCluster(const Bytes& laced) {
-  return cat({File({}), master(kCluster, {uinteger(kTimecode, 200), laced,
-                                          simple_block(1, 10, kKeyFrame, {filler(60, 6)})})});
+  return ThirdCluster(cat({laced, simple_block(1, 10, kKeyFrame, {filler(60, 6)})}));
 }
 
 // `depth` masters of `id` inside each other around one TagName, inside a Tag
@@ -144,8 +137,8 @@ std::vector<Case> NamedCases() {
   return {
       {"Undamaged", File({})},
       // Sizes at the 32-bit edge.
-      {"ClusterSizeFFFFFFFF", ClusterClaiming(0xFFFFFFFF), kPlus90},
-      {"ClusterSize2To32Plus1", ClusterClaiming(k2To32 + 1), kPlus90},
+      {"ClusterSizeFFFFFFFF", ThirdCluster(simple_block(1, 0, kKeyFrame, {filler(90, 4)}), 0xFFFFFFFF), kPlus90},
+      {"ClusterSize2To32Plus1", ThirdCluster(simple_block(1, 0, kKeyFrame, {filler(90, 4)}), k2To32 + 1), kPlus90},
       // A block that claims more than the file holds is never complete: its frame is not delivered.
       {"SimpleBlockSizeFFFFFFFF", BlockClaiming(0xFFFFFFFF)},
       {"SimpleBlockSize2To32Plus1", BlockClaiming(k2To32 + 1)},
@@ -229,7 +222,8 @@ class CraftedFileTest : public testing::TestWithParam<Case> {};
 // Header parse and playback.
 TEST_P(CraftedFileTest, EndsAsDeclared) {
   const Case& c = GetParam();
-  HostPlugin();
+  host::SetLogThreshold(0);  // the damaged files' complaints are expected
+  const host::Plugin& plugin = plugin_test::HostPlugin();
   const int64_t live = host::LiveBlockCount();
   const int result = testing_support::HeaderParse(c.file).Parse();
   const std::set<int> declared = {kParseSucceeded, kParseMalformed, kParseIncomplete, kParseNoMemory};
@@ -240,7 +234,7 @@ TEST_P(CraftedFileTest, EndsAsDeclared) {
     SCOPED_TRACE(testing::Message() << "input buffers of " << buffer_size << " bytes");
     host::RunnerOptions options;
     options.input_buffer_size = buffer_size;
-    const host::RunResult run = host::RunGraph(HostPlugin(), path, options);
+    const host::RunResult run = host::RunGraph(plugin, path, options);
     EXPECT_TRUE(c.pinned ? run.rating == c.rating : run.rating == 0 || run.rating == 80) << run.rating;
     std::vector<uint32_t> sizes;
     for (const host::ChannelRun& channel : run.channels) {
