@@ -22,10 +22,7 @@ Bytes Clusters(std::initializer_list<Bytes> blocks) {
 
 TEST(ClusterFuzzRegressionTest, InputsPassEveryCheckOfTheFuzzTarget) {
   const Frames one = numbered_frames(1, 40), big = numbered_frames(1, 300), laced = numbered_frames(4, 20);
-  const struct {
-    const char* name;
-    Bytes input;
-  } rows[] = {
+  const struct { const char* name; Bytes input; } rows[] = {
       // Built: every track's blocks walked by the unlaced-block shortcut beside the parser.
       // Last, an empty frame, whose header ends at the Cluster's end: the parser reads on from there.
       {"simple_blocks", Clusters({simple_block(1, 0, kKeyFrame, one), simple_block(2, 3, kKeyFrame, one),

@@ -165,9 +165,7 @@ class Driver {
       group_block_ = outcome_.blocks.size() - 1;
     }
     block_ = true;
-    frame_index_ = 0;
-    frame_left_ = 0;
-    consumed_ = 0;
+    frame_index_ = 0;  // frame_left_ is 0: the block before was consumed whole
     data_left_ = c.block_data_left;
   }
 
@@ -194,14 +192,14 @@ class Driver {
       in1_.buff_pos += n;
       in1_.buff_left -= n;
       frame_left_ -= n;
-      consumed_ += n;
+      data_left_ -= n;
       if (frame_left_) return;
       block.adler32.push_back(adler_.value());
       ++frame_index_;
     }
     block_ = false;
-    if (data_left_ > consumed_) {
-      skip_left_ = static_cast<uint64_t>(data_left_ - consumed_);
+    if (data_left_ > 0) {
+      skip_left_ = static_cast<uint64_t>(data_left_);
       apply_skip();
     }
   }
@@ -219,8 +217,7 @@ class Driver {
   bool block_ = false;         // frames of the last parsed block are being consumed
   size_t frame_index_ = 0;
   uint32_t frame_left_ = 0;    // bytes of frame frame_index_ still to consume; 0 between frames
-  int64_t consumed_ = 0;       // frame bytes of the block consumed so far
-  int64_t data_left_ = 0;      // the block's block_data_left
+  int64_t data_left_ = 0;      // the block's block_data_left less the frame bytes consumed so far
   Adler32Sum adler_;
   bool group_tail_pending_ = false;  // the last Block's group has children still to read
   size_t group_block_ = 0;           // index of that Block in outcome_.blocks
