@@ -1,29 +1,77 @@
-// parse_mkvcluster at Cluster and Segment level (what is skipped, what is
-// passed over, where Clusters begin and end, what running out gives) and on
-// block headers and lace tables at the edges of lacing and with sizes that
-// overflow 32-bit arithmetic. Ordinary Xiph, EBML and fixed lacing are
-// compared with mkvinfo in the fixture test.
+// The playback parser over crafted bytes. parse_mkvcluster at Cluster and
+// Segment level (what is skipped, what is passed over, where Clusters begin
+// and end, what running out gives) and on block headers and lace tables at the
+// edges of lacing and with sizes that overflow 32-bit arithmetic (ordinary
+// Xiph, EBML and fixed lacing are compared with mkvinfo in the fixture test);
+// BlockGroups: the children around the Block, what is copied, what is passed
+// over unread, what running out inside a group gives, and failed copies; and
+// the byte rule over inbuff1 and inbuff2 where it is a contract of its own:
+// what a failed read or skip leaves consumed. (Reads across the two views are
+// exercised at every split point by the block and fixture tests.)
 
 #include <gtest/gtest.h>
 
-#include "tests/cluster/cluster_harness.h"
+#include <cstdint>
+#include <tuple>
+#include <vector>
+
+#include "core/cluster/cluster_status.h"
+#include "core/cluster/mkv_cluster.h"
+#include "core/status.h"
+#include "host/heap_control.h"
 #include "platform/ao_log.h"
+#include "tests/support/block_builder.h"
 #include "tests/support/log_recorder.h"
 
 namespace {
 
-using cluster_testing::Bytes;
-using cluster_testing::Outcome;
-using cluster_testing::Record;
-using cluster_testing::View;
 using namespace ebml;
+
+// bytes[from, to) as the file bytes at offset `from`.
+mkvinbuff View(const Bytes& bytes, size_t from, size_t to) {
+  return mkvinbuff{bytes.data() + from, static_cast<uint32_t>(to - from), 0, static_cast<uint32_t>(to - from), from};
+}
+
+// A zero record (the start state) that frees its tables when it goes; not to be copied.
+struct Record {
+  mkvcluster c{};
+  ~Record() { destroy_mkvcluster(&c); }
+};
+
+// What one parse left behind.
+struct Outcome {
+  int result = 1;
+  uint64_t skip = 0xDEAD;  // as parse_mkvcluster found it
+  uint64_t track = 0;
+  int16_t timecode = 0;
+  std::vector<int64_t> sizes;  // frame_sizes, when the result is 0
+  int64_t data_left = 0;
+  uint64_t cluster_timecode = 0;
+  uint32_t left = 0;  // of inbuff1
+};
+
+Outcome Call(Record& record, mkvinbuff* in1, mkvinbuff* in2) {
+  destroy_mkvcluster(&record.c);
+  Outcome out;
+  out.result = parse_mkvcluster(in1, in2, &record.c, &out.skip);
+  const mkvcluster& c = record.c;
+  out.cluster_timecode = c.cluster_timecode;
+  out.left = in1->buff_left;
+  if (out.result == kClusterBlockReady) {
+    out.track = c.track_number;
+    out.timecode = c.block_timecode;
+    out.sizes.assign(c.frame_sizes, c.frame_sizes + c.frame_count);
+    out.data_left = c.block_data_left;
+  }
+  return out;
+}
 
 // Runs parse_mkvcluster over one buffer `blocks_before` + 1 times, consuming
 // each block's data and applying each skip between calls as the caller does.
-Outcome ParseAfterBlocks(Record& record, const Bytes& bytes, int blocks_before) {
+Outcome ParseAfterBlocks(Record& record, const Bytes& bytes, int blocks_before = 0) {
   mkvinbuff in1 = View(bytes, 0, bytes.size());
   for (int blocks = 0;;) {
-    const Outcome out = cluster_testing::Call(record, &in1, nullptr);
+    const Outcome out = Call(record, &in1, nullptr);
     const bool block = out.result == kClusterBlockReady && blocks++ < blocks_before;
     if (!block && (out.result != kClusterSkip || blocks >= blocks_before)) return out;
     const auto consumed = static_cast<uint32_t>(block ? uint64_t(record.c.block_data_left) : out.skip);
@@ -45,8 +93,6 @@ struct ClusterCase {
   std::vector<int64_t> sizes = {};
   int64_t data_left = 0;
 };
-
-void PrintTo(const ClusterCase& c, std::ostream* os) { *os << c.name; }
 
 Bytes Block(uint64_t track) { return simple_block(track, 0, kKeyFrame, {filler(3, 0xA3)}); }
 
@@ -119,38 +165,25 @@ const ClusterCase kCases[] = {
      0xDEAD, 7},
 };
 
-class ParseMkvClusterTest : public testing::TestWithParam<ClusterCase> {};
-
-TEST_P(ParseMkvClusterTest, GivesTheResultOfItsCase) {
-  const ClusterCase& c = GetParam();
-  testing_support::LogRecorder log;
-  Record record;
-  Outcome got = ParseAfterBlocks(record, c.bytes, c.blocks_before);
-  EXPECT_EQ(got.result, c.result);
-  EXPECT_EQ(got.skip, c.skip);
-  EXPECT_EQ(got.cluster_timecode, c.cluster_timecode);
-  EXPECT_EQ(got.track, c.track);
-  if (c.message) {
-    EXPECT_TRUE(log.Contains(kAoLogNotice, c.message)) << c.message;
-  }
-  if (!c.sizes.empty()) {
-    EXPECT_EQ(got.timecode, c.timecode);
-    EXPECT_EQ(got.sizes, c.sizes);
-    EXPECT_EQ(got.data_left, c.data_left);
+TEST(ParseMkvClusterTest, GivesTheResultOfEachCase) {
+  for (const ClusterCase& c : kCases) {
+    SCOPED_TRACE(c.name);
+    testing_support::LogRecorder log;
+    Record record;
+    auto got = ParseAfterBlocks(record, c.bytes, c.blocks_before);
+    EXPECT_EQ(std::tie(got.result, got.skip, got.cluster_timecode, got.track),
+              std::tie(c.result, c.skip, c.cluster_timecode, c.track));
+    EXPECT_TRUE(!c.message || log.Contains(kAoLogNotice, c.message));
+    if (!c.sizes.empty()) {
+      EXPECT_EQ(std::tie(got.timecode, got.sizes, got.data_left), std::tie(c.timecode, c.sizes, c.data_left));
+    }
   }
 }
-
-INSTANTIATE_TEST_SUITE_P(Cases, ParseMkvClusterTest, testing::ValuesIn(kCases),
-                         [](const auto& info) { return std::string(info.param.name); });
 
 // Without inbuff2 the call ends where inbuff1 does; what it read stays read.
 TEST(ParseMkvClusterRanOutTest, EndOfInbuff1GivesTheResultOfTheLevelItEndsIn) {
   Bytes bytes = master(kCluster, {uinteger(kTimecode, 2), Block(1), Block(2)});
-  struct {
-    size_t end;
-    bool after_first_block;
-    int result;
-  } const rows[] = {
+  const struct { size_t end; bool after_first_block; int result; } rows[] = {
       {2, false, kClusterHeaderFailed},  // inside the Cluster's ID
       {6, false, kClusterChildShort},    // inside the Timecode's header
       {12, false, kClusterChildShort},   // inside the first SimpleBlock's header
@@ -159,15 +192,121 @@ TEST(ParseMkvClusterRanOutTest, EndOfInbuff1GivesTheResultOfTheLevelItEndsIn) {
   };
   for (const auto& row : rows) {
     Record record;
-    mkvinbuff in1 = View(bytes, 0, row.end);
-    if (row.after_first_block) {
-      ASSERT_EQ(cluster_testing::Call(record, &in1, nullptr).result, kClusterBlockReady);
-      in1.buff_pos += 3;
-      in1.buff_left -= 3;
-    }
-    EXPECT_EQ(cluster_testing::Call(record, &in1, nullptr).result, row.result) << "end " << row.end;
-    EXPECT_EQ(in1.buff_left, 0u);
+    const Bytes cut(bytes.begin(), bytes.begin() + static_cast<std::ptrdiff_t>(row.end));
+    const auto got = ParseAfterBlocks(record, cut, row.after_first_block);
+    EXPECT_EQ(got.result, row.result) << "end " << row.end;
+    EXPECT_EQ(got.left, 0u);
     EXPECT_TRUE(mkvcluster_inside_element(&record.c));
+  }
+}
+
+// ---- BlockGroups.
+
+Bytes Block1() { return block(1, 0, 0, {filler(3, 0xA1)}); }
+
+Bytes ClusterOf(std::initializer_list<Bytes> children) {
+  return master(kCluster, {uinteger(kTimecode, 10), cat(children)});
+}
+
+struct GroupCase {
+  const char* name;
+  Bytes children;  // before the Block
+  int result;
+  int64_t reference_block = 0;
+  uint64_t reference_priority = 0;
+  uint64_t block_duration = 0;
+  Bytes codec_state = {};
+  uint64_t failing_allocation = 0;  // the nth of the parse fails; nothing may leak
+};
+
+const GroupCase kGroupCases[] = {
+    {"OneByteReferenceBlockIsSignExtended", Bytes{0xFB, 0x81, 0xFE}, kClusterBlockReady, -2},
+    {"EightByteReferenceBlockIsTakenWhole", sinteger(kReferenceBlock, -3, 8), kClusterBlockReady, -3},
+    {"ZeroSizeValuesAreZero", cat({bin(kReferenceBlock, {}), bin(kBlockDuration, {})}), kClusterBlockReady},
+    {"PriorityAndDurationAreRead", cat({uinteger(kReferencePriority, 2), uinteger(kBlockDuration, 0x123456)}),
+     kClusterBlockReady, 0, 2, 0x123456},
+    {"NineByteDurationIsRejected", bin(kBlockDuration, filler(9, 1)), kClusterInvalid},
+    {"CodecStateIsCopied", bin(kCodecState, {1, 2, 3}), kClusterBlockReady, 0, 0, 0, {1, 2, 3}},
+    {"CodecStateOver32768BytesIsRefused", bin(kCodecState, filler(40000, 7)), kClusterNoMemory},
+    {"UnreadPayloadsAreNeverReadAsHeaders",
+     cat({bin(kVoid, block(9, 0, 0, {filler(1)})), master(kBlockAdditions, {bin(kBlockAdditional, Block1())}),
+          bin(kSlices, block(9, 0, 0, {})), bin(kBlockVirtual, block(9, 0, 0, {})), uinteger(kDiscardPadding, 5),
+          uinteger(kReferenceVirtual, 1), bin(kCrc32, {0xA1, 0x81, 0x81, 0x00})}),
+     kClusterBlockReady},
+    {"FailedCodecStateCopyIsOutOfMemory", bin(kCodecState, {1, 2}), kClusterNoMemory, 0, 0, 0, {}, 1},
+    {"FailedFrameTableIsOutOfMemory", {}, kClusterNoMemory, 0, 0, 0, {}, 1},
+};
+
+TEST(GroupChildrenTest, AreReadAsTheirCaseSays) {
+  for (const GroupCase& c : kGroupCases) {
+    SCOPED_TRACE(c.name);
+    const int64_t live = host::LiveBlockCount();
+    {
+      Record record;
+      host::FailNthAllocation(c.failing_allocation);
+      auto got = ParseAfterBlocks(record, ClusterOf({master(kBlockGroup, {c.children, Block1()})}));
+      host::FailNthAllocation(0);
+      const mkvcluster& r = record.c;
+      EXPECT_EQ(std::make_tuple(got.result, got.track),
+                std::make_tuple(c.result, c.result == kClusterBlockReady ? 1u : 0u));
+      EXPECT_EQ(r.frame_sizes == nullptr, c.result != kClusterBlockReady);
+      EXPECT_EQ(std::tie(r.reference_block, r.reference_priority, r.block_duration),
+                std::tie(c.reference_block, c.reference_priority, c.block_duration));
+      EXPECT_EQ(r.codec_state == nullptr, c.codec_state.empty());
+      EXPECT_EQ(Bytes(r.codec_state, r.codec_state + r.codec_state_size), c.codec_state);
+    }
+    EXPECT_EQ(host::LiveBlockCount(), live);
+  }
+}
+
+// Inside a group, running out is reported with three notices.
+TEST(ParseMkvBlockGroupTest, RunningOutInsideAChildLogsThePartialHeader) {
+  Bytes bytes = ClusterOf({master(kBlockGroup, {uinteger(kReferencePriority, 0x1234), Block1()})});
+  size_t cut = bytes.size() - 10;  // between the two bytes of the ReferencePriority value
+  testing_support::LogRecorder log;
+  Record record;
+  mkvinbuff in1 = View(bytes, 0, cut - 1), in2 = View(bytes, cut - 1, cut);
+  EXPECT_EQ(Call(record, &in1, &in2).result, kClusterChildShort);
+  EXPECT_EQ(record.c.reference_priority, 0x12u);  // what was read is there
+  std::vector<std::pair<int, std::string>> want = {
+      {kAoLogNotice, "Partial header!  Not supposed to happen!"},
+      {kAoLogNotice, "                 inbuff1->buff_left = 0, inbuff2->buff_left = 0"},
+      {kAoLogNotice, "                 inbuff1->buff_fileoff = 0, inbuff2->buff_fileoff = " + std::to_string(cut - 1)},
+  };
+  EXPECT_EQ(log.messages(), want);
+}
+
+// ---- The byte rule.
+
+TEST(EbmlGetVarUintFromBuffTest, ReadsAcrossTheTwoViews) {
+  // inbuff1 holds bytes[0, split), inbuff2 the rest (none when split is the size)
+  const struct { Bytes bytes; size_t split; int status; uint64_t value; uint32_t length; size_t consumed; } rows[] = {
+      {{0x81}, 1, kStatusOk, 1, 1, 1},
+      {{0x40, 0x02}, 1, kStatusOk, 2, 2, 2},
+      {{0x10, 0x00, 0x00, 0x01}, 2, kStatusOk, 1, 4, 4},
+      {{0x01, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF}, 3, kStatusOk, 0x00FFFFFFFFFFFFFF, 8, 8},
+      {{0x00, 0x81}, 2, kStatusMalformed, 0, 0, 1},
+      {{0x20, 0x01}, 1, kStatusReadFailed, 0, 0, 2},  // 3 bytes wanted, the read ones stay consumed
+      {{0x20, 0x01}, 2, kStatusReadFailed, 0, 0, 2},
+  };
+  for (const auto& c : rows) {
+    mkvinbuff in1 = View(c.bytes, 0, c.split), in2 = View(c.bytes, c.split, c.bytes.size());
+    uint64_t value = 0;
+    uint32_t length = 0;
+    EXPECT_EQ(ebml_get_var_uint_from_buff(&in1, c.split < c.bytes.size() ? &in2 : nullptr, &value, &length), c.status);
+    EXPECT_TRUE(c.status != kStatusOk || (value == c.value && length == c.length)) << value << " " << length;
+    EXPECT_EQ(in1.buff_pos + in2.buff_pos, c.consumed);
+  }
+}
+
+TEST(SkipBuffbytesTest, IsAllOrNothing) {
+  Bytes bytes(5);
+  const struct { uint32_t count; bool with_inbuff2; int result; uint32_t left1, left2; } rows[] = {
+      {2, true, 0, 1, 2}, {5, true, 0, 0, 0}, {6, true, -1, 3, 2}, {4, false, -1, 3, 2}, {3, false, 0, 0, 2}};
+  for (const auto& row : rows) {
+    mkvinbuff in1 = View(bytes, 0, 3), in2 = View(bytes, 3, 5);
+    const int result = skip_buffbytes(&in1, row.with_inbuff2 ? &in2 : nullptr, row.count);
+    EXPECT_EQ(std::tie(result, in1.buff_left, in2.buff_left), std::tie(row.result, row.left1, row.left2)) << row.count;
   }
 }
 

@@ -13,12 +13,6 @@
 
 namespace {
 
-std::vector<uint8_t> Pattern(size_t size) {
-  std::vector<uint8_t> bytes(size);
-  for (size_t i = 0; i < size; ++i) bytes[i] = static_cast<uint8_t>(i * 7 + (i >> 8));
-  return bytes;
-}
-
 // One step: 'S'eek (its answer), 'R'ead n bytes (how many came, -1 for
 // kVstreamFailed; they must be the file's), 'T'ell, bytes 'A'vailable, or the
 // input's counters so far: 'N' reads, 'B' bytes read, 'K' seeks.
@@ -62,7 +56,8 @@ TEST(VstreamTest, ModesBufferSeekAndReadAsConfigured) {
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
-    std::vector<uint8_t> bytes = Pattern(c.size);
+    std::vector<uint8_t> bytes(c.size);
+    for (size_t i = 0; i < c.size; ++i) bytes[i] = static_cast<uint8_t>(i * 7 + (i >> 8));
     auto input = host::MakeMemoryStream(bytes.data(), bytes.size(), c.seekable);
     const int64_t live = host::LiveBlockCount();
     mkvvstream stream{};

@@ -20,20 +20,14 @@ Bytes signed_lace_number(int64_t difference) {
 // The lace table of `frames` as `lacing` codes it (no frame-count byte).
 Bytes lace_table(uint8_t lacing, const Frames& frames) {
   Bytes out;
-  if (frames.empty()) return out;
-  size_t coded = frames.size() - 1;  // the last frame takes whatever remains
-  if (lacing == kXiphLacing) {
-    for (size_t i = 0; i < coded; ++i) {
-      size_t size = frames[i].size();
+  for (size_t i = 0; i + 1 < frames.size(); ++i) {  // the last frame takes whatever remains
+    size_t size = frames[i].size();
+    if (lacing == kEbmlLacing) {
+      const auto difference = static_cast<int64_t>(size) - static_cast<int64_t>(i ? frames[i - 1].size() : 0);
+      out = cat({out, i == 0 ? size_bytes(size) : signed_lace_number(difference)});
+    } else if (lacing == kXiphLacing) {
       for (; size >= 255; size -= 255) out.push_back(255);
       out.push_back(static_cast<uint8_t>(size));
-    }
-  } else if (lacing == kEbmlLacing) {
-    for (size_t i = 0; i < coded; ++i) {
-      Bytes number = i == 0 ? size_bytes(frames[0].size())
-                            : signed_lace_number(static_cast<int64_t>(frames[i].size()) -
-                                                 static_cast<int64_t>(frames[i - 1].size()));
-      out.insert(out.end(), number.begin(), number.end());
     }
   }
   return out;
@@ -45,11 +39,7 @@ Bytes block_body(uint64_t track, int16_t timecode, uint8_t flags, const Frames& 
   auto tc = static_cast<uint16_t>(timecode);
   Bytes out = cat({size_bytes(track), Bytes{static_cast<uint8_t>(tc >> 8), static_cast<uint8_t>(tc), flags}});
   uint8_t lacing = flags & 0x06;
-  if (lacing) {
-    out.push_back(static_cast<uint8_t>(frames.size() - 1));
-    Bytes table = lace_table(lacing, frames);
-    out.insert(out.end(), table.begin(), table.end());
-  }
+  if (lacing) out = cat({out, Bytes{static_cast<uint8_t>(frames.size() - 1)}, lace_table(lacing, frames)});
   for (const Bytes& frame : frames) out.insert(out.end(), frame.begin(), frame.end());
   return out;
 }

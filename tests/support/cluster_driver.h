@@ -20,7 +20,6 @@ namespace testing_support {
 struct DrivenBlock {
   uint64_t track = 0;
   int64_t ticks = 0;  // Cluster timecode + the block's relative timecode
-  bool simple = true;
   bool key = false;  // SimpleBlock: flag 0x80; Block: its group has no ReferenceBlock
   uint8_t flags = 0;
   std::vector<int64_t> frame_sizes;  // as parsed
@@ -46,14 +45,6 @@ struct DriveOutcome {
   bool failed = false;    // a result that was neither a block, a skip nor "ran out" with inbuff1 used up
   bool complete = false;  // every byte was consumed and no read or frame was left half done
 };
-
-// File offset of the first Cluster (the EBML header and the Segment's other
-// children before it are stepped over), or `size` when there is none.
-uint64_t FirstClusterOffset(const uint8_t* file, size_t size);
-
-DriveOutcome DriveClusters(const uint8_t* file, size_t size, uint64_t start, const DriveOptions& options);
-
-// ---------------------------------------------------------------------------
 
 namespace cluster_driver_detail {
 
@@ -119,13 +110,9 @@ class Driver {
   void parse_buffer() {
     apply_skip();
     while (in1_.buff_left && !outcome_.failed) {
-      if (block_) {
-        consume_frames();
-      } else if (group_tail_pending_) {
-        read_group_tail();
-      } else {
-        call_parser();
-      }
+      if (block_) consume_frames();
+      else if (group_tail_pending_) read_group_tail();
+      else call_parser();
     }
   }
 
@@ -169,24 +156,17 @@ class Driver {
 
   void start_block() {
     const mkvcluster& c = *cluster_;
-    DrivenBlock block;
-    block.track = c.track_number;
-    block.ticks = static_cast<int64_t>(c.cluster_timecode) + c.block_timecode;
-    block.simple = c.in_blockgroup == 0;
-    block.flags = c.block_flags;
-    block.key = block.simple && (c.block_flags & 0x80);
-    block.frame_sizes.assign(c.frame_sizes, c.frame_sizes + c.frame_count);
-    outcome_.blocks.push_back(std::move(block));
-    if (!outcome_.blocks.back().simple && options_.read_group_tail) {
+    const bool simple = c.in_blockgroup == 0;
+    outcome_.blocks.push_back({c.track_number, static_cast<int64_t>(c.cluster_timecode) + c.block_timecode,
+                               simple && (c.block_flags & 0x80), c.block_flags,
+                               std::vector<int64_t>(c.frame_sizes, c.frame_sizes + c.frame_count), {}});
+    if (!simple && options_.read_group_tail) {
       group_tail_pending_ = true;
       group_block_ = outcome_.blocks.size() - 1;
     }
     block_ = true;
-    frame_index_ = 0;
-    frame_left_ = 0;
-    consumed_ = 0;
+    frame_index_ = 0;  // frame_left_ is 0: the block before was consumed whole
     data_left_ = c.block_data_left;
-    adler_ = Adler32Sum{};
   }
 
   // Frames of the current block from inbuff1; a frame cut by the buffer's end
@@ -212,14 +192,14 @@ class Driver {
       in1_.buff_pos += n;
       in1_.buff_left -= n;
       frame_left_ -= n;
-      consumed_ += n;
+      data_left_ -= n;
       if (frame_left_) return;
       block.adler32.push_back(adler_.value());
       ++frame_index_;
     }
     block_ = false;
-    if (data_left_ > consumed_) {
-      skip_left_ = static_cast<uint64_t>(data_left_ - consumed_);
+    if (data_left_ > 0) {
+      skip_left_ = static_cast<uint64_t>(data_left_);
       apply_skip();
     }
   }
@@ -237,8 +217,7 @@ class Driver {
   bool block_ = false;         // frames of the last parsed block are being consumed
   size_t frame_index_ = 0;
   uint32_t frame_left_ = 0;    // bytes of frame frame_index_ still to consume; 0 between frames
-  int64_t consumed_ = 0;       // frame bytes of the block consumed so far
-  int64_t data_left_ = 0;      // the block's block_data_left
+  int64_t data_left_ = 0;      // the block's block_data_left less the frame bytes consumed so far
   Adler32Sum adler_;
   bool group_tail_pending_ = false;  // the last Block's group has children still to read
   size_t group_block_ = 0;           // index of that Block in outcome_.blocks
@@ -247,6 +226,8 @@ class Driver {
 
 }  // namespace cluster_driver_detail
 
+// File offset of the first Cluster (the EBML header and the Segment's other
+// children before it are stepped over), or `size` when there is none.
 inline uint64_t FirstClusterOffset(const uint8_t* file, size_t size) {
   using cluster_driver_detail::read_vint;
   constexpr uint64_t kSegment = 0x18538067, kCluster = 0x1F43B675;

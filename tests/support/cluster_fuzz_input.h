@@ -107,18 +107,14 @@ inline std::vector<std::string> Walk(const uint8_t* file, size_t size, uint64_t 
     destroy_mkvcluster(&c);
     uint64_t left = 0;
     auto taken = shortcut ? take_unlaced_block(&in, &c, own, &left) : unlaced_block_result::parse;
-    if (taken == unlaced_block_result::other_track) {
+    int result = taken == unlaced_block_result::parse ? parse_mkvcluster(&in, nullptr, &c, &left)
+                 : taken == unlaced_block_result::other_track ? kClusterSkip  // *left to skip, as after a skip
+                                                              : kClusterBlockReady;
+    if (result == kClusterSkip) {
       skip(left);
       continue;
     }
-    if (taken == unlaced_block_result::parse) {
-      int result = parse_mkvcluster(&in, nullptr, &c, &left);
-      if (result == kClusterSkip) {
-        skip(left);
-        continue;
-      }
-      if (result != kClusterBlockReady) break;
-    }
+    if (result != kClusterBlockReady) break;
     if (c.track_number == own) seen.push_back(Snapshot(c, in.buff_fileoff + in.buff_pos));
     skip(c.block_data_left > 0 ? static_cast<uint64_t>(c.block_data_left) : 0);
   }
@@ -157,9 +153,8 @@ inline std::string RunClusterFuzzInput(const uint8_t* data, size_t size) {
   if (!broken.empty()) return broken;
   if (host::LiveBlockCount() != live) return "blocks leaked";
 
-  DriveOptions whole_options = options;
-  whole_options.buffer_sizes = {file_size};
-  DriveOutcome whole = DriveClusters(file, file_size, start, whole_options);
+  options.buffer_sizes = {file_size};
+  DriveOutcome whole = DriveClusters(file, file_size, start, options);
   if (!broken.empty()) return broken + " (one buffer)";
   if (host::LiveBlockCount() != live) return "blocks leaked (one buffer)";
   if (fail_at == 0 && split.complete && whole.complete && !SameBlocks(split, whole, options.read_group_tail)) {
