@@ -40,8 +40,6 @@ class Reader {
   Reader(const uint8_t* data, size_t size) : data_(data), size_(size) {}
 
   bool empty() const { return pos_ >= size_; }
-  size_t left() const { return size_ - pos_; }
-  const uint8_t* rest() const { return data_ + pos_; }
 
   uint8_t Byte() { return pos_ < size_ ? data_[pos_++] : 0; }
 

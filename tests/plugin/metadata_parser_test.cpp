@@ -1,8 +1,8 @@
 // "MediaMetadataParser": parsing a stream into a caller-owned block, queries,
-// iteration, freeing, and an instance's own block.
+// freeing, and an instance's own block. Iteration over every entry, and parses
+// with an allocation failing, are checked by the header parse fuzzer.
 
 #include <cstring>
-#include <map>
 #include <memory>
 #include <string>
 #include <vector>
@@ -13,7 +13,6 @@
 #include "filter/mkv_context.h"
 #include "host/heap_control.h"
 #include "tests/plugin/graph_harness.h"
-#include "tests/support/allocation_failures.h"
 #include "tests/support/fixtures.h"
 #include "tests/support/log_recorder.h"
 
@@ -94,20 +93,6 @@ TEST(ParserParseMetadataTest, RefusedInputLeavesNoBlock) {
   }
 }
 
-TEST(ParserParseMetadataTest, EachFailedAllocationFailsCleanly) {
-  auto stream = host::OpenFileStream(plugin_test::FixtureFile("avc_aac"), true);
-  EXPECT_GE(testing_support::EachAllocationFailing([&](uint64_t n) {
-    MmfMetadata* block = nullptr;
-    testing_support::FailingAllocation failing(n);
-    const int result = Ops().Parser_ParseMetadata(stream->record(), 0, &block);
-    const bool reached = failing.Reached();
-    EXPECT_EQ(stream->Tell(), 0);
-    EXPECT_TRUE(result == 0 || (reached && (result == 12 || result == 48))) << "allocation " << n << ": " << result;
-    Ops().Parser_FreeMetadata(block);
-    return result != 0;  // a failure in the metadata list only shortens it: the first success ends the run
-  }), 2u);
-}
-
 TEST(ParserMetadataTest, NullArgumentsAnswer22) {
   ParsedBlock parsed("tags");
   MmfMetadata* block = nullptr;
@@ -163,34 +148,6 @@ TEST(ParserQueryMetadataTest, KeysOccurrencesAndPictureSize) {
       EXPECT_EQ(Num4(found.value), c.number);
     }
   }
-}
-
-// Iteration walks every entry in order (the picture size of an audio-only
-// file included, which Query withholds), then answers 0 and leaves the index.
-TEST(ParserIterateMetadataTest, WalksTheEntriesThatQueryFinds) {
-  ParsedBlock parsed("tags");
-  ASSERT_EQ(parsed.result, 0);
-  int32_t index = 0;
-  char* key = nullptr;
-  MmfMetadataValue value{};
-  int withheld = 0, entries = 0;
-  std::map<std::string, uint32_t> occurrences;
-  while (Ops().Parser_IterateMetadata(parsed.block, &index, &key, &value) == 1) {
-    EXPECT_EQ(index, ++entries);
-    Found found = Query(parsed.block, key, occurrences[key]++);
-    const bool picture = std::string(key) == "Width" || std::string(key) == "Height";
-    withheld += picture;
-    ASSERT_EQ(found.answer, picture ? 0 : 1) << key;
-    if (!picture) {
-      EXPECT_EQ(found.value.Data, value.Data) << key;
-    }
-  }
-  EXPECT_EQ(index, entries);
-  for (const char* tag : {"Name", "Artist", "Genre", "Album", "Comment"}) EXPECT_EQ(occurrences[tag], 1u) << tag;
-  EXPECT_EQ(withheld, 2);
-  index = -1;
-  EXPECT_EQ(Ops().Parser_IterateMetadata(parsed.block, &index, &key, &value), 0);
-  EXPECT_EQ(index, -1);
 }
 
 TEST(ParserFreeMetadataTest, FreesOnlyBlocksOfACompleteParseThatNoInstanceOwns) {

@@ -13,7 +13,6 @@
 
 #include "filter/mkv_context.h"
 #include "host/heap_control.h"
-#include "tests/support/allocation_failures.h"
 #include "tests/plugin/graph_harness.h"
 
 namespace {
@@ -136,18 +135,9 @@ TEST(CreateTest, CreatesOnSeveralThreadsGetDistinctNames) {
   EXPECT_EQ(names.size(), size_t{kThreads * kPerThread});
 }
 
-// Handle, name, context, resource table, input channel, its name: each
-// failure gives null and leaks nothing; one after the handle (the context)
-// still uses up an instance number.
-TEST(CreateTest, EachFailedAllocationGivesNullAndLeaksNothing) {
-  EXPECT_EQ(testing_support::EachAllocationFailing([](uint64_t n) {
-    testing_support::FailingAllocation failing(n);
-    MmfFilterHandle* handle = Filter().Create();
-    const bool reached = failing.Reached();
-    EXPECT_EQ(handle == nullptr, reached) << "allocation " << n;
-    if (handle) Filter().Destroy(handle);
-    return reached;
-  }), 6u);
+// A failed Create gives null (its leaks: the playback allocation sweeps);
+// one after the handle (the context) still uses up an instance number.
+TEST(CreateTest, FailedAllocationAfterTheHandleUsesUpAnInstanceNumber) {
   MmfFilterHandle* handle = Filter().Create();
   host::FailNthAllocation(3);
   EXPECT_EQ(Filter().Create(), nullptr);
@@ -170,14 +160,13 @@ class ResourcesTest : public testing::Test {
 
   const AoResourceAccessOps& Ops() { return *HostPlugin().resources(); }
   int Set(const char* name, int32_t value) { return Ops().SetResource(handle_, name, &value); }
-  const AoResource* Row(const char* name) {
+  int32_t Int32(const char* name) {
     for (const AoResource* row = Ops().GetResources(handle_); row && row->Name; ++row) {
-      if (std::strcmp(row->Name, name) == 0) return row;
+      if (std::strcmp(row->Name, name) == 0) return *static_cast<const int32_t*>(row->Value);
     }
     ADD_FAILURE() << "no resource " << name;
-    return nullptr;
+    return 0;
   }
-  int32_t Int32(const char* name) { return *static_cast<const int32_t*>(Row(name)->Value); }
 
   MmfFilterHandle* handle_ = nullptr;
   MkvContext* context_ = nullptr;

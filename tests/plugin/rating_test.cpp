@@ -1,15 +1,15 @@
 // RateInputFormat: every fixture against what mkvinfo and ffprobe recorded
 // for it; crafted files for the track set-up rules that the fixtures do not
-// reach (Vorbis layouts, PCM byte order, AAC, BITMAPINFOHEADER compression
-// codes, encryption, frame rates, the byte-rate estimate) and for the cue
-// table that the rating reads (scan steps, codec states, times past 48 bits);
+// reach (Vorbis layouts, AAC, BITMAPINFOHEADER compression codes, encryption,
+// frame rates) and for the cue table that the rating reads (scan steps, codec
+// states, times past 48 bits; the byte-rate estimate and conversions without
+// cues are checked against a model by the cue lookup fuzzer);
 // and the rating as a lifecycle (queries, repeated requests, the seek test,
 // failures that leave the instance for Destroy to free without a leak).
 
 #include <cmath>
 #include <cstring>
 #include <functional>
-#include <map>
 #include <string>
 #include <vector>
 
@@ -19,7 +19,6 @@
 #include "host/heap_control.h"
 #include "tests/plugin/graph_harness.h"
 #include "tests/support/allocation_failures.h"
-#include "tests/support/cluster_driver.h"
 #include "tests/support/ebml_builder.h"
 #include "tests/support/fixtures.h"
 #include "tests/support/log_recorder.h"
@@ -36,68 +35,31 @@ using testing_support::ExpectedTrack;
 using testing_support::FixtureExpectation;
 using testing_support::LogRecorder;
 
-// The fixtures' codec IDs that the plug-in offers, and the four-character
-// code each one must get; any other codec ID is left out.
-const std::map<std::string, std::string> kOfferedCodecs = {
-    {"V_MPEG4/ISO/AVC", "AVC1"}, {"V_MPEG4/ISO/ASP", "MP4V"}, {"V_MPEG4/MS/V3", "MP43"}, {"V_MPEG1", "MP1V"},
-    {"V_MPEG2", "MP2V"},         {"V_THEORA", "THEO"},        {"A_MPEG/L3", "M2A3"},     {"A_MPEG/L2", "M2A2"},
-    {"A_PCM/INT/LIT", "RAWA"},   {"A_PCM/INT/BIG", "RAWA"},   {"A_DTS", "DTSA"},         {"A_VORBIS", "VRBS"},
-    {"A_FLAC", "FLAC"},          {"A_AAC", "M4AC"},           {"A_AC3", "AC3A"},
-    {"V_MS/VFW/FOURCC", ""},  // offered under the BITMAPINFOHEADER's code, which mkvinfo shows
-};
-
 uint32_t Fourcc(const std::string& code) {
   return uint32_t(code.at(0)) << 24 | uint32_t(code.at(1)) << 16 | uint32_t(code.at(2)) << 8 | uint32_t(code.at(3));
 }
 
-void CheckDecoderConfig(const ExpectedTrack& track, const MkvChannel& channel) {
-  const MkvChannelState& state = *channel.State;
-  const MmfMediaFormat& format = channel.Format;
-  if (track.codec == "A_FLAC") {
-    ASSERT_EQ(format.extra_size, 48u);
-    mkv_flac_config config;
-    std::memcpy(&config, format.extra_ptr, sizeof config);
-    EXPECT_EQ(config.sample_rate, track.flac_sample_rate);
-    EXPECT_EQ(config.channels, track.flac_channels);
-    EXPECT_EQ(config.bits_per_sample, track.flac_bits);
-    EXPECT_EQ(state.DecoderConfigCount, 1u);
-    return;
-  }
-  ASSERT_EQ(format.extra_size, track.codec_private_size);
-  if (track.codec_private_size == 0) {
-    EXPECT_EQ(state.DecoderConfigCount, 0u);
-    return;
-  }
-  // The three Vorbis headers end the CodecPrivate, their lacing left out
-  // (the sizes themselves are pinned on crafted headers).
-  if (track.codec == "A_VORBIS") {
-    ASSERT_EQ(state.DecoderConfigCount, 3u);
-    const uint8_t* end = format.extra_ptr + format.extra_size;
-    for (int j = 2; j >= 0; end = state.DecoderConfigData[j--]) {
-      EXPECT_EQ(state.DecoderConfigData[j] + state.DecoderConfigSize[j], end) << "header " << j;
-    }
-    EXPECT_GT(state.DecoderConfigData[0], format.extra_ptr);
-    return;
-  }
-  EXPECT_EQ(state.DecoderConfigCount, 1u);
-  EXPECT_EQ(state.DecoderConfigSize[0], track.codec_private_size);
-  EXPECT_EQ(state.DecoderConfigData[0], format.extra_ptr);
+// FLAC's STREAMINFO is unpacked into the format's own configuration record.
+void CheckFlacConfig(const ExpectedTrack& track, const MkvChannel& channel) {
+  ASSERT_EQ(channel.Format.extra_size, 48u);
+  mkv_flac_config config;
+  std::memcpy(&config, channel.Format.extra_ptr, sizeof config);
+  EXPECT_EQ(config.sample_rate, track.flac_sample_rate);
+  EXPECT_EQ(config.channels, track.flac_channels);
+  EXPECT_EQ(config.bits_per_sample, track.flac_bits);
+  EXPECT_EQ(channel.State->DecoderConfigCount, 1u);
 }
 
+// Which channels are offered, in which order, with which code, picture size
+// and sample rate is checked on every fixture through the tool (check_probe.sh).
 void CheckChannel(const FixtureExpectation& fx, const ExpectedTrack& track, const MkvChannel& channel) {
   SCOPED_TRACE("track " + std::to_string(track.number) + " " + track.codec);
   const MmfMediaFormat& format = channel.Format;
-  ASSERT_NE(channel.State, nullptr);
-  ASSERT_NE(channel.State->Track, nullptr);
   EXPECT_EQ(channel.State->Track->track_number, track.number);
-  const std::string& code = kOfferedCodecs.at(track.codec);
-  EXPECT_EQ(format.fourcc, Fourcc(code.empty() ? track.fields.at("vfw_fourcc") : code));
   EXPECT_EQ(format.buffer_size, 65536u);
   if (track.type == "video") {
     EXPECT_STREQ(channel.Name, "EncodedVideoOut");
     EXPECT_EQ(format.stream_type, 0x80000002u);
-    EXPECT_EQ(format.media.video.width, track.width);
-    EXPECT_EQ(format.media.video.height, track.height);
     uint32_t rate = track.default_duration ? uint32_t(std::lround(1e9 / double(track.default_duration))) : 24;
     EXPECT_EQ(format.media.video.frame_rate, rate);
     EXPECT_NEAR(format.media.video.duration, double(fx.duration_ns) / 1000, 1.0);
@@ -113,13 +75,12 @@ void CheckChannel(const FixtureExpectation& fx, const ExpectedTrack& track, cons
     EXPECT_EQ(format.stream_type, pcm ? 4u : 0x80000004u);
     EXPECT_EQ(format.pcm_byte_order, !pcm ? 0u : track.codec.find("/LIT") != std::string::npos ? 1u : 2u);
     EXPECT_EQ(format.media.audio.channels, track.channels ? track.channels : 1);
-    EXPECT_EQ(format.media.audio.sample_rate, uint32_t(track.sampling_frequency));
     EXPECT_EQ(format.media.audio.bits_per_sample, 16u);
   }
-  CheckDecoderConfig(track, channel);
+  if (track.codec == "A_FLAC") CheckFlacConfig(track, channel);
 }
 
-TEST(RateInputFormatFixturesTest, OffersEverySupportedTrackInFileOrderWithItsFormat) {
+TEST(RateInputFormatFixturesTest, OffersEverySupportedTrackWithItsFormat) {
   for (const std::string& name : testing_support::FixtureNames()) {
     SCOPED_TRACE(name);
     FixtureExpectation fx = testing_support::LoadFixture(name);
@@ -130,30 +91,24 @@ TEST(RateInputFormatFixturesTest, OffersEverySupportedTrackInFileOrderWithItsFor
     EXPECT_EQ(c.graph->rating(), matroska ? 80 : 0);
     if (!matroska) continue;
 
-    // An encrypted track is counted but set up in no channel: the channels
-    // after the set-up ones offer no format and are not acquired.
-    std::vector<const ExpectedTrack*> offered;
-    size_t counted = 0;
-    for (const ExpectedTrack& track : fx.tracks) {
-      counted += kOfferedCodecs.count(track.codec);
-      if (kOfferedCodecs.count(track.codec) && !track.fields.count("encryption")) offered.push_back(&track);
-    }
-    ASSERT_EQ(c.channel_count(), int32_t(counted));
-    ASSERT_EQ(c.graph->outputs().size(), counted);
-    for (size_t k = offered.size(); k < counted; ++k) {
-      EXPECT_EQ(c.graph->outputs()[k].formats_offered, 0);
-      EXPECT_EQ(c.graph->outputs()[k].acquire_result, -1);
-      EXPECT_NE(c.graph->outputs()[k].not_set_up.find("has no track: track "), std::string::npos);
-      EXPECT_EQ(c.channel(int32_t(k)).State->Track, nullptr);
-    }
+    // A record counted for an encrypted track offers no format and is not acquired.
+    const int32_t count = c.channel_count();
+    ASSERT_EQ(c.graph->outputs().size(), size_t(count));
     bool has_video = false;
-    for (size_t k = 0; k < offered.size(); ++k) {
+    for (int32_t k = 0; k < count; ++k) {
       const host::OutputChannelSetup& setup = c.graph->outputs()[k];
-      EXPECT_EQ(setup.channel, AsFrameworkChannel(&c.channel(int32_t(k))));
-      EXPECT_EQ(setup.formats_offered, int(counted));
+      const mkv_track_info* info = c.channel(k).State->Track;
+      EXPECT_EQ(setup.channel, AsFrameworkChannel(&c.channel(k)));
+      EXPECT_EQ(setup.formats_offered, info ? count : 0);
+      if (!info) {
+        EXPECT_EQ(setup.acquire_result, -1);
+        EXPECT_NE(setup.not_set_up.find("has no track: track "), std::string::npos);
+        continue;
+      }
       EXPECT_EQ(setup.offered.buffer_count, 42u + uint32_t(c.context()->ExtraBufferCount));
-      CheckChannel(fx, *offered[k], c.channel(int32_t(k)));
-      has_video |= offered[k]->type == "video";
+      const ExpectedTrack& track = fx.tracks.at(size_t(info - c.context()->FileInfo.tracks));
+      CheckChannel(fx, track, c.channel(k));
+      has_video |= track.type == "video";
     }
 
     // "Duration" is the longest channel duration: microseconds for video,
@@ -241,9 +196,6 @@ int ToTime(const Connected& c, uint64_t position, uint64_t* time) {
 
 constexpr uint64_t kPast48Bits = 281474977000;  // ms: 2^48 us and a bit
 
-using State = MkvChannelState;
-using Format = MmfMediaFormat;
-
 Bytes EncryptedTrack(uint64_t number, const Bytes& encryption) {
   return Track(number, kAudio, "A_AAC", master(kContentEncodings, {master(kContentEncoding, {
       uinteger(kContentEncodingType, 1), master(kContentEncryption, {encryption})})}));
@@ -253,7 +205,7 @@ std::vector<Case> Cases() {
   const Bytes mpeg2 = Track(1, kVideo, "V_MPEG2");
   return {
       {"vorbis headers of 30, 271 and 100 bytes", Vorbis(2, {0x1E, 0xFF, 0x10}, 401),
-       [](const Connected&, const State& s, const Format& f) {
+       [](auto&, auto& s, auto& f) {
          ASSERT_EQ(s.DecoderConfigCount, 3u);
          EXPECT_EQ(std::vector<uint32_t>(s.DecoderConfigSize, s.DecoderConfigSize + 3),
                    (std::vector<uint32_t>{30, 271, 100}));
@@ -261,24 +213,17 @@ std::vector<Case> Cases() {
          EXPECT_EQ(f.extra_size, 405u);
        }},
       {"vorbis packet count 3", Vorbis(3, {0x1E, 0x10}, 100),
-       [](const Connected&, const State& s, const Format&) {
+       [](auto&, auto& s, auto&) {
          EXPECT_EQ(s.DecoderConfigCount, 0u);
          EXPECT_EQ(s.DecoderConfigData[0], nullptr);
        }, 3, "kelvane: Vorbis header has wrong packet count = 3"},
       {"vorbis private of 3 bytes", Vorbis(2, {1, 1}, 0),
-       [](const Connected&, const State& s, const Format&) { EXPECT_EQ(s.DecoderConfigCount, 0u); }},
+       [](auto&, auto& s, auto&) { EXPECT_EQ(s.DecoderConfigCount, 0u); }},
       {"vorbis setup header empty", Vorbis(2, {0x05, 0x05}, 10),
-       [](const Connected&, const State& s, const Format&) { EXPECT_EQ(s.DecoderConfigCount, 0u); },
+       [](auto&, auto& s, auto&) { EXPECT_EQ(s.DecoderConfigCount, 0u); },
        3, "kelvane: Vorbis config too small."},
-      {"little-endian PCM", File(Track(1, kAudio, "A_PCM/INT/LIT")),
-       [](const Connected&, const State&, const Format& f) {
-         EXPECT_EQ(f.stream_type, 4u);
-         EXPECT_EQ(f.pcm_byte_order, 1u);
-       }},
-      {"big-endian PCM", File(Track(1, kAudio, "A_PCM/INT/BIG")),
-       [](const Connected&, const State&, const Format& f) { EXPECT_EQ(f.pcm_byte_order, 2u); }},
       {"MPEG-2 AAC", File(Track(1, kAudio, "A_AAC/MPEG2/LC")),
-       [](const Connected&, const State&, const Format& f) {
+       [](auto&, auto&, auto& f) {
          EXPECT_EQ(f.fourcc, Fourcc("M2AC"));
          EXPECT_EQ(f.stream_type, 0x80000004u);
          EXPECT_EQ(f.media.bytes[20], 2);  // byte 28 of the record
@@ -286,21 +231,19 @@ std::vector<Case> Cases() {
          EXPECT_EQ(f.word_1104, 2u);
        }},
       {"BITMAPINFOHEADER of 40 bytes naming WVC1", Bitmap(40, "WVC1"),
-       [](const Connected&, const State& s, const Format& f) {
+       [](auto&, auto& s, auto& f) {
          EXPECT_EQ(f.fourcc, Fourcc("WVC1"));
          EXPECT_EQ(f.extra_size, 40u);
          EXPECT_EQ(f.extra_ptr, s.DecoderConfigData[0]);
        }},
       {"BITMAPINFOHEADER of 50 bytes naming WVC1", Bitmap(50, "WVC1"),
-       [](const Connected&, const State& s, const Format& f) {
+       [](auto&, auto& s, auto& f) {
          EXPECT_EQ(f.extra_size, 10u);
          EXPECT_EQ(f.extra_ptr, s.DecoderConfigData[0] + 40);
        }},
-      {"BITMAPINFOHEADER naming DIV3", Bitmap(40, "DIV3"),
-       [](const Connected&, const State&, const Format& f) { EXPECT_EQ(f.fourcc, Fourcc("DIV3")); }},
       {"encrypted AAC beside MPEG-2 video",
        File(cat({EncryptedTrack(1, uinteger(kContentEncAlgo, 5)), Track(2, kVideo, "V_MPEG2")})),
-       [](const Connected& c, const State&, const Format& f) {
+       [](auto& c, auto&, auto& f) {
          ASSERT_EQ(c.channel_count(), 2);
          EXPECT_EQ(f.fourcc, Fourcc("MP2V"));
          EXPECT_STREQ(c.channel(0).Name, "EncodedVideoOut");
@@ -310,44 +253,18 @@ std::vector<Case> Cases() {
       {"an encrypted track in the last of the 100 track slots",
        File(cat({[] { Bytes opus; for (uint64_t i = 1; i < 100; ++i) opus = cat({opus, Track(i, kAudio, "A_OPUS")}); return opus; }(),
                  EncryptedTrack(100, {})})),
-       [](const Connected& c, const State&, const Format&) {
+       [](auto& c, auto&, auto&) {
          ASSERT_EQ(c.channel_count(), 1);
          EXPECT_EQ(HostPlugin().output()->AcquireOutputChannel(AsFrameworkChannel(&c.channel(0))), 4044);
        }, 2, "kelvane: AcquireOutputChannel channel 0 has no track: track 100 is encrypted."},
-      {"vorbis, AVC and a subtitle track",
-       File(cat({Track(1, kAudio, "A_VORBIS"), Track(2, kVideo, "V_MPEG4/ISO/AVC"), Track(3, 17, "S_TEXT/UTF8")})),
-       [](const Connected& c, const State&, const Format& f) {
-         ASSERT_EQ(c.channel_count(), 2);
-         EXPECT_STREQ(c.channel(0).Name, "EncodedAudioOut");
-         EXPECT_EQ(f.fourcc, Fourcc("VRBS"));
-         EXPECT_STREQ(c.channel(1).Name, "EncodedVideoOut");
-         EXPECT_EQ(c.channel(1).Format.fourcc, Fourcc("AVC1"));
-       }},
       {"DefaultDuration of 33366667 ns", File(Track(1, kVideo, "V_MPEG2", uinteger(kDefaultDuration, 33366667))),
-       [](const Connected&, const State&, const Format& f) { EXPECT_EQ(f.media.video.frame_rate, 30u); }},
+       [](auto&, auto&, auto& f) { EXPECT_EQ(f.media.video.frame_rate, 30u); }},
       {"no DefaultDuration", File(mpeg2),
-       [](const Connected&, const State&, const Format& f) { EXPECT_EQ(f.media.video.frame_rate, 24u); },
+       [](auto&, auto&, auto& f) { EXPECT_EQ(f.media.video.frame_rate, 24u); },
        5, "kelvane:  No default duration, frame rate is inaccurate."},
-      // Without Cues only the first Cluster converts, both ways.
-      {"no cues", File(mpeg2),
-       [](const Connected& c, const State&, const Format&) {
-         const uint64_t first = testing_support::FirstClusterOffset(c.bytes.data(), c.bytes.size());
-         uint64_t position = 0, time = 1;
-         EXPECT_EQ(ToPosition(c, 0, &position), 0);
-         EXPECT_EQ(position, first);
-         EXPECT_EQ(ToPosition(c, 1, &position), 4002);
-         EXPECT_EQ(ToTime(c, first, &time), 0);
-         EXPECT_EQ(time, 0u);
-         EXPECT_EQ(ToTime(c, first + 1, &time), 4002);
-       }},
-      {"cues 10 s and 500000 bytes apart", File(mpeg2, master(kCues, {Cue(0, 1, 1000), Cue(10000, 1, 501000)})),
-       [](const Connected& c, const State&, const Format&) { EXPECT_EQ(c.context()->ByteRate, 50000); }},
-      {"cues spanning 0.5 s", File(mpeg2, master(kCues, {Cue(0, 1, 1000), Cue(500, 1, 501000)})),
-       [](const Connected& c, const State&, const Format&) { EXPECT_EQ(c.context()->ByteRate, 0); },
-       3, "kelvane: CalcOverallByteRate cueing points weren't enough to estimate the bytes per second."},
       {"cue points past 2^48 us",
        File(mpeg2, master(kCues, {Cue(kPast48Bits, 1, 100), Cue(kPast48Bits + 1000, 1, 900)})),
-       [](const Connected& c, const State&, const Format&) {
+       [](auto& c, auto&, auto&) {
          EXPECT_EQ(c.context()->ByteRate, 800);
          uint64_t position = 0, time = 0;
          EXPECT_EQ(ToPosition(c, kPast48Bits * 1000 + 1000001, &position), 0);
@@ -357,12 +274,12 @@ std::vector<Case> Cases() {
        }},
       {"a seek to a cue position with a codec state",
        File(mpeg2, master(kCues, {Cue(0, 1, 100, uinteger(kCueCodecState, 3))})),
-       [](const Connected& c, const State&, const Format&) {
+       [](auto& c, auto&, auto&) {
          EXPECT_EQ(HostPlugin().seeker()->Seek(c.graph->handle(), 0, 0, InFile(c, 100)), 0);
        }, 5, "kelvane: Non-zero codec state on cue = 3"},
       {"a scan step onto cue points that share the Cluster it read",
        File(mpeg2, master(kCues, {Cue(0, 1, 100), Cue(1000, 1, 100), Cue(1500, 1, 100), Cue(5000, 1, 900)})),
-       [](const Connected& c, const State&, const Format&) {
+       [](auto& c, auto&, auto&) {
          const MmfReadRequest& next = NextScanRequest(c);
          EXPECT_EQ(next.Time, 5000000u);
          EXPECT_EQ(next.Position, InFile(c, 900));
@@ -370,7 +287,7 @@ std::vector<Case> Cases() {
        }},
       {"a scan step onto cue points that share the last Cluster",
        File(mpeg2, master(kCues, {Cue(0, 1, 100), Cue(1000, 1, 100)})),
-       [](const Connected& c, const State&, const Format&) { EXPECT_EQ(NextScanRequest(c).Length, -1); },
+       [](auto& c, auto&, auto&) { EXPECT_EQ(NextScanRequest(c).Length, -1); },
        5, "kelvane: GetNextReadList detected EOS internally. time = 1000000"},
   };
 }
