@@ -56,9 +56,16 @@ class TrickPlayTest : public testing::Test {
     } else {
       options.buffer_size = kBufferSize;
     }
-    connected_ = plugin_test::ConnectStreamed(name, config, options);
+    // The streamer is the input channel's Peer, its list mode asks the
+    // plug-in's list maker, and it reads on from where the rating left the input.
+    source_ = host::OpenFileStream(plugin_test::FixtureFile(name), true);
+    streamer_ = std::make_unique<host::FileStreamer>(source_.get(), config);
+    options.upstream_output = streamer_->output();
+    connected_ = plugin_test::ConnectFile(name, true, options);
     ASSERT_TRUE(connected_.graph->rated());
     handle_ = connected_.graph->handle();
+    streamer_->ConnectListMaker(HostPlugin().Get<MmfListMakerOps>("MediaListMaker"), handle_->InputChannel);
+    ASSERT_EQ(streamer_->Seek(static_cast<uint64_t>(connected_.stream->Tell()), 0), 0);
     for (int32_t k : channels) {
       ASSERT_EQ(HostPlugin().output()->AcquireOutputChannel(AsFrameworkChannel(&connected_.channel(k))), 0);
     }
@@ -81,7 +88,7 @@ class TrickPlayTest : public testing::Test {
     int result = kMmfBufferDelivered;
     for (int n = 0; n < limit && result == kMmfBufferDelivered; ++n) {
       MmfMra* mra = nullptr;
-      result = host::FileStreamer::Ops()->NextBuffer(connected_.streamer->output(), &mra);
+      result = host::FileStreamer::Ops()->NextBuffer(streamer_->output(), &mra);
       if (result != kMmfBufferDelivered) break;
       uint64_t offset = 0;
       for (const host::MraElement& e : std::span(host::MraElements(mra), mra->ElementCount)) {
@@ -106,6 +113,8 @@ class TrickPlayTest : public testing::Test {
 
   playback_test::CueModel cues_{"long_cues"};
   host::MemoryPool pool_{65536, 8};
+  std::unique_ptr<host::InputStream> source_;
+  std::unique_ptr<host::FileStreamer> streamer_;
   plugin_test::Connected connected_;
   MmfFilterHandle* handle_ = nullptr;
   host::GraphClock clock_;
@@ -295,7 +304,7 @@ TEST_F(TrickPlayTest, ScanForwardDeliversTheFirstTrickTimeAfterEachJump) {
   context->TrickMode = 512;  // forward
   context->TrickSpeed = 100;  // with TrickTime 500 ms: a step of 1 s
   ASSERT_EQ(plugin.Get<MmfMediaControlOps>("MediaControl")->Start(handle_), 0);
-  ASSERT_EQ(connected_.streamer->SetListMode(1), 0);
+  ASSERT_EQ(streamer_->SetListMode(1), 0);
 
   // Each step: the first cue point after the last one's time + 1 s, until none
   // is left or a request reaches the end of the file.
