@@ -138,25 +138,14 @@ TEST_P(PlaybackLaceTest, DeliversEveryFrameOnceAndPassesOverTheRest) {
   }
 }
 
-// A fixed-size lace of 3 frames over 32 bytes: 10 bytes each, 2 left over.
-Bytes FixedLaceWithRemainder() {
-  Bytes body = {
-      0x81,        // track 1
-      0x00, 0x00,  // timecode 0
-      0x84,        // key frame, fixed-size lacing
-      0x02,        // 3 frames
-  };
-  for (uint8_t value : {0x11, 0x22, 0x33}) body = cat({body, Bytes(10, value)});
-  body.push_back(0xEE);
-  body.push_back(0xEF);
-  return element(kSimpleBlock, body);
-}
-
 INSTANTIATE_TEST_SUITE_P(
     Laces, PlaybackLaceTest,
     testing::Values(
+        // A fixed-size lace of 3 frames over 32 bytes: 10 bytes each, 2 left over.
         LaceCase{"FixedLaceRemainder",
-                 OneCluster({FixedLaceWithRemainder(), simple_block(1, 10, kKeyFrame, {Bytes(12, 0x55)})}),
+                 OneCluster({simple_block(1, 0, kKeyFrame | kFixedLacing,
+                                          {Bytes(10, 0x11), Bytes(10, 0x22), cat({Bytes(10, 0x33), {0xEE, 0xEF}})}),
+                             simple_block(1, 10, kKeyFrame, {Bytes(12, 0x55)})}),
                  {Bytes(10, 0x11), Bytes(10, 0x22), Bytes(10, 0x33), Bytes(12, 0x55)}},
         LaceCase{"EmptyFrameInLace",
                  OneCluster({ebml_laced_block(1, 0, kKeyFrame, {Bytes{}, Bytes(9, 0x44), Bytes(5, 0x45)}),
