@@ -5,8 +5,9 @@
 // sinks at different speeds on their own threads (run under ThreadSanitizer),
 // and, for the small files, in buffers of every size up to 64 bytes and split
 // at every byte. The small files are then damaged: every truncation, flipped
-// bit and, for the smallest, every failed allocation must end (ctest's timeout fails a hung case) with no frame
-// element outside the input and no block left allocated.
+// bit and, for the smallest, every failed allocation must end (ctest's timeout
+// fails a hung case) with no frame element outside the input and no block
+// left allocated.
 //
 // KELVANE_FIXTURES names another fixture directory (drawn_remuxes.sh).
 // KELVANE_SWEEP=quick (the default of a cross build run under an emulator)

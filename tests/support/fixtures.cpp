@@ -136,9 +136,9 @@ bool ParseExpectedLine(std::string_view line, FixtureExpectation* fx) {
 
 bool ParseCueLine(std::string_view line, FixtureExpectation* fx) {
   ExpectedCue cue{};
-  if (!ParseFields(SplitOn(line, ' '), &cue.time_ticks, &cue.track, &cue.cluster_position, &cue.block_number)) return false;
-  fx->cues.push_back(cue);
-  return true;
+  const bool ok = ParseFields(SplitOn(line, ' '), &cue.time_ticks, &cue.track, &cue.cluster_position, &cue.block_number);
+  if (ok) fx->cues.push_back(cue);
+  return ok;
 }
 
 bool ParseBlockLine(std::string_view line, FixtureExpectation* fx) {
