@@ -68,8 +68,7 @@ struct Model {
     }
   }
 
-  bool has_cues = false;
-  bool preroll = false;
+  bool has_cues = false, preroll = false;
   uint64_t scale = 0, segment = 0, first_cluster = 0;
   std::vector<ModelCue> cues;
   std::vector<ModelChannel> channels;
@@ -82,15 +81,12 @@ struct Model {
   // Once per table: when no position names an acquired channel's track, every channel's counts.
   void Validate() {
     if (validated) return;
-    validated = true;
+    validated = all_tracks = true;
     for (const ModelCue& cue : cues) {
       for (const ModelPosition& p : cue.positions) {
-        for (const ModelChannel& c : channels) {
-          if (c.acquired && c.track == p.track) return;
-        }
+        for (const ModelChannel& c : channels) all_tracks = all_tracks && !(c.acquired && c.track == p.track);
       }
     }
-    all_tracks = true;
   }
 
   bool Counts(const ModelPosition& p) const {
@@ -123,9 +119,8 @@ struct Model {
     last_position_time = time;
     uint64_t copy = time;
     if (Search(&copy, false, position) == 0) return 0;
-    if (time != 0) return kNoConversion;
-    *position = first_cluster;
-    return 0;
+    if (time == 0) *position = first_cluster;
+    return time == 0 ? 0 : kNoConversion;
   }
 
   // The first counting position at or after `position`: its cue's time and

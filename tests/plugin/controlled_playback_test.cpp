@@ -104,20 +104,6 @@ struct PrerollTimes {
   }
 };
 
-host::RunnerOptions Options(std::vector<host::ControlAction> actions, bool preroll = false) {
-  host::RunnerOptions options;
-  options.input_buffer_size = 4096;
-  options.actions = std::move(actions);
-  options.preroll = preroll;
-  return options;
-}
-
-host::RunResult Play(const host::RunnerOptions& options, const std::string& name = "long_cues") {
-  return host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile(name), options);
-}
-
-host::ControlAction SeekTo(uint64_t time_us, uint64_t at_us) { return {host::ControlAction::kSeek, at_us, time_us, 0}; }
-
 struct SeekCase {
   const char* name;
   std::vector<uint64_t> targets;  // each seek waits for the clock to pass 1 s
@@ -134,13 +120,14 @@ class ControlledSeekTest : public testing::TestWithParam<SeekCase> {};
 TEST_P(ControlledSeekTest, EachChannelResumesAtTheFirstFrameOfTheChosenCluster) {
   const SeekCase& c = GetParam();
   CueModel fx("long_cues");
-  std::vector<host::ControlAction> actions;
-  for (uint64_t target : c.targets) actions.push_back(SeekTo(target, 1000000));
   PrerollTimes preroll;
-  host::RunnerOptions options = Options(actions, c.preroll);
+  host::RunnerOptions options;
+  options.input_buffer_size = 4096;
+  for (uint64_t target : c.targets) options.actions.push_back({host::ControlAction::kSeek, 1000000, target, 0});
+  options.preroll = c.preroll;
   options.on_buffer = PrerollTimes::Record;
   options.user = &preroll;
-  host::RunResult result = Play(options);
+  host::RunResult result = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile("long_cues"), options);
   ASSERT_TRUE(result.ok) << result.error;
   ASSERT_EQ(result.control_results, std::vector<int>(c.targets.size(), 0));
   ASSERT_EQ(result.channels.size(), 2u);
@@ -195,7 +182,10 @@ INSTANTIATE_TEST_SUITE_P(LongCues, ControlledSeekTest,
 // any other time is refused with 4002 and playback goes on where it was.
 TEST(ControlledSeekWithoutCuesTest, ZeroReplaysAndAnyOtherTimeIsRefusedWithoutLosingAFrame) {
   CueModel fx("no_cues");
-  host::RunResult result = Play(Options({SeekTo(5000000, 500000), SeekTo(0, 1000000)}), "no_cues");
+  host::RunnerOptions options;
+  options.input_buffer_size = 4096;
+  options.actions = {{host::ControlAction::kSeek, 500000, 5000000, 0}, {host::ControlAction::kSeek, 1000000, 0, 0}};
+  host::RunResult result = host::RunGraph(plugin_test::HostPlugin(), plugin_test::FixtureFile("no_cues"), options);
   ASSERT_TRUE(result.ok) << result.error;
   EXPECT_EQ(result.control_results, (std::vector<int>{4002, 0}));
   for (const host::ChannelRun& run : result.channels) {

@@ -9,6 +9,7 @@
 #include <fstream>
 #include <span>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -137,25 +138,14 @@ TEST_P(PlaybackLaceTest, DeliversEveryFrameOnceAndPassesOverTheRest) {
   }
 }
 
-// A fixed-size lace of 3 frames over 32 bytes: 10 bytes each, 2 left over.
-Bytes FixedLaceWithRemainder() {
-  Bytes body = {
-      0x81,        // track 1
-      0x00, 0x00,  // timecode 0
-      0x84,        // key frame, fixed-size lacing
-      0x02,        // 3 frames
-  };
-  for (uint8_t value : {0x11, 0x22, 0x33}) body = cat({body, Bytes(10, value)});
-  body.push_back(0xEE);
-  body.push_back(0xEF);
-  return element(kSimpleBlock, body);
-}
-
 INSTANTIATE_TEST_SUITE_P(
     Laces, PlaybackLaceTest,
     testing::Values(
+        // A fixed-size lace of 3 frames over 32 bytes: 10 bytes each, 2 left over.
         LaceCase{"FixedLaceRemainder",
-                 OneCluster({FixedLaceWithRemainder(), simple_block(1, 10, kKeyFrame, {Bytes(12, 0x55)})}),
+                 OneCluster({simple_block(1, 0, kKeyFrame | kFixedLacing,
+                                          {Bytes(10, 0x11), Bytes(10, 0x22), cat({Bytes(10, 0x33), {0xEE, 0xEF}})}),
+                             simple_block(1, 10, kKeyFrame, {Bytes(12, 0x55)})}),
                  {Bytes(10, 0x11), Bytes(10, 0x22), Bytes(10, 0x33), Bytes(12, 0x55)}},
         LaceCase{"EmptyFrameInLace",
                  OneCluster({ebml_laced_block(1, 0, kKeyFrame, {Bytes{}, Bytes(9, 0x44), Bytes(5, 0x45)}),
@@ -184,51 +174,37 @@ TEST(PlaybackCasesTest, DecoderConfigurationLargerThanTheOutputBufferEndsTheChan
 
 // An upstream that delivers a whole file, from its first Cluster, in one input
 // buffer headed by `properties` file-offset properties.
-class PropertyHeavyUpstream {
- public:
+struct PropertyHeavyUpstream {
   PropertyHeavyUpstream(const std::vector<uint8_t>& file, uint32_t properties)
-      : bytes_(static_cast<uint32_t>(file.size()), 1), mras_(host::MakeMraPool(1, properties + 1)) {
-    output_.Kind = kMmfChannelKind;
-    output_.Direction = kMmfDirectionOutput;
-    output_.State = this;
+      : bytes(static_cast<uint32_t>(file.size()), 1), mras(host::MakeMraPool(1, properties + 1)) {
+    output.Kind = kMmfChannelKind;
+    output.Direction = kMmfDirectionOutput;
+    output.State = this;
     const uint64_t start = testing_support::FirstClusterOffset(file.data(), file.size());
-    MmfPoolBuffer* buffer = bytes_.AcquireWaiting(std::chrono::milliseconds(100));
+    MmfPoolBuffer* buffer = bytes.AcquireWaiting(std::chrono::milliseconds(100));
     std::copy(file.begin() + static_cast<ptrdiff_t>(start), file.end(), buffer->Data);
-    EXPECT_EQ(MmfAcquireMra(mras_, &mra_, 0), 0);
+    EXPECT_EQ(MmfAcquireMra(mras, &mra, 0), 0);
     for (uint32_t i = 0; i < properties; ++i) {
-      EXPECT_EQ(MmfSetMraPropertyElement(mra_, i, kMmfPropFileOffset, static_cast<uint32_t>(start), 0), 0);
+      EXPECT_EQ(MmfSetMraPropertyElement(mra, i, kMmfPropFileOffset, static_cast<uint32_t>(start), 0), 0);
     }
-    EXPECT_EQ(MmfSetMraBufferElement(mra_, properties, buffer, buffer->Data,
-                                     static_cast<uint32_t>(file.size() - start)), 0);
+    const auto size = static_cast<uint32_t>(file.size() - start);
+    EXPECT_EQ(MmfSetMraBufferElement(mra, properties, buffer, buffer->Data, size), 0);
     host::MemoryPool::Ops()->ReleaseBuffer(buffer);
   }
   ~PropertyHeavyUpstream() {
-    if (mra_) MmfReleaseMra(mra_);
-    MmfFreeMraPool(mras_);
+    if (mra) MmfReleaseMra(mra);
+    MmfFreeMraPool(mras);
   }
-
-  MmfChannel* output() { return &output_; }
-  static const MmfMediaOutputOps* Ops() {
-    static const MmfMediaOutputOps ops = [] {
-      MmfMediaOutputOps table{};
-      table.NextBuffer = NextBuffer;
-      return table;
-    }();
-    return &ops;
-  }
-
- private:
   static int NextBuffer(MmfChannel* output, MmfMra** buffer) {
     auto* self = static_cast<PropertyHeavyUpstream*>(output->State);
-    *buffer = self->mra_;
-    self->mra_ = nullptr;
+    *buffer = std::exchange(self->mra, nullptr);
     return *buffer ? kMmfBufferDelivered : kMmfEndOfStream;
   }
 
-  host::MemoryPool bytes_;
-  MmfMraPool* mras_;
-  MmfMra* mra_ = nullptr;
-  MmfChannel output_{};
+  host::MemoryPool bytes;
+  MmfMraPool* mras;
+  MmfMra* mra = nullptr;
+  MmfChannel output{};
 };
 
 TEST(PlaybackCasesTest, InputWithMorePropertiesThanRoomResumesAtTheSameElement) {
@@ -236,8 +212,10 @@ TEST(PlaybackCasesTest, InputWithMorePropertiesThanRoomResumesAtTheSameElement) 
   PropertyHeavyUpstream upstream(testing_support::ReadFixtureBytes(name), 1500);
   std::vector<uint32_t> trace;
   host::RunnerOptions options;
-  options.upstream = PropertyHeavyUpstream::Ops();
-  options.upstream_output = upstream.output();
+  MmfMediaOutputOps ops{};
+  ops.NextBuffer = PropertyHeavyUpstream::NextBuffer;
+  options.upstream = &ops;
+  options.upstream_output = &upstream.output;
   host::RunResult result = Play(plugin_test::FixtureFile(name), &trace, 65536, options);
   ASSERT_TRUE(result.ok) << result.error;
   size_t copied = std::count(trace.begin(), trace.end(), kMmfPropFileOffset);

@@ -52,6 +52,19 @@ std::vector<std::string_view> SplitOn(std::string_view text, char separator) {
   }
 }
 
+// An Adler-32 written in at most 8 hex digits.
+struct Hex {
+  uint32_t* value;
+};
+bool ParseNumber(std::string_view text, Hex hex) { return text.size() <= 8 && ParseNumber(text, hex.value, 16); }
+
+// Exactly one whole number per part, in order.
+template <typename... Values>
+bool ParseFields(const std::vector<std::string_view>& parts, Values... values) {
+  size_t i = 0;
+  return parts.size() == sizeof...(Values) && (ParseNumber(parts[i++], values) && ...);
+}
+
 // Calls `parse_line(line)` for every line that is neither blank nor a `#`
 // comment; a false result is reported as a malformed line.
 template <typename ParseLine>
@@ -84,10 +97,7 @@ bool ParseTrackToken(std::string_view token, ExpectedTrack* track) {
   else if (key == "flac_sample_rate") ok = ParseNumber(value, &track->flac_sample_rate);
   else if (key == "flac_channels") ok = ParseNumber(value, &track->flac_channels);
   else if (key == "flac_bits") ok = ParseNumber(value, &track->flac_bits);
-  else if (key == "sar") {
-    std::vector<std::string_view> parts = SplitOn(value, ':');
-    ok = parts.size() == 2 && ParseNumber(parts[0], &track->sar_num) && ParseNumber(parts[1], &track->sar_den);
-  }
+  else if (key == "sar") ok = ParseFields(SplitOn(value, ':'), &track->sar_num, &track->sar_den);
   if (!ok) return false;
   return track->fields.emplace(std::string(key), std::string(value)).second;  // a repeated key is malformed
 }
@@ -125,48 +135,34 @@ bool ParseExpectedLine(std::string_view line, FixtureExpectation* fx) {
 }
 
 bool ParseCueLine(std::string_view line, FixtureExpectation* fx) {
-  std::vector<std::string_view> parts = SplitOn(line, ' ');
   ExpectedCue cue{};
-  if (parts.size() != 4 || !ParseNumber(parts[0], &cue.time_ticks) || !ParseNumber(parts[1], &cue.track) ||
-      !ParseNumber(parts[2], &cue.cluster_position) || !ParseNumber(parts[3], &cue.block_number)) {
-    return false;
-  }
-  fx->cues.push_back(cue);
-  return true;
+  const bool ok = ParseFields(SplitOn(line, ' '), &cue.time_ticks, &cue.track, &cue.cluster_position, &cue.block_number);
+  if (ok) fx->cues.push_back(cue);
+  return ok;
 }
 
 bool ParseBlockLine(std::string_view line, FixtureExpectation* fx) {
   std::vector<std::string_view> parts = SplitOn(line, ' ');
   ExpectedBlock block{};
-  if (parts.size() != 5 || !ParseNumber(parts[0], &block.track) || !ParseNumber(parts[1], &block.ticks)) {
+  if (parts.size() != 5 || !ParseFields({parts[0], parts[1]}, &block.track, &block.ticks) ||
+      (parts[2] != "S" && parts[2] != "B") || (parts[3] != "0" && parts[3] != "1")) {
     return false;
   }
-  if (parts[2] != "S" && parts[2] != "B") return false;
-  if (parts[3] != "0" && parts[3] != "1") return false;
   block.simple = parts[2] == "S";
   block.key = parts[3] == "1";
   for (std::string_view entry : SplitOn(parts[4], ',')) {
-    std::vector<std::string_view> size_sum = SplitOn(entry, ':');
-    ExpectedFrame frame{};
-    if (size_sum.size() != 2 || size_sum[1].size() > 8 || !ParseNumber(size_sum[0], &frame.size) ||
-        !ParseNumber(size_sum[1], &frame.adler32, 16)) {
-      return false;
-    }
-    block.frames.push_back(frame);
+    ExpectedFrame& frame = block.frames.emplace_back();
+    if (!ParseFields(SplitOn(entry, ':'), &frame.size, Hex{&frame.adler32})) return false;
   }
   fx->blocks.push_back(std::move(block));
   return true;
 }
 
-bool ParseFullFrameLine(std::string_view line, std::vector<ExpectedFullFrame>* frames) {
-  std::vector<std::string_view> parts = SplitOn(line, ' ');
-  ExpectedFullFrame frame{};
-  if (parts.size() != 4 || parts[3].size() > 8 || !ParseNumber(parts[0], &frame.track) ||
-      !ParseNumber(parts[1], &frame.ticks) || !ParseNumber(parts[2], &frame.size) ||
-      !ParseNumber(parts[3], &frame.adler32, 16)) {
-    return false;
-  }
-  frames->push_back(frame);
+bool ParseFullFrameLine(std::string_view line, std::vector<ExpectedBlock>* frames) {
+  ExpectedBlock block{};
+  ExpectedFrame& frame = block.frames.emplace_back();
+  if (!ParseFields(SplitOn(line, ' '), &block.track, &block.ticks, &frame.size, Hex{&frame.adler32})) return false;
+  frames->push_back(std::move(block));
   return true;
 }
 
@@ -195,8 +191,8 @@ FixtureExpectation LoadFixture(const std::string& name) {
   return fx;
 }
 
-std::vector<ExpectedFullFrame> LoadFullFrames(const std::string& name) {
-  std::vector<ExpectedFullFrame> frames;
+std::vector<ExpectedBlock> LoadFullFrames(const std::string& name) {
+  std::vector<ExpectedBlock> frames;
   ForEachLine(name + ".frames", ReadTextOrFail(name + ".frames"),
               [&](std::string_view line) { return ParseFullFrameLine(line, &frames); });
   return frames;

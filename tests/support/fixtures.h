@@ -61,17 +61,6 @@ struct FixtureExpectation {
   std::vector<ExpectedBlock> blocks;                       // in file order
 };
 
-// One line of NAME.frames, written only for a fixture whose track is stored
-// with header removal: a frame of that track as a player must see it once the
-// removed prefix is put back (size and Adler-32 that mkvinfo reported for the
-// file before the prefix was removed), in file order.
-struct ExpectedFullFrame {
-  uint64_t track;
-  int64_t ticks;
-  uint32_t size;
-  uint32_t adler32;
-};
-
 // FILE in the fixture directory: $KELVANE_FIXTURES when set (drawn remuxes
 // are played that way), else the committed tests/fixtures.
 std::string FixturePath(const std::string& file);
@@ -84,8 +73,12 @@ std::vector<std::string> FixtureNames();
 // line is skipped.
 FixtureExpectation LoadFixture(const std::string& name);
 
-// Reads NAME.frames; failures are reported as LoadFixture reports them.
-std::vector<ExpectedFullFrame> LoadFullFrames(const std::string& name);
+// Reads NAME.frames, written only for a fixture whose track is stored with
+// header removal: its frames as a player must see them once the removed
+// prefix is put back (size and Adler-32 that mkvinfo reported for the file
+// before the prefix was removed), in file order, one block each. Failures are
+// reported as LoadFixture reports them.
+std::vector<ExpectedBlock> LoadFullFrames(const std::string& name);
 
 // The whole NAME.mkv; empty (with ADD_FAILURE) when it cannot be read.
 std::vector<uint8_t> ReadFixtureBytes(const std::string& name);
