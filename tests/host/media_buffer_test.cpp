@@ -166,28 +166,23 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
 
 TEST(MemoryPoolTest, WaitingAcquiresGetWhatAnotherThreadReleases) {
   host::MemoryPool pool(8, 1);
+  MmfMraPool* mras = host::MakeMraPool(1, 1);
   MmfPoolBuffer* held = pool.AcquireWaiting(0ms);
-  ASSERT_NE(held, nullptr);
+  MmfMra *mra = nullptr, *again = nullptr;
+  ASSERT_TRUE(held && MmfAcquireMra(mras, &mra, 0) == 0);
   EXPECT_EQ(pool.AcquireWaiting(1ms), nullptr);
-  std::thread releaser([held] {
+  // Each is released 20 ms after the wait for it began.
+  std::thread releaser([held, mra] {
     std::this_thread::sleep_for(20ms);
     Ops().ReleaseBuffer(held);
-  });
-  EXPECT_EQ(pool.AcquireWaiting(5s), held);
-  releaser.join();
-  Ops().ReleaseBuffer(held);
-
-  MmfMraPool* mras = host::MakeMraPool(1, 1);
-  MmfMra* mra = nullptr;
-  ASSERT_EQ(MmfAcquireMra(mras, &mra, 0), 0);
-  std::thread mra_releaser([mra] {
     std::this_thread::sleep_for(20ms);
     MmfReleaseMra(mra);
   });
-  MmfMra* again = nullptr;
+  EXPECT_EQ(pool.AcquireWaiting(5s), held);
   EXPECT_EQ(MmfAcquireMra(mras, &again, 0), 0);
-  mra_releaser.join();
+  releaser.join();
   EXPECT_EQ(again, mra);
+  Ops().ReleaseBuffer(held);
   MmfReleaseMra(again);
   MmfFreeMraPool(mras);
 }
