@@ -9,7 +9,6 @@
 #include <functional>
 #include <memory>
 #include <thread>
-#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -193,24 +192,21 @@ TEST(MemoryPoolTest, WaitingAcquiresGetWhatAnotherThreadReleases) {
 TEST(MediaBufferTest, ElementsOnOnePoolBufferKeepItUntilTheLastOfThemGoes) {
   MmfMraPool* mras = host::MakeMraPool(1, 4);
   host::MemoryPool bytes(256, 2);
-  enum Set { kPropertyAt, kOnA, kOnB };
-  struct Step {
-    Set set;
-    uint32_t index;
-    uint32_t a_references, b_references;  // the media buffer's, after the step
-  };
+  // A property ('p') or a one-byte frame on buffer 'a' or 'b' set at the index; the
+  // references the media buffer holds on a and b afterwards.
+  struct Step { char set; uint32_t index, a_references, b_references; };
   const struct {
     const char* name;
     std::vector<Step> steps;
   } cases[] = {
-      {"appended frames share one", {{kOnA, 0, 1, 0}, {kPropertyAt, 1, 1, 0}, {kOnA, 2, 1, 0}, {kOnA, 3, 1, 0}}},
+      {"appended frames share one", {{'a', 0, 1, 0}, {'p', 1, 1, 0}, {'a', 2, 1, 0}, {'a', 3, 1, 0}}},
       {"the holder replaced: a sharer takes over",
-       {{kOnA, 0, 1, 0}, {kOnA, 1, 1, 0}, {kOnA, 2, 1, 0}, {kPropertyAt, 0, 1, 0}, {kPropertyAt, 1, 1, 0}, {kPropertyAt, 2, 0, 0}}},
-      {"the holder replaced by another buffer's frame", {{kOnA, 0, 1, 0}, {kOnA, 1, 1, 0}, {kOnB, 0, 1, 1}, {kOnB, 1, 0, 2}}},
+       {{'a', 0, 1, 0}, {'a', 1, 1, 0}, {'a', 2, 1, 0}, {'p', 0, 1, 0}, {'p', 1, 1, 0}, {'p', 2, 0, 0}}},
+      {"the holder replaced by another buffer's frame", {{'a', 0, 1, 0}, {'a', 1, 1, 0}, {'b', 0, 1, 1}, {'b', 1, 0, 2}}},
       {"another buffer between: each run holds its own",
-       {{kOnA, 0, 1, 0}, {kOnB, 1, 1, 1}, {kOnA, 2, 2, 1}, {kPropertyAt, 0, 1, 1}, {kPropertyAt, 2, 0, 1}}},
-      {"a replaced frame on the same buffer", {{kOnA, 0, 1, 0}, {kOnA, 0, 1, 0}, {kOnA, 1, 2, 0}}},
-      {"the only holder replaced, then a frame appended", {{kOnA, 0, 1, 0}, {kPropertyAt, 0, 0, 0}, {kOnA, 1, 1, 0}}},
+       {{'a', 0, 1, 0}, {'b', 1, 1, 1}, {'a', 2, 2, 1}, {'p', 0, 1, 1}, {'p', 2, 0, 1}}},
+      {"a replaced frame on the same buffer", {{'a', 0, 1, 0}, {'a', 0, 1, 0}, {'a', 1, 2, 0}}},
+      {"the only holder replaced, then a frame appended", {{'a', 0, 1, 0}, {'p', 0, 0, 0}, {'a', 1, 1, 0}}},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
@@ -219,10 +215,9 @@ TEST(MediaBufferTest, ElementsOnOnePoolBufferKeepItUntilTheLastOfThemGoes) {
     ASSERT_TRUE(a && b && MmfAcquireMra(mras, &mra, kMmfAcquireNoWait) == 0);
     for (const Step& step : c.steps) {
       SCOPED_TRACE(step.index);
-      const int result = step.set == kPropertyAt ? MmfSetMraPropertyElement(mra, step.index, kMmfPropSkipMark, 0, 0)
-                         : step.set == kOnA      ? MmfSetMraBufferElement(mra, step.index, a, a->Data + step.index, 1)
-                                                 : MmfSetMraBufferElement(mra, step.index, b, b->Data + step.index, 1);
-      ASSERT_EQ(result, 0);
+      MmfPoolBuffer* on = step.set == 'a' ? a : b;
+      ASSERT_EQ(step.set == 'p' ? MmfSetMraPropertyElement(mra, step.index, kMmfPropSkipMark, 0, 0)
+                                : MmfSetMraBufferElement(mra, step.index, on, on->Data + step.index, 1), 0);
       EXPECT_EQ(host::BufferReferences(a), 1 + step.a_references);
       EXPECT_EQ(host::BufferReferences(b), 1 + step.b_references);
     }
