@@ -79,6 +79,7 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
       {"media buffer: its capacity", [&] { return mra->Capacity; }, 4},
       {"media buffer: none left", [&] { return MmfAcquireMra(mras, &none, kMmfAcquireNoWait); }, 11},
       {"media buffer: none handed out", [&] { return none != nullptr; }, 0},
+      {"media buffer: acquired into nothing", [&] { return MmfAcquireMra(mras, nullptr, kMmfAcquireNoWait); }, 22},
       {"media buffer: acquired empty", [&] { return MmfGetMraElementType(mra, 0, &kind) != 0; }, 1},
       {"element after a gap", [&] { return MmfSetMraPropertyElement(mra, 1, kMmfPropSkipMark, 0, 0); }, 28},
       {"element 0: a 48-bit offset", [&] { return MmfSetMraPropertyElement(mra, 0, kMmfPropFileOffset, 0xFFFFFFFF, 0xFFFF); }, 0},
