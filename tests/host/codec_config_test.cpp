@@ -1,16 +1,21 @@
 // Video configurations through MmParseDecoderConfig: records written by real
 // encoders (ffprobe's size and aspect ratio), headers written bit by bit for
-// what encoders rarely write, and damaged records. Every fixture's tracks are
-// compared with ffprobe in the fixture header test.
+// what encoders rarely write, and damaged records; and FLAC's STREAMINFO
+// unpacked into the decoder's record. Every fixture's tracks are compared with
+// ffprobe in the fixture header test.
 
 #include "platform/decoder_config.h"
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstdint>
+#include <cstring>
 #include <string>
 #include <vector>
 
+#include "core/flac_config.h"
+#include "core/status.h"
 #include "host/bit_reader.h"
 
 namespace {
@@ -53,7 +58,8 @@ Bytes EscapeRbsp(const Bytes& rbsp) {
   return out;
 }
 
-constexpr uint32_t kAvc1 = 0x41564331, kMp4v = 0x4D503456;
+// kFlac rows go to setup_flac_codec_config instead.
+constexpr uint32_t kAvc1 = 0x41564331, kMp4v = 0x4D503456, kFlac = 0x664C6143;
 
 // An H.264 SPS; 320x240 unless cropped. aspect_idc -1: no aspect_ratio_info, -2: no VUI.
 struct Sps {
@@ -138,18 +144,30 @@ const Bytes kMpeg4ExtendedPar = {0x00, 0x00, 0x01, 0xB0, 0x01, 0x00, 0x00, 0x01,
 const Bytes kMpeg4TablePar = {0x00, 0x00, 0x01, 0xB0, 0x01, 0x00, 0x00, 0x01, 0xB5, 0x89, 0x13, 0x00, 0x00, 0x01, 0x00, 0x00, 0x00, 0x01, 0x20, 0x00, 0xC4, 0xA5, 0x88, 0x00, 0xCD, 0x05, 0x84, 0x12, 0x14, 0x43, 0x00, 0x00, 0x01, 0xB2, 0x4C, 0x61, 0x76, 0x63};
 const Bytes kXvid = {0x00, 0x00, 0x01, 0xB0, 0x03, 0x00, 0x00, 0x01, 0xB5, 0x09, 0x00, 0x00, 0x01, 0x00, 0x00, 0x00, 0x01, 0x20, 0x00, 0xBC, 0x24, 0x1E, 0xC4, 0x00, 0x67, 0x0C, 0x16, 0x10, 0x48, 0x51, 0x8F, 0x00, 0x00, 0x01, 0xB2, 0x58, 0x76, 0x69, 0x44};
 
+// "fLaC" and a STREAMINFO flagged last: blocks 4096..4096, frames 14..5000 bytes,
+// 44100 Hz, 2 channels, 16 bits, 0x123456789 samples; then patched and resized.
+Bytes stream_header(std::initializer_list<std::pair<size_t, uint8_t>> patches = {}, size_t size = 42) {
+  Bytes bytes = {'f',  'L',  'a',  'C',  0x80, 0x00, 0x00, 0x22, 0x10, 0x00, 0x10, 0x00, 0x00,
+                 0x00, 0x0E, 0x00, 0x13, 0x88, 0x0A, 0xC4, 0x42, 0xF1, 0x23, 0x45, 0x67, 0x89};
+  bytes.resize(42, 0xEE);  // MD5
+  for (const auto& [offset, value] : patches) bytes[offset] = value;
+  bytes.resize(size, 0x00);
+  return bytes;
+}
+
 // A BITMAPINFOHEADER whose width bytes imitate a layer start code (00 00 01 20).
 Bytes bitmap_info() { return patched(patched(patched(patched(Bytes(40, 0), 0, 0x28), 6, 0x01), 7, 0x20), 8, 0x90); }
 
 // The record starts as 11x22 with pixels 33:44: a configuration not understood
-// leaves it so, and one without a pixel shape keeps those pixels.
+// leaves it so, and one without a pixel shape keeps those pixels. A FLAC row
+// expects words 0..6 of the decoder's record and the total samples.
 TEST(DecoderConfigTest, ConfigurationsGiveTheirPictureShape) {
   const struct {
     const char* name;
     Bytes config;
     uint32_t fourcc;
     bool understood;
-    MmDecoderConfigInfo shape;
+    std::vector<uint64_t> want;
   } cases[] = {
       {"x264 4:2:0 200x90 of 208x96, Extended_SAR", kAvc420, kAvc1, true, {200, 90, 97, 60}},
       {"x264 4:2:2", kAvc422, kAvc1, true, {200, 90, 3, 2}},
@@ -214,14 +232,51 @@ TEST(DecoderConfigTest, ConfigurationsGiveTheirPictureShape) {
       {"cut inside the height", cut(vol({}), 2), kMp4v, false, {11, 22, 33, 44}},
       {"time resolution 0", vol({.time_resolution = 0}), kMp4v, false, {11, 22, 33, 44}},
       {"fine granularity scalable layer", vol({.object_type = 0x12}), kMp4v, false, {11, 22, 33, 44}},
+      {"FLAC: the 42 bytes of a stream header", stream_header(), kFlac, true, {4096, 4096, 5000, 14, 44100, 2, 16, 0x123456789}},
+      {"FLAC: 41 bytes", stream_header({}, 41), kFlac, false, {}},
+      {"FLAC: maximum of each pair first", stream_header({{8, 0x00}, {9, 0x10}, {14, 0x0F}}), kFlac, true,
+       {4096, 16, 5000, 15, 44100, 2, 16, 0x123456789}},
+      {"FLAC: marker other than fLaC", stream_header({{3, 'c'}}), kFlac, false, {}},
+      {"FLAC: a comment block first", stream_header({{4, 0x04}}), kFlac, false, {}},
+      {"FLAC: block length 33", stream_header({{7, 0x21}}), kFlac, false, {}},
+      {"FLAC: block length 34 + 65536", stream_header({{5, 0x01}}), kFlac, false, {}},
+      {"FLAC: minimum block above maximum", stream_header({{8, 0x10}, {9, 0x01}}), kFlac, false, {}},
+      {"FLAC: minimum frame 14, maximum unknown", stream_header({{15, 0}, {16, 0}, {17, 0}}), kFlac, false, {}},
+      {"FLAC: both frame sizes unknown", stream_header({{14, 0}, {15, 0}, {16, 0}, {17, 0}}), kFlac, true,
+       {4096, 4096, 0, 0, 44100, 2, 16, 0x123456789}},
+      {"FLAC: sample rate 0", stream_header({{18, 0}, {19, 0}, {20, 0x02}}), kFlac, false, {}},
+      {"FLAC: 1 channel of 1 bit at 1 Hz", stream_header({{18, 0}, {19, 0}, {20, 0x10}, {21, 0x01}}), kFlac, true,
+       {4096, 4096, 5000, 14, 1, 1, 1, 0x123456789}},
+      {"FLAC: 36-bit sample count", stream_header({{21, 0xFF}, {22, 0xFF}, {23, 0xFF}, {24, 0xFF}, {25, 0xFF}}), kFlac, true,
+       {4096, 4096, 5000, 14, 44100, 2, 16, 0xFFFFFFFFF}},
   };
   for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    if (c.fourcc == kFlac) {
+      // A 1128-byte stand-in for the media format; the record belongs at bytes
+      // 28..75, in the machine-order words the decoder reads; nothing else changes.
+      Bytes format(1128, 0xA5), want = format;
+      if (c.understood) {
+        uint32_t words[12] = {};
+        std::copy(c.want.begin(), c.want.begin() + 7, words);
+        words[10] = 1;
+        std::memcpy(&want[28], words, sizeof words);
+        std::memcpy(&want[28 + 32], &c.want[7], sizeof c.want[7]);
+      }
+      uint8_t* extra_ptr = format.data();  // left from an earlier set-up
+      uint32_t extra_size = 99;
+      EXPECT_EQ(setup_flac_codec_config(format.data() + kFlacConfigFormatOffset, &extra_ptr, &extra_size, c.config.data(),
+                                        static_cast<uint32_t>(c.config.size())),
+                c.understood ? kStatusOk : kStatusInvalidArgument);
+      EXPECT_EQ(extra_ptr, c.understood ? format.data() + 28 : nullptr);
+      EXPECT_EQ(extra_size, c.understood ? 48u : 0u);
+      EXPECT_EQ(format, want);
+      continue;
+    }
     MmDecoderConfigInfo info = {11, 22, 33, 44};
     EXPECT_EQ(MmParseDecoderConfig(c.config.data(), static_cast<uint32_t>(c.config.size()), c.fourcc, &info, 0) == 0,
-              c.understood) << c.name;
-    EXPECT_EQ(std::vector<uint32_t>({info.Width, info.Height, info.PixelAspectWidth, info.PixelAspectHeight}),
-              std::vector<uint32_t>({c.shape.Width, c.shape.Height, c.shape.PixelAspectWidth, c.shape.PixelAspectHeight}))
-        << c.name;
+              c.understood);
+    EXPECT_EQ(std::vector<uint64_t>({info.Width, info.Height, info.PixelAspectWidth, info.PixelAspectHeight}), c.want);
   }
   EXPECT_NE(MmParseDecoderConfig(nullptr, 0, kAvc1, nullptr, 0), 0);
 }

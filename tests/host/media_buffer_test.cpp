@@ -9,7 +9,6 @@
 #include <functional>
 #include <memory>
 #include <thread>
-#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -80,6 +79,7 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
       {"media buffer: its capacity", [&] { return mra->Capacity; }, 4},
       {"media buffer: none left", [&] { return MmfAcquireMra(mras, &none, kMmfAcquireNoWait); }, 11},
       {"media buffer: none handed out", [&] { return none != nullptr; }, 0},
+      {"media buffer: acquired into nothing", [&] { return MmfAcquireMra(mras, nullptr, kMmfAcquireNoWait); }, 22},
       {"media buffer: acquired empty", [&] { return MmfGetMraElementType(mra, 0, &kind) != 0; }, 1},
       {"element after a gap", [&] { return MmfSetMraPropertyElement(mra, 1, kMmfPropSkipMark, 0, 0); }, 28},
       {"element 0: a 48-bit offset", [&] { return MmfSetMraPropertyElement(mra, 0, kMmfPropFileOffset, 0xFFFFFFFF, 0xFFFF); }, 0},
@@ -166,28 +166,23 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
 
 TEST(MemoryPoolTest, WaitingAcquiresGetWhatAnotherThreadReleases) {
   host::MemoryPool pool(8, 1);
+  MmfMraPool* mras = host::MakeMraPool(1, 1);
   MmfPoolBuffer* held = pool.AcquireWaiting(0ms);
-  ASSERT_NE(held, nullptr);
+  MmfMra *mra = nullptr, *again = nullptr;
+  ASSERT_TRUE(held && MmfAcquireMra(mras, &mra, 0) == 0);
   EXPECT_EQ(pool.AcquireWaiting(1ms), nullptr);
-  std::thread releaser([held] {
+  // Each is released 20 ms after the wait for it began.
+  std::thread releaser([held, mra] {
     std::this_thread::sleep_for(20ms);
     Ops().ReleaseBuffer(held);
-  });
-  EXPECT_EQ(pool.AcquireWaiting(5s), held);
-  releaser.join();
-  Ops().ReleaseBuffer(held);
-
-  MmfMraPool* mras = host::MakeMraPool(1, 1);
-  MmfMra* mra = nullptr;
-  ASSERT_EQ(MmfAcquireMra(mras, &mra, 0), 0);
-  std::thread mra_releaser([mra] {
     std::this_thread::sleep_for(20ms);
     MmfReleaseMra(mra);
   });
-  MmfMra* again = nullptr;
+  EXPECT_EQ(pool.AcquireWaiting(5s), held);
   EXPECT_EQ(MmfAcquireMra(mras, &again, 0), 0);
-  mra_releaser.join();
+  releaser.join();
   EXPECT_EQ(again, mra);
+  Ops().ReleaseBuffer(held);
   MmfReleaseMra(again);
   MmfFreeMraPool(mras);
 }
@@ -198,24 +193,21 @@ TEST(MemoryPoolTest, WaitingAcquiresGetWhatAnotherThreadReleases) {
 TEST(MediaBufferTest, ElementsOnOnePoolBufferKeepItUntilTheLastOfThemGoes) {
   MmfMraPool* mras = host::MakeMraPool(1, 4);
   host::MemoryPool bytes(256, 2);
-  enum Set { kPropertyAt, kOnA, kOnB };
-  struct Step {
-    Set set;
-    uint32_t index;
-    uint32_t a_references, b_references;  // the media buffer's, after the step
-  };
+  // A property ('p') or a one-byte frame on buffer 'a' or 'b' set at the index; the
+  // references the media buffer holds on a and b afterwards.
+  struct Step { char set; uint32_t index, a_references, b_references; };
   const struct {
     const char* name;
     std::vector<Step> steps;
   } cases[] = {
-      {"appended frames share one", {{kOnA, 0, 1, 0}, {kPropertyAt, 1, 1, 0}, {kOnA, 2, 1, 0}, {kOnA, 3, 1, 0}}},
+      {"appended frames share one", {{'a', 0, 1, 0}, {'p', 1, 1, 0}, {'a', 2, 1, 0}, {'a', 3, 1, 0}}},
       {"the holder replaced: a sharer takes over",
-       {{kOnA, 0, 1, 0}, {kOnA, 1, 1, 0}, {kOnA, 2, 1, 0}, {kPropertyAt, 0, 1, 0}, {kPropertyAt, 1, 1, 0}, {kPropertyAt, 2, 0, 0}}},
-      {"the holder replaced by another buffer's frame", {{kOnA, 0, 1, 0}, {kOnA, 1, 1, 0}, {kOnB, 0, 1, 1}, {kOnB, 1, 0, 2}}},
+       {{'a', 0, 1, 0}, {'a', 1, 1, 0}, {'a', 2, 1, 0}, {'p', 0, 1, 0}, {'p', 1, 1, 0}, {'p', 2, 0, 0}}},
+      {"the holder replaced by another buffer's frame", {{'a', 0, 1, 0}, {'a', 1, 1, 0}, {'b', 0, 1, 1}, {'b', 1, 0, 2}}},
       {"another buffer between: each run holds its own",
-       {{kOnA, 0, 1, 0}, {kOnB, 1, 1, 1}, {kOnA, 2, 2, 1}, {kPropertyAt, 0, 1, 1}, {kPropertyAt, 2, 0, 1}}},
-      {"a replaced frame on the same buffer", {{kOnA, 0, 1, 0}, {kOnA, 0, 1, 0}, {kOnA, 1, 2, 0}}},
-      {"the only holder replaced, then a frame appended", {{kOnA, 0, 1, 0}, {kPropertyAt, 0, 0, 0}, {kOnA, 1, 1, 0}}},
+       {{'a', 0, 1, 0}, {'b', 1, 1, 1}, {'a', 2, 2, 1}, {'p', 0, 1, 1}, {'p', 2, 0, 1}}},
+      {"a replaced frame on the same buffer", {{'a', 0, 1, 0}, {'a', 0, 1, 0}, {'a', 1, 2, 0}}},
+      {"the only holder replaced, then a frame appended", {{'a', 0, 1, 0}, {'p', 0, 0, 0}, {'a', 1, 1, 0}}},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
@@ -224,10 +216,9 @@ TEST(MediaBufferTest, ElementsOnOnePoolBufferKeepItUntilTheLastOfThemGoes) {
     ASSERT_TRUE(a && b && MmfAcquireMra(mras, &mra, kMmfAcquireNoWait) == 0);
     for (const Step& step : c.steps) {
       SCOPED_TRACE(step.index);
-      const int result = step.set == kPropertyAt ? MmfSetMraPropertyElement(mra, step.index, kMmfPropSkipMark, 0, 0)
-                         : step.set == kOnA      ? MmfSetMraBufferElement(mra, step.index, a, a->Data + step.index, 1)
-                                                 : MmfSetMraBufferElement(mra, step.index, b, b->Data + step.index, 1);
-      ASSERT_EQ(result, 0);
+      MmfPoolBuffer* on = step.set == 'a' ? a : b;
+      ASSERT_EQ(step.set == 'p' ? MmfSetMraPropertyElement(mra, step.index, kMmfPropSkipMark, 0, 0)
+                                : MmfSetMraBufferElement(mra, step.index, on, on->Data + step.index, 1), 0);
       EXPECT_EQ(host::BufferReferences(a), 1 + step.a_references);
       EXPECT_EQ(host::BufferReferences(b), 1 + step.b_references);
     }

@@ -11,13 +11,9 @@ namespace testing_support {
 struct Adler32Sum {
   uint32_t a = 1, b = 0;
   Adler32Sum& update(const uint8_t* data, size_t size) {
-    while (size > 0) {
-      // 5552 is the longest run whose sums cannot overflow 32 bits before the reduction.
-      size_t run = size < 5552 ? size : 5552;
-      size -= run;
-      for (; run > 0; --run) b += a += *data++;
-      a %= 65521;
-      b %= 65521;
+    for (size_t i = 0; i < size; ++i) {
+      a = (a + data[i]) % 65521;
+      b = (b + a) % 65521;
     }
     return *this;
   }

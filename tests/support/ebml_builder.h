@@ -3,6 +3,7 @@
 //   master(kSegment, {master(kInfo, {uinteger(kTimecodeScale, 1000000)})})
 // Sizes are written in their shortest form unless a width is given.
 
+#include <bit>
 #include <cstdint>
 #include <initializer_list>
 #include <string_view>
@@ -40,25 +41,64 @@ enum : uint32_t {
 // The EBML unknown-size value, as an 8-byte size field writes it.
 constexpr uint64_t kUnknownSize = 0x00FFFFFFFFFFFFFF;
 
-Bytes id_bytes(uint32_t id);
-// A size field; width 0 picks the shortest that holds the value.
-Bytes size_bytes(uint64_t size, int width = 0);
+// The low `width` bytes of `value`, most significant first.
+inline Bytes big_endian(uint64_t value, int width) {
+  Bytes out(static_cast<size_t>(width));
+  for (int i = width - 1; i >= 0; --i, value >>= 8) out[static_cast<size_t>(i)] = static_cast<uint8_t>(value);
+  return out;
+}
 
-Bytes element(uint32_t id, const Bytes& payload, int size_width = 0);
-Bytes master(uint32_t id, std::initializer_list<Bytes> children);
+inline Bytes id_bytes(uint32_t id) { return big_endian(id, id > 0xFFFFFF ? 4 : id > 0xFFFF ? 3 : id > 0xFF ? 2 : 1); }
+
+// A size field; width 0 picks the shortest that holds the value.
+inline Bytes size_bytes(uint64_t size, int width = 0) {
+  if (width == 0) {
+    width = 1;
+    // All ones in the value bits would read as "unknown": go one byte wider.
+    while (width < 8 && size >= (uint64_t{1} << (7 * width)) - 1) ++width;
+  }
+  Bytes out = big_endian(size, width);
+  out[0] |= static_cast<uint8_t>(0x80 >> (width - 1));
+  return out;
+}
+
+inline Bytes cat(std::initializer_list<Bytes> parts) {
+  Bytes out;
+  for (const Bytes& part : parts) out.insert(out.end(), part.begin(), part.end());
+  return out;
+}
+
+inline Bytes element(uint32_t id, const Bytes& payload, int size_width = 0) {
+  return cat({id_bytes(id), size_bytes(payload.size(), size_width), payload});
+}
+inline Bytes master(uint32_t id, std::initializer_list<Bytes> children) { return element(id, cat(children)); }
 // A master whose size field claims `size` whatever the children add up to.
-Bytes master_sized(uint32_t id, uint64_t size, std::initializer_list<Bytes> children, int size_width = 0);
-Bytes unknown_size(uint32_t id, std::initializer_list<Bytes> children);
-Bytes uinteger(uint32_t id, uint64_t value, int width = 0);  // width 0: shortest, at least one byte
-Bytes sinteger(uint32_t id, int64_t value, int width);
-Bytes str(uint32_t id, std::string_view text);
-Bytes f64(uint32_t id, double value);
-Bytes bin(uint32_t id, const Bytes& payload);
-Bytes cat(std::initializer_list<Bytes> parts);
+inline Bytes master_sized(uint32_t id, uint64_t size, std::initializer_list<Bytes> children, int size_width = 0) {
+  return cat({id_bytes(id), size_bytes(size, size_width), cat(children)});
+}
+inline Bytes unknown_size(uint32_t id, std::initializer_list<Bytes> children) {
+  return master_sized(id, kUnknownSize, children, 8);
+}
+// width 0: shortest, at least one byte
+inline Bytes uinteger(uint32_t id, uint64_t value, int width = 0) {
+  if (width == 0) {
+    width = 1;
+    while (width < 8 && (value >> (8 * width)) != 0) ++width;
+  }
+  return element(id, big_endian(value, width));
+}
+inline Bytes sinteger(uint32_t id, int64_t value, int width) { return element(id, big_endian(static_cast<uint64_t>(value), width)); }
+inline Bytes str(uint32_t id, std::string_view text) { return element(id, Bytes(text.begin(), text.end())); }
+inline Bytes f64(uint32_t id, double value) { return element(id, big_endian(std::bit_cast<uint64_t>(value), 8)); }
+inline Bytes bin(uint32_t id, const Bytes& payload) { return element(id, payload); }
 // n bytes of `fill`.
-Bytes filler(size_t n, uint8_t fill = 0);
+inline Bytes filler(size_t n, uint8_t fill = 0) { return Bytes(n, fill); }
 
 // An EBML header with the usual versions and the given DocType.
-Bytes ebml_header(std::string_view doc_type = "matroska");
+inline Bytes ebml_header(std::string_view doc_type = "matroska") {
+  return master(kEbmlHeader, {uinteger(kEbmlVersion, 1), uinteger(kEbmlReadVersion, 1), uinteger(kEbmlMaxIdLength, 4),
+                              uinteger(kEbmlMaxSizeLength, 8), str(kDocType, doc_type), uinteger(kDocTypeVersion, 4),
+                              uinteger(kDocTypeReadVersion, 2)});
+}
 
 }  // namespace ebml
