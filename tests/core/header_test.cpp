@@ -64,15 +64,11 @@ void walk(const mkv_queue& queue, Each each) {
 
 std::string info_of(const mkv_file_info& i) {
   const char* none = nullptr;
-  return Fields{}
-      .add("scale", i.timecode_scale, uint64_t{1000000})
-      .add("duration", i.duration, 0.0)
-      .add("date", i.date_utc, int64_t{0})
-      .add("uid", n(i.segment_uid[0]) + ".." + n(i.segment_uid[15]), std::string("0..0"))
-      .add("title", (const char*)i.title, none)
-      .add("file", (const char*)i.segment_filename, none)
-      .add("unmet", !(i.parse_flags & kMetInfo), false)
-      .done();
+  Fields f;
+  f.add("scale", i.timecode_scale, uint64_t{1000000}).add("duration", i.duration, 0.0).add("date", i.date_utc, int64_t{0});
+  f.add("uid", n(i.segment_uid[0]) + ".." + n(i.segment_uid[15]), std::string("0..0"));
+  f.add("title", (const char*)i.title, none).add("file", (const char*)i.segment_filename, none);
+  return f.add("unmet", !(i.parse_flags & kMetInfo), false).done();
 }
 
 // The first track's fields and its encodings as order/scope/settings size (k: a key ID).
@@ -583,25 +579,19 @@ TEST(HeaderParseTest, MetadataListFollowsTheFile) {
     const int64_t live = host::LiveBlockCount();
     auto* list = mem_new_zeroed<mkv_metadata_list>();
     ASSERT_NE(list, nullptr);
-    {
-      HeaderParseOptions options = c.options;
-      options.metadata = list;
-      HeaderParse parse(c.file, options);
-      ASSERT_EQ(parse.Parse(), kParseSucceeded);
-    }
+    HeaderParseOptions options = c.options;
+    options.metadata = list;
+    ASSERT_EQ(HeaderParse(c.file, options).Parse(), kParseSucceeded);
     Strings entries;
     for (int i = 0; i < list->entry_count; ++i) {
+      const uint32_t type = list->value_type[i];
+      const int32_t size = list->value_size[i];
       uint32_t num4 = 0;
       int64_t num8 = 0;
       std::string entry = std::string(list->key[i]) + " ";
-      if (list->value_type[i] == kMetadataTypeNum4 && list->value_size[i] == 4) {
-        entry += "NUM4 " + n((std::memcpy(&num4, list->value[i], 4), num4));
-      } else if (list->value_type[i] == kMetadataTypeNum8 && list->value_size[i] == 8) {
-        entry += "NUM8 " + n((std::memcpy(&num8, list->value[i], 8), num8));
-      } else {
-        entry += (list->value_type[i] == kMetadataTypeUtf8 ? "UTF8 " : "type " + n(list->value_type[i]) + " ") +
-                 std::string(static_cast<const char*>(list->value[i]), size_t(list->value_size[i]));
-      }
+      if (type == kMetadataTypeNum4 && size == 4) entry += "NUM4 " + n((std::memcpy(&num4, list->value[i], 4), num4));
+      else if (type == kMetadataTypeNum8 && size == 8) entry += "NUM8 " + n((std::memcpy(&num8, list->value[i], 8), num8));
+      else entry += (type == kMetadataTypeUtf8 ? "UTF8 " : "type " + n(type) + " ") + std::string((const char*)list->value[i], size_t(size));
       entries.push_back(entry);
     }
     EXPECT_EQ(list->key[list->entry_count], nullptr);

@@ -46,14 +46,9 @@ struct BitWriter {
 // An H.264 RBSP as a NAL unit payload: 03 after every 00 00 that precedes 00..03.
 Bytes EscapeRbsp(const Bytes& rbsp) {
   Bytes out;
-  int zeros = 0;
   for (uint8_t byte : rbsp) {
-    if (zeros >= 2 && byte <= 3) {
-      out.push_back(3);
-      zeros = 0;
-    }
+    if (out.size() >= 2 && out.end()[-1] == 0 && out.end()[-2] == 0 && byte <= 3) out.push_back(3);
     out.push_back(byte);
-    zeros = byte == 0 ? zeros + 1 : 0;
   }
   return out;
 }

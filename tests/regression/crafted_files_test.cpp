@@ -47,10 +47,7 @@ Bytes LacedBlock(uint8_t lacing, uint8_t frame_count_minus_1, const Bytes& sizes
 }
 
 // Where a crafted child goes: first child of the master with this ID (0: none).
-struct Insert {
-  uint32_t into = 0;
-  Bytes child = {};
-};
+struct Insert { uint32_t into = 0; Bytes child = {}; };
 
 // A master that takes the insert as its first child when it is the target.
 Bytes In(const Insert& insert, uint32_t id, std::initializer_list<Bytes> children) {

@@ -16,11 +16,7 @@ namespace {
 // One step: 'S'eek (its answer), 'R'ead n bytes (how many came, -1 for
 // kVstreamFailed; they must be the file's), 'T'ell, bytes 'A'vailable, or the
 // input's counters so far: 'N' reads, 'B' bytes read, 'K' seeks.
-struct Step {
-  char op;
-  uint64_t arg;
-  int64_t want;
-};
+struct Step { char op; uint64_t arg; int64_t want; };
 
 TEST(VstreamTest, ModesBufferSeekAndReadAsConfigured) {
   const struct {
