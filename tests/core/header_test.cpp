@@ -181,9 +181,7 @@ Bytes info_with_title(std::string_view title) { return master(kInfo, {uinteger(k
 Bytes entry(uint64_t number, uint64_t type = 2) { return master(kTrackEntry, {uinteger(kTrackNumber, number), uinteger(kTrackType, type)}); }
 Bytes one_track() { return master(kTracks, {entry(1)}); }
 Bytes nested_chapters(int depth, const Bytes& innermost) {
-  Bytes inner = innermost;
-  for (int i = 0; i < depth; ++i) inner = element(kChapters, inner);
-  return inner;
+  return depth ? element(kChapters, nested_chapters(depth - 1, innermost)) : innermost;
 }
 // List i holds i + 1 entries.
 Bytes seek_heads(int count) { return repeat(count, [](int i) { return element(kSeekHead, repeat(i + 1, [](int k) { return seek(kInfo, uint64_t(k)); })); }); }
@@ -204,44 +202,42 @@ Bytes cues() { return master(kCues, {point(0, position(1, 300, ref(1))), point(4
 // A byte that cannot start an ID: reading it ends the walk of the Segment.
 Bytes trap() { return Bytes{0x00, 0x00, 0x00}; }
 
-// EBML header, then a Segment of a SeekHead listing each part under the given
-// ID (0: not listed) and the parts in order, the Segment's size ending after
+// EBML header, then a Segment of a SeekHead listing each part under the ID
+// `listed` gives it (0 or none: not listed) and the parts in order, the Segment's size ending after
 // the first `inside` parts. Seek positions are written 8 bytes wide, so the
 // SeekHead's size never depends on them; `tail` ends the SeekHead.
-Bytes indexed(const std::vector<std::pair<Bytes, uint32_t>>& parts, const Bytes& tail = {}, size_t inside = SIZE_MAX) {
+Bytes indexed(const std::vector<Bytes>& parts, std::vector<uint32_t> listed, const Bytes& tail = {}, size_t inside = SIZE_MAX) {
+  listed.resize(parts.size());
   auto seek_head = [&](uint64_t start) {
     Bytes payload;
-    for (const auto& [bytes, listed_as] : parts) {
-      if (listed_as) payload = cat({payload, master(kSeek, {element(kSeekId, id_bytes(listed_as)), uinteger(kSeekPosition, start, 8)})});
-      start += bytes.size();
+    for (size_t i = 0; i < parts.size(); start += parts[i++].size()) {
+      if (listed[i]) payload = cat({payload, master(kSeek, {element(kSeekId, id_bytes(listed[i])), uinteger(kSeekPosition, start, 8)})});
     }
     return element(kSeekHead, cat({payload, tail}), 8);
   };
   Bytes segment = seek_head(seek_head(0).size()), outside;
   for (size_t i = 0; i < parts.size(); ++i) {
     Bytes& into = i < inside ? segment : outside;
-    into = cat({into, parts[i].first});
+    into = cat({into, parts[i]});
   }
   return cat({ebml_header(), element(kSegment, segment, 8), outside});
 }
 // Info, Tracks, two Clusters, Tags MIDDLE, a trap, a Cluster, Cues and Tags END,
 // listed as given: what was read behind the trap was jumped to.
-Bytes jumps(std::vector<uint32_t> listed, const Bytes& tail = {}, size_t inside = SIZE_MAX) {
-  listed.resize(9);
-  const Bytes parts[] = {info_with_title("t"), tracks(1), cluster(0, 2000), cluster(1, 2000), tags("MIDDLE"),
-                         trap(), cluster(3, 2000), cues(), tags("END")};
-  std::vector<std::pair<Bytes, uint32_t>> listed_parts;
-  for (size_t i = 0; i < 9; ++i) listed_parts.emplace_back(parts[i], listed[i]);
-  return indexed(listed_parts, tail, inside);
+Bytes jumps(const std::vector<uint32_t>& listed, const Bytes& tail = {}, size_t inside = SIZE_MAX) {
+  return indexed({info_with_title("t"), tracks(1), cluster(0, 2000), cluster(1, 2000), tags("MIDDLE"), trap(), cluster(3, 2000),
+                  cues(), tags("END")},
+                 listed, tail, inside);
 }
 // Info, Tracks, `clusters` Clusters of 64 KiB, Cues, Tags, listed or not.
 Bytes long_file(int clusters, bool listed) {
-  const uint32_t no = 0;
-  std::vector<std::pair<Bytes, uint32_t>> parts = {{info_with_title("t"), listed ? kInfo : no}, {tracks(1), listed ? kTracks : no}};
-  for (int i = 0; i < clusters; ++i) parts.emplace_back(cluster(uint64_t(i), 64 * 1024), no);
-  parts.emplace_back(cues(), listed ? kCues : no);
-  parts.emplace_back(tags("END"), listed ? kTags : no);
-  return indexed(parts);
+  std::vector<Bytes> parts = {info_with_title("t"), tracks(1)};
+  for (int i = 0; i < clusters; ++i) parts.push_back(cluster(uint64_t(i), 64 * 1024));
+  parts.insert(parts.end(), {cues(), tags("END")});
+  std::vector<uint32_t> ids = {kInfo, kTracks};
+  ids.resize(parts.size() - 2);
+  ids.insert(ids.end(), {kCues, kTags});
+  return indexed(parts, listed ? ids : std::vector<uint32_t>{});
 }
 
 const char* const kReadError = "5 Error Reading at line *";
@@ -611,9 +607,9 @@ TEST(HeaderParseTest, EveryFailedAllocationIsAnswered) {
       bin(kCodecPrivate, {1, 2, 3}), str(kCodecName, "codec"),
       master(kContentEncoding, {bin(kContentCompSettings, {1}), bin(kContentEncKeyId, {2}), bin(kContentSignature, {3}), bin(kContentSigKeyId, {4})}),
       master(kContentEncoding, {bin(kContentCompSettings, {5})}), str(kName, "renamed")});
-  const Bytes bytes = indexed({{master(kInfo, {str(kTitle, "t"), str(kSegmentFilename, "f")}), kInfo},
-                               {element(kTracks, cat({rich_track, track_entries(2)})), kTracks}, {cluster(0, 600), 0}, {cues(), kCues},
-                               {mixed_tags(7), kTags}});
+  const Bytes bytes = indexed({master(kInfo, {str(kTitle, "t"), str(kSegmentFilename, "f")}), element(kTracks, cat({rich_track, track_entries(2)})),
+                               cluster(0, 600), cues(), mixed_tags(7)},
+                              {kInfo, kTracks, 0, kCues, kTags});
   uint64_t all = 0;  // allocations of the whole parse
   int32_t full_list = 0;
   {
