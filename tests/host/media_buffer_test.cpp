@@ -37,7 +37,7 @@ MmfPoolBuffer* Acquire(host::MemoryPool& pool) {
 TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
   auto pool = std::make_unique<host::MemoryPool>(256, 2);
   host::MemoryPool one(16, 1);
-  MmfMraPool* mras = host::MakeMraPool(1, 4);
+  MmfMraPool *mras = host::MakeMraPool(1, 4), *channel_pool = nullptr;
   const uint8_t file[100] = {};
   auto source = host::MakeMemoryStream(file, sizeof file, true);
   auto memory = host::MakeMemoryStream(file, sizeof file, true), pipe = host::MakeMemoryStream(file, 50, false);
@@ -51,7 +51,6 @@ TEST(FrameworkAnswersTest, EveryCallGetsItsStatus) {
   input.Direction = kMmfDirectionInput;
   MmfPoolBuffer *a = nullptr, *b = nullptr, *c = nullptr, *held = nullptr;
   MmfMra *mra = nullptr, *none = nullptr, *from_channel = nullptr, *small = nullptr;
-  MmfMraPool* channel_pool = nullptr;
   MmfReadList* list = nullptr;
   MmfClock* clock_handle = nullptr;
   const MmfClockOps* clock_ops = nullptr;
