@@ -102,8 +102,7 @@ Bytes avc(const Sps& s) { return avc_record(sps_nal(s)); }
 struct Vol {
   uint32_t object_type = 1, verid = 0, aspect = 3, par = 0;  // verid 0: no layer identifier
   bool vbv = false;
-  uint32_t shape = 0, time_resolution = 25;
-  unsigned increment_bits = 0;  // 0: no fixed rate
+  uint32_t shape = 0, time_resolution = 25, increment_bits = 0;  // increment_bits 0: no fixed rate
   uint8_t code = 0x20;
 };
 
