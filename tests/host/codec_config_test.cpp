@@ -58,9 +58,8 @@ constexpr uint32_t kAvc1 = 0x41564331, kMp4v = 0x4D503456, kFlac = 0x664C6143;
 
 // An H.264 SPS; 320x240 unless cropped. aspect_idc -1: no aspect_ratio_info, -2: no VUI.
 struct Sps {
-  uint32_t chroma_format_idc = 1;
-  bool scaling_lists = false;
-  uint32_t bit_depth_minus8 = 0, poc_type = 0, poc_cycle = 3, crop_right = 0, width_in_mbs = 20, level = 40, id = 0;
+  uint32_t chroma_format_idc = 1, scaling_lists = 0, bit_depth_minus8 = 0, poc_type = 0, poc_cycle = 3, crop_right = 0;
+  uint32_t width_in_mbs = 20, level = 40, id = 0;
   int aspect_idc = 14;
   uint32_t sar_width = 0, sar_height = 0;
 };
@@ -100,10 +99,8 @@ Bytes avc(const Sps& s) { return avc_record(sps_nal(s)); }
 
 // An MPEG-4 VideoObjectLayer with its start code; 352x288 when rectangular.
 struct Vol {
-  uint32_t object_type = 1, verid = 0, aspect = 3, par = 0;  // verid 0: no layer identifier
-  bool vbv = false;
-  uint32_t shape = 0, time_resolution = 25, increment_bits = 0;  // increment_bits 0: no fixed rate
-  uint8_t code = 0x20;
+  uint32_t object_type = 1, verid = 0, aspect = 3, par = 0, vbv = 0;  // verid 0: no layer identifier
+  uint32_t shape = 0, time_resolution = 25, increment_bits = 0, code = 0x20;  // increment_bits 0: no fixed rate
 };
 
 Bytes vol(const Vol& v) {
