@@ -193,10 +193,7 @@ TEST(MediaBufferTest, ElementsOnOnePoolBufferKeepItUntilTheLastOfThemGoes) {
   // A property ('p') or a one-byte frame on buffer 'a' or 'b' set at the index; the
   // references the media buffer holds on a and b afterwards.
   struct Step { char set; uint32_t index, a_references, b_references; };
-  const struct {
-    const char* name;
-    std::vector<Step> steps;
-  } cases[] = {
+  const struct { const char* name; std::vector<Step> steps; } cases[] = {
       {"appended frames share one", {{'a', 0, 1, 0}, {'p', 1, 1, 0}, {'a', 2, 1, 0}, {'a', 3, 1, 0}}},
       {"the holder replaced: a sharer takes over",
        {{'a', 0, 1, 0}, {'a', 1, 1, 0}, {'a', 2, 1, 0}, {'p', 0, 1, 0}, {'p', 1, 1, 0}, {'p', 2, 0, 0}}},
