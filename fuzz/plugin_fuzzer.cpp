@@ -22,8 +22,8 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
-#include <cstring>
 #include <memory>
 #include <string>
 #include <thread>
@@ -64,6 +64,7 @@ std::string scratch_path;
 // input, or the stopped state.
 bool SpecifiedEnd(int result) { return OneOf(result, {1, kMmfEndOfStream, 4, 16}); }
 bool SpecifiedControl(int result) { return OneOf(result, {0, kMmfStoppedAfterError}); }
+bool SpecifiedScan(int result) { return OneOf(result, {0, 48, kMmfInvalidArgument, kMmfNotAvailable, 12}); }
 
 struct Command {
   enum Kind { kSeek, kPause, kResume, kScanForward, kScanBackward, kScanEnd, kFlush, kWait, kStop };
@@ -110,11 +111,9 @@ Header ReadHeader(const uint8_t* data, size_t size) {
 // Where the file starts: at the EBML magic near the front, else after a fixed header.
 size_t FileStart(const uint8_t* data, size_t size) {
   static const uint8_t kMagic[] = {0x1A, 0x45, 0xDF, 0xA3};
-  const size_t limit = std::min(size, kHeaderSearch + sizeof kMagic);
-  for (size_t i = 0; i + sizeof kMagic <= limit; ++i) {
-    if (std::memcmp(data + i, kMagic, sizeof kMagic) == 0) return i;
-  }
-  return std::min(size, kHeaderWithoutMagic);
+  const uint8_t* end = data + std::min(size, kHeaderSearch + sizeof kMagic);
+  const uint8_t* magic = std::search(data, end, std::begin(kMagic), std::end(kMagic));
+  return magic != end ? static_cast<size_t>(magic - data) : std::min(size, kHeaderWithoutMagic);
 }
 
 // A delivered media buffer: each buffer element inside the buffer it names;
@@ -141,7 +140,6 @@ uint64_t CheckedLastTime(MmfMra* mra) {
 // The commands both modes send the same way, through the playback controller,
 // each answer checked. False for the ones each mode does its own way.
 bool ApplyControlCommand(host::PlaybackControl& playback, const Command& command) {
-  const std::initializer_list<int> scan_answers = {0, 48, kMmfInvalidArgument, kMmfNotAvailable, 12};
   switch (command.kind) {
     case Command::kSeek:
       Check(OneOf(playback.Seek(command.time_us), {0, kMmfNoConversion}), "seek");
@@ -152,13 +150,12 @@ bool ApplyControlCommand(host::PlaybackControl& playback, const Command& command
       return true;
     case Command::kScanForward:
     case Command::kScanBackward:
-      Check(OneOf(command.kind == Command::kScanForward ? playback.ScanForward(command.speed)
-                                                        : playback.ScanBackward(command.speed),
-                  scan_answers),
+      Check(SpecifiedScan(command.kind == Command::kScanForward ? playback.ScanForward(command.speed)
+                                                                : playback.ScanBackward(command.speed)),
             "scan");
       return true;
     case Command::kScanEnd:
-      Check(OneOf(playback.ScanEnd(), scan_answers), "scan end");
+      Check(SpecifiedScan(playback.ScanEnd()), "scan end");
       return true;
     default:
       return false;
@@ -265,7 +262,7 @@ void PlayThreaded(const uint8_t* file, size_t size, const Header& header) {
       for (const Command& command : header.commands) {
         if (ApplyControlCommand(playback, command)) continue;
         if (command.kind == Command::kFlush) {  // a flush happens only inside a sequence on a running graph
-          Check(OneOf(playback.ScanEnd(), {0, 48, kMmfInvalidArgument, kMmfNotAvailable, 12}), "scan end");
+          Check(SpecifiedScan(playback.ScanEnd()), "scan end");
         } else if (command.kind == Command::kWait) {
           std::this_thread::sleep_for(std::chrono::microseconds(250 * (command.amount % 8)));
         } else if (command.kind == Command::kStop) {

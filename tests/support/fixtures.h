@@ -69,8 +69,7 @@ std::string FixturePath(const std::string& file);
 std::vector<std::string> FixtureNames();
 
 // Reads NAME.expected, NAME.cues and NAME.blocks. A missing file or a
-// malformed line is reported with ADD_FAILURE (file and line named) and the
-// line is skipped.
+// malformed line is reported with ADD_FAILURE (file and line named).
 FixtureExpectation LoadFixture(const std::string& name);
 
 // Reads NAME.frames, written only for a fixture whose track is stored with

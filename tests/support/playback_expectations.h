@@ -83,10 +83,8 @@ inline std::string FirstDifference(const std::vector<Frame>& got, const std::vec
     const size_t stop = g < gaps.size() ? gaps[g] : got.size();
     while (j < stop && i < want.size() && got[j] == want[i]) ++i, ++j;
     if (j < stop) break;
-    for (size_t skipped = 0; g < gaps.size() && j < got.size() && i < want.size() && !(got[j] == want[i]); ++skipped) {
-      if (skipped == lost) break;
-      ++i;
-    }
+    const size_t skip_end = g < gaps.size() ? std::min(want.size(), i + lost) : i;
+    while (i < skip_end && j < got.size() && !(got[j] == want[i])) ++i;
   }
   if (j == got.size() && i == want.size()) return "";
   std::ostringstream text;
