@@ -75,25 +75,18 @@ struct Command {
 };
 
 struct Header {
-  int threads = 0;
-  bool preroll = false;
-  uint32_t channel = 0;
-  uint32_t buffer_size = 4096;
-  int32_t trick_time_ms = 0;
+  int threads;
+  bool preroll;
+  uint32_t channel, buffer_size;
+  int32_t trick_time_ms;
   std::vector<Command> commands;
 };
 
 Header ReadHeader(const uint8_t* data, size_t size) {
   fuzz_input::Reader in(data, size);
-  Header header;
-  const uint8_t flags = in.Byte();
-  header.threads = flags & 3;
-  header.preroll = flags & 4;
-  header.channel = flags >> 3;
-  const uint8_t code = in.Byte();
-  header.buffer_size = code < 128 ? code + 1u : (code - 127u) * 512u;
-  const uint8_t trick = in.Byte();
-  header.trick_time_ms = trick ? 500 + trick * 2 : 0;
+  const uint8_t flags = in.Byte(), code = in.Byte(), trick = in.Byte();
+  Header header{flags & 3, (flags & 4) != 0, static_cast<uint32_t>(flags >> 3),
+                code < 128 ? code + 1u : (code - 127u) * 512u, trick ? 500 + trick * 2 : 0, {}};
   while (!in.empty() && header.commands.size() < kMaxCommands) {
     const uint8_t op = in.Byte();
     Command command{static_cast<Command::Kind>(op % 9), 0, 0, 0};
