@@ -37,7 +37,7 @@ struct DriveOptions {
   // Sees every result with the record as the call left it; `group_tail` is
   // set for parse_mkvblockgroup calls (read_group_tail), else the call was
   // parse_mkvcluster.
-  std::function<void(int result, const mkvcluster& cluster, bool group_tail)> observe;
+  std::function<void(int result, const mkvcluster&, bool group_tail)> observe = [](int, const mkvcluster&, bool) {};
 };
 
 struct DriveOutcome {
@@ -116,15 +116,11 @@ class Driver {
     }
   }
 
-  int observed(int result, bool group_tail = false) {
-    if (options_.observe) options_.observe(result, *cluster_, group_tail);
-    return result;
-  }
-
   void call_parser() {
     destroy_mkvcluster(cluster_.get());
     uint64_t skip = 0;
-    int result = observed(parse_mkvcluster(&in1_, has_in2_ ? &in2_ : nullptr, cluster_.get(), &skip));
+    int result = parse_mkvcluster(&in1_, has_in2_ ? &in2_ : nullptr, cluster_.get(), &skip);
+    options_.observe(result, *cluster_, false);
     if (result == kClusterBlockReady) return start_block();
     if (result == kClusterSkip) {
       skip_left_ = skip;
@@ -140,7 +136,8 @@ class Driver {
                   (c.in_blockgroup && position < c.blockgroup_end && position < c.cluster_end);
     if (!inside) return finish_group_tail();
     destroy_mkvcluster(cluster_.get());
-    int result = observed(parse_mkvblockgroup(&in1_, has_in2_ ? &in2_ : nullptr, cluster_.get()), true);
+    int result = parse_mkvblockgroup(&in1_, has_in2_ ? &in2_ : nullptr, cluster_.get());
+    options_.observe(result, *cluster_, true);
     if (result == kClusterGroupEnded) return finish_group_tail();
     if (result == kClusterBlockReady) {  // a further Block in the same group
       finish_group_tail();
@@ -244,7 +241,6 @@ inline uint64_t FirstClusterOffset(const uint8_t* file, size_t size) {
 }
 
 inline DriveOutcome DriveClusters(const uint8_t* file, size_t size, uint64_t start, const DriveOptions& options) {
-  if (start >= size) return DriveOutcome{{}, false, true};
   return cluster_driver_detail::Driver(file, size, start, options).run();
 }
 

@@ -122,12 +122,11 @@ bool ParseExpectedLine(std::string_view line, FixtureExpectation* fx) {
              key == "writing_app" || key == "cue_points") {
     return true;  // read by the tool's checks (check_info.sh)
   } else if (key == "track") {
-    ExpectedTrack track;
+    ExpectedTrack& track = fx->tracks.emplace_back();
     for (std::string_view token : SplitOn(rest, ' ')) {
       if (!ParseTrackToken(token, &track)) return false;
     }
     if (track.fields.count("number") == 0 || track.type.empty()) return false;
-    fx->tracks.push_back(std::move(track));
   } else {
     return false;
   }
