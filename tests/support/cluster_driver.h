@@ -24,6 +24,7 @@ struct DrivenBlock {
   uint8_t flags = 0;
   std::vector<int64_t> frame_sizes;  // as parsed
   std::vector<uint32_t> adler32;     // of the bytes consumed for each frame
+  bool operator==(const DrivenBlock&) const = default;
 };
 
 struct DriveOptions {
