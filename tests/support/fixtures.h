@@ -23,7 +23,6 @@ struct ExpectedTrack {
   std::string type, codec;  // type: video, audio, subtitles or other
   uint32_t codec_private_size = 0;
   uint64_t width = 0, height = 0, default_duration = 0;  // default_duration in ns
-  double sampling_frequency = 0;
   uint64_t channels = 0;
   uint32_t sar_num = 0, sar_den = 0, flac_sample_rate = 0, flac_channels = 0, flac_bits = 0;
   std::map<std::string, std::string> fields;
@@ -52,7 +51,7 @@ struct ExpectedBlock {
 };
 
 struct FixtureExpectation {
-  std::string name, path, doc_type;
+  std::string name, doc_type;
   uint64_t timecode_scale = 0, duration_ns = 0, file_size = 0;
   std::vector<ExpectedTrack> tracks;  // in file order
   uint64_t damaged_at = 0;  // the first byte the recipe zeroed, or the length it cut the file to; 0: none
