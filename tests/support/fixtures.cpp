@@ -153,8 +153,6 @@ FixtureExpectation LoadFixture(const std::string& name) {
         (parts[2] != "S" && parts[2] != "B") || (parts[3] != "0" && parts[3] != "1")) {
       return false;
     }
-    block.simple = parts[2] == "S";
-    block.key = parts[3] == "1";
     for (std::string_view entry : SplitOn(parts[4], ',')) {
       ExpectedFrame& frame = block.frames.emplace_back();
       if (!ParseFields(SplitOn(entry, ':'), &frame.size, Hex{&frame.adler32})) return false;

@@ -39,14 +39,12 @@ struct ExpectedFrame {
   uint32_t adler32;
 };
 
-// One SimpleBlock (simple) or Block in a BlockGroup. ticks = Cluster timecode +
-// the block's relative timecode, in TimecodeScale units. key: the SimpleBlock
-// keyframe flag; for a Block, true when its group has no ReferenceBlock.
+// One SimpleBlock or Block in a BlockGroup. ticks = Cluster timecode + the
+// block's relative timecode, in TimecodeScale units. (The list's kind and key
+// columns are checked for form only: no test reads them yet.)
 struct ExpectedBlock {
   uint64_t track;
   int64_t ticks;
-  bool simple;
-  bool key;
   std::vector<ExpectedFrame> frames;  // in lace order
 };
 
