@@ -46,8 +46,7 @@ constexpr size_t kSmall = 10000;  // every buffer size, truncation and flipped b
 
 bool Quick() {
   const char* mode = std::getenv("KELVANE_SWEEP");
-  if (mode && *mode) return std::string(mode) == "quick";
-  return KELVANE_SWEEP_QUICK != 0;
+  return mode && *mode ? std::string(mode) == "quick" : KELVANE_SWEEP_QUICK != 0;
 }
 
 // A consumer's room for the sinks' frames: a few at a time, so that the
