@@ -149,7 +149,7 @@ class Driver {
 
   void finish_group_tail() {
     group_tail_pending_ = false;
-    outcome_.blocks[group_block_].key = cluster_->reference_block == 0;
+    outcome_.blocks.back().key = cluster_->reference_block == 0;  // no block comes before the tail is read
   }
 
   void start_block() {
@@ -158,10 +158,7 @@ class Driver {
     outcome_.blocks.push_back({c.track_number, static_cast<int64_t>(c.cluster_timecode) + c.block_timecode,
                                simple && (c.block_flags & 0x80), c.block_flags,
                                std::vector<int64_t>(c.frame_sizes, c.frame_sizes + c.frame_count), {}});
-    if (!simple && options_.read_group_tail) {
-      group_tail_pending_ = true;
-      group_block_ = outcome_.blocks.size() - 1;
-    }
+    group_tail_pending_ = !simple && options_.read_group_tail;
     block_ = true;
     frame_index_ = 0;  // frame_left_ is 0: the block before was consumed whole
     data_left_ = c.block_data_left;
@@ -218,7 +215,6 @@ class Driver {
   int64_t data_left_ = 0;      // the block's block_data_left less the frame bytes consumed so far
   Adler32Sum adler_;
   bool group_tail_pending_ = false;  // the last Block's group has children still to read
-  size_t group_block_ = 0;           // index of that Block in outcome_.blocks
   DriveOutcome outcome_;
 };
 
