@@ -294,12 +294,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   const size_t file_size = std::min(size - start, kMaxFileBytes);
   const size_t least = (file_size + kMaxInputBuffers - 1) / kMaxInputBuffers;
   header.buffer_size = static_cast<uint32_t>(std::max<size_t>(header.buffer_size, least));
-  fuzz_input::ExpectNoBlockLeft([&] {
-    if (header.threads == 0) {
-      PlayDeterministic(data + start, file_size, header);
-    } else {
-      PlayThreaded(data + start, file_size, header);
-    }
-  });
+  fuzz_input::ExpectNoBlockLeft(
+      [&] { (header.threads == 0 ? PlayDeterministic : PlayThreaded)(data + start, file_size, header); });
   return 0;
 }
