@@ -62,8 +62,7 @@ struct Model {
     for (uint32_t i = 0; i < cue_count && !in.empty(); ++i) {
       cues.push_back({in.Number(), {}});
       for (uint32_t j = in.Byte() % (kMaxPositionsPerCue + 1); j > 0; --j) {
-        const uint64_t track = in.Byte() & 7;
-        cues.back().positions.push_back({track, in.Number()});
+        cues.back().positions.push_back({uint64_t{in.Byte()} & 7, in.Number()});  // read in this order
       }
     }
   }

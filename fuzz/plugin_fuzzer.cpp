@@ -22,8 +22,8 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <chrono>
-#include <cstring>
 #include <memory>
 #include <string>
 #include <thread>
@@ -64,6 +64,7 @@ std::string scratch_path;
 // input, or the stopped state.
 bool SpecifiedEnd(int result) { return OneOf(result, {1, kMmfEndOfStream, 4, 16}); }
 bool SpecifiedControl(int result) { return OneOf(result, {0, kMmfStoppedAfterError}); }
+bool SpecifiedScan(int result) { return OneOf(result, {0, 48, kMmfInvalidArgument, kMmfNotAvailable, 12}); }
 
 struct Command {
   enum Kind { kSeek, kPause, kResume, kScanForward, kScanBackward, kScanEnd, kFlush, kWait, kStop };
@@ -74,25 +75,18 @@ struct Command {
 };
 
 struct Header {
-  int threads = 0;
-  bool preroll = false;
-  uint32_t channel = 0;
-  uint32_t buffer_size = 4096;
-  int32_t trick_time_ms = 0;
+  int threads;
+  bool preroll;
+  uint32_t channel, buffer_size;
+  int32_t trick_time_ms;
   std::vector<Command> commands;
 };
 
 Header ReadHeader(const uint8_t* data, size_t size) {
   fuzz_input::Reader in(data, size);
-  Header header;
-  const uint8_t flags = in.Byte();
-  header.threads = flags & 3;
-  header.preroll = flags & 4;
-  header.channel = flags >> 3;
-  const uint8_t code = in.Byte();
-  header.buffer_size = code < 128 ? code + 1u : (code - 127u) * 512u;
-  const uint8_t trick = in.Byte();
-  header.trick_time_ms = trick ? 500 + trick * 2 : 0;
+  const uint8_t flags = in.Byte(), code = in.Byte(), trick = in.Byte();
+  Header header{flags & 3, (flags & 4) != 0, static_cast<uint32_t>(flags >> 3),
+                code < 128 ? code + 1u : (code - 127u) * 512u, trick ? 500 + trick * 2 : 0, {}};
   while (!in.empty() && header.commands.size() < kMaxCommands) {
     const uint8_t op = in.Byte();
     Command command{static_cast<Command::Kind>(op % 9), 0, 0, 0};
@@ -110,11 +104,9 @@ Header ReadHeader(const uint8_t* data, size_t size) {
 // Where the file starts: at the EBML magic near the front, else after a fixed header.
 size_t FileStart(const uint8_t* data, size_t size) {
   static const uint8_t kMagic[] = {0x1A, 0x45, 0xDF, 0xA3};
-  const size_t limit = std::min(size, kHeaderSearch + sizeof kMagic);
-  for (size_t i = 0; i + sizeof kMagic <= limit; ++i) {
-    if (std::memcmp(data + i, kMagic, sizeof kMagic) == 0) return i;
-  }
-  return std::min(size, kHeaderWithoutMagic);
+  const uint8_t* end = data + std::min(size, kHeaderSearch + sizeof kMagic);
+  const uint8_t* magic = std::search(data, end, std::begin(kMagic), std::end(kMagic));
+  return magic != end ? static_cast<size_t>(magic - data) : std::min(size, kHeaderWithoutMagic);
 }
 
 // A delivered media buffer: each buffer element inside the buffer it names;
@@ -141,7 +133,6 @@ uint64_t CheckedLastTime(MmfMra* mra) {
 // The commands both modes send the same way, through the playback controller,
 // each answer checked. False for the ones each mode does its own way.
 bool ApplyControlCommand(host::PlaybackControl& playback, const Command& command) {
-  const std::initializer_list<int> scan_answers = {0, 48, kMmfInvalidArgument, kMmfNotAvailable, 12};
   switch (command.kind) {
     case Command::kSeek:
       Check(OneOf(playback.Seek(command.time_us), {0, kMmfNoConversion}), "seek");
@@ -152,13 +143,12 @@ bool ApplyControlCommand(host::PlaybackControl& playback, const Command& command
       return true;
     case Command::kScanForward:
     case Command::kScanBackward:
-      Check(OneOf(command.kind == Command::kScanForward ? playback.ScanForward(command.speed)
-                                                        : playback.ScanBackward(command.speed),
-                  scan_answers),
+      Check(SpecifiedScan(command.kind == Command::kScanForward ? playback.ScanForward(command.speed)
+                                                                : playback.ScanBackward(command.speed)),
             "scan");
       return true;
     case Command::kScanEnd:
-      Check(OneOf(playback.ScanEnd(), scan_answers), "scan end");
+      Check(SpecifiedScan(playback.ScanEnd()), "scan end");
       return true;
     default:
       return false;
@@ -265,7 +255,7 @@ void PlayThreaded(const uint8_t* file, size_t size, const Header& header) {
       for (const Command& command : header.commands) {
         if (ApplyControlCommand(playback, command)) continue;
         if (command.kind == Command::kFlush) {  // a flush happens only inside a sequence on a running graph
-          Check(OneOf(playback.ScanEnd(), {0, 48, kMmfInvalidArgument, kMmfNotAvailable, 12}), "scan end");
+          Check(SpecifiedScan(playback.ScanEnd()), "scan end");
         } else if (command.kind == Command::kWait) {
           std::this_thread::sleep_for(std::chrono::microseconds(250 * (command.amount % 8)));
         } else if (command.kind == Command::kStop) {
@@ -304,12 +294,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   const size_t file_size = std::min(size - start, kMaxFileBytes);
   const size_t least = (file_size + kMaxInputBuffers - 1) / kMaxInputBuffers;
   header.buffer_size = static_cast<uint32_t>(std::max<size_t>(header.buffer_size, least));
-  fuzz_input::ExpectNoBlockLeft([&] {
-    if (header.threads == 0) {
-      PlayDeterministic(data + start, file_size, header);
-    } else {
-      PlayThreaded(data + start, file_size, header);
-    }
-  });
+  fuzz_input::ExpectNoBlockLeft(
+      [&] { (header.threads == 0 ? PlayDeterministic : PlayThreaded)(data + start, file_size, header); });
   return 0;
 }

@@ -38,31 +38,19 @@ struct Record {
   ~Record() { destroy_mkvcluster(&c); }
 };
 
-// What one parse left behind.
+// What one parse gave besides the record: its result, the skip it found
+// (0xDEAD: none) and the bytes left in inbuff1.
 struct Outcome {
-  int result = 1;
-  uint64_t skip = 0xDEAD;  // as parse_mkvcluster found it
-  uint64_t track = 0;
-  int16_t timecode = 0;
-  std::vector<int64_t> sizes;  // frame_sizes, when the result is 0
-  int64_t data_left = 0;
-  uint64_t cluster_timecode = 0;
-  uint32_t left = 0;  // of inbuff1
+  int result;
+  uint64_t skip;
+  uint32_t left;
 };
 
 Outcome Call(Record& record, mkvinbuff* in1, mkvinbuff* in2) {
   destroy_mkvcluster(&record.c);
-  Outcome out;
+  Outcome out{0, 0xDEAD, 0};
   out.result = parse_mkvcluster(in1, in2, &record.c, &out.skip);
-  const mkvcluster& c = record.c;
-  out.cluster_timecode = c.cluster_timecode;
   out.left = in1->buff_left;
-  if (out.result == kClusterBlockReady) {
-    out.track = c.track_number;
-    out.timecode = c.block_timecode;
-    out.sizes.assign(c.frame_sizes, c.frame_sizes + c.frame_count);
-    out.data_left = c.block_data_left;
-  }
   return out;
 }
 
@@ -92,6 +80,7 @@ struct ClusterCase {
   int16_t timecode = 0;           // with sizes and data_left, compared when sizes are given
   std::vector<int64_t> sizes = {};
   int64_t data_left = 0;
+  bool ran_out = false;  // the bytes end inside an element: all of inbuff1 is read, and the record says so
 };
 
 Bytes Block(uint64_t track) { return simple_block(track, 0, kKeyFrame, {filler(3, 0xA3)}); }
@@ -105,6 +94,9 @@ Bytes Laced(const Bytes& header, size_t frame_bytes, uint64_t element_size = 0) 
 }
 
 const Bytes kCuesElement = master(kCues, {master(kCuePoint, {uinteger(kCueTime, 0)})});
+const Bytes kTwoBlocks = master(kCluster, {uinteger(kTimecode, 2), Block(1), Block(2)});
+
+Bytes Cut(size_t end) { return Bytes(kTwoBlocks.begin(), kTwoBlocks.begin() + static_cast<std::ptrdiff_t>(end)); }
 
 const ClusterCase kCases[] = {
     {"CuesBetweenClustersAreSkippedWhole", kCuesElement, 0, kClusterSkip, kCuesElement.size() - 5},
@@ -163,6 +155,13 @@ const ClusterCase kCases[] = {
     {"EbmlFirstSizeZeroIsInvalid", Laced({0x81, 0x00, 0x00, 0x06, 0x01, 0x00}, 4), 0, kClusterInvalid, 0xDEAD, 7},
     {"EbmlDifferenceZeroIsShort", Laced({0x81, 0x00, 0x00, 0x06, 0x02, 0x82, 0x00}, 4), 0, kClusterChildShort,
      0xDEAD, 7},
+    // Without inbuff2 the call ends where inbuff1 does, inside the Cluster's ID, the Timecode's header, the first
+    // SimpleBlock's header, between the second one's ID and size, and inside its header.
+    {"RanOutInTheClusterId", Cut(2), 0, kClusterHeaderFailed, 0xDEAD, 0, 0, nullptr, 0, {}, 0, true},
+    {"RanOutInTheTimecodeHeader", Cut(6), 0, kClusterChildShort, 0xDEAD, 0, 0, nullptr, 0, {}, 0, true},
+    {"RanOutInTheFirstBlockHeader", Cut(12), 0, kClusterChildShort, 0xDEAD, 2, 0, nullptr, 0, {}, 0, true},
+    {"RanOutBetweenTheSecondBlockIdAndSize", Cut(18), 1, kClusterHeaderFailed, 0xDEAD, 2, 0, nullptr, 0, {}, 0, true},
+    {"RanOutInTheSecondBlockHeader", Cut(21), 1, kClusterChildShort, 0xDEAD, 2, 0, nullptr, 0, {}, 0, true},
 };
 
 TEST(ParseMkvClusterTest, GivesTheResultOfEachCase) {
@@ -170,33 +169,18 @@ TEST(ParseMkvClusterTest, GivesTheResultOfEachCase) {
     SCOPED_TRACE(c.name);
     testing_support::LogRecorder log;
     Record record;
-    auto got = ParseAfterBlocks(record, c.bytes, c.blocks_before);
-    EXPECT_EQ(std::tie(got.result, got.skip, got.cluster_timecode, got.track),
-              std::tie(c.result, c.skip, c.cluster_timecode, c.track));
+    const auto got = ParseAfterBlocks(record, c.bytes, c.blocks_before);
+    const mkvcluster& r = record.c;
+    const bool ready = got.result == kClusterBlockReady;
+    EXPECT_EQ(std::make_tuple(got.result, got.skip, r.cluster_timecode, ready ? r.track_number : 0),
+              std::make_tuple(c.result, c.skip, c.cluster_timecode, c.track));
     EXPECT_TRUE(!c.message || log.Contains(kAoLogNotice, c.message));
+    EXPECT_TRUE(!c.ran_out || (got.left == 0 && mkvcluster_inside_element(&r)));
     if (!c.sizes.empty()) {
-      EXPECT_EQ(std::tie(got.timecode, got.sizes, got.data_left), std::tie(c.timecode, c.sizes, c.data_left));
+      EXPECT_EQ(std::make_tuple(r.block_timecode, std::vector<int64_t>(r.frame_sizes, r.frame_sizes + r.frame_count),
+                                r.block_data_left),
+                std::make_tuple(c.timecode, c.sizes, c.data_left));
     }
-  }
-}
-
-// Without inbuff2 the call ends where inbuff1 does; what it read stays read.
-TEST(ParseMkvClusterRanOutTest, EndOfInbuff1GivesTheResultOfTheLevelItEndsIn) {
-  Bytes bytes = master(kCluster, {uinteger(kTimecode, 2), Block(1), Block(2)});
-  const struct { size_t end; bool after_first_block; int result; } rows[] = {
-      {2, false, kClusterHeaderFailed},  // inside the Cluster's ID
-      {6, false, kClusterChildShort},    // inside the Timecode's header
-      {12, false, kClusterChildShort},   // inside the first SimpleBlock's header
-      {18, true, kClusterHeaderFailed},  // between the second SimpleBlock's ID and size
-      {21, true, kClusterChildShort},    // inside the second SimpleBlock's header
-  };
-  for (const auto& row : rows) {
-    Record record;
-    const Bytes cut(bytes.begin(), bytes.begin() + static_cast<std::ptrdiff_t>(row.end));
-    const auto got = ParseAfterBlocks(record, cut, row.after_first_block);
-    EXPECT_EQ(got.result, row.result) << "end " << row.end;
-    EXPECT_EQ(got.left, 0u);
-    EXPECT_TRUE(mkvcluster_inside_element(&record.c));
   }
 }
 
@@ -247,7 +231,7 @@ TEST(GroupChildrenTest, AreReadAsTheirCaseSays) {
       auto got = ParseAfterBlocks(record, ClusterOf({master(kBlockGroup, {c.children, Block1()})}));
       host::FailNthAllocation(0);
       const mkvcluster& r = record.c;
-      EXPECT_EQ(std::make_tuple(got.result, got.track),
+      EXPECT_EQ(std::make_tuple(got.result, got.result == kClusterBlockReady ? r.track_number : 0),
                 std::make_tuple(c.result, c.result == kClusterBlockReady ? 1u : 0u));
       EXPECT_EQ(r.frame_sizes == nullptr, c.result != kClusterBlockReady);
       EXPECT_EQ(std::tie(r.reference_block, r.reference_priority, r.block_duration),

@@ -24,6 +24,7 @@ struct DrivenBlock {
   uint8_t flags = 0;
   std::vector<int64_t> frame_sizes;  // as parsed
   std::vector<uint32_t> adler32;     // of the bytes consumed for each frame
+  bool operator==(const DrivenBlock&) const = default;
 };
 
 struct DriveOptions {
@@ -37,7 +38,7 @@ struct DriveOptions {
   // Sees every result with the record as the call left it; `group_tail` is
   // set for parse_mkvblockgroup calls (read_group_tail), else the call was
   // parse_mkvcluster.
-  std::function<void(int result, const mkvcluster& cluster, bool group_tail)> observe;
+  std::function<void(int result, const mkvcluster&, bool group_tail)> observe = [](int, const mkvcluster&, bool) {};
 };
 
 struct DriveOutcome {
@@ -116,15 +117,11 @@ class Driver {
     }
   }
 
-  int observed(int result, bool group_tail = false) {
-    if (options_.observe) options_.observe(result, *cluster_, group_tail);
-    return result;
-  }
-
   void call_parser() {
     destroy_mkvcluster(cluster_.get());
     uint64_t skip = 0;
-    int result = observed(parse_mkvcluster(&in1_, has_in2_ ? &in2_ : nullptr, cluster_.get(), &skip));
+    int result = parse_mkvcluster(&in1_, has_in2_ ? &in2_ : nullptr, cluster_.get(), &skip);
+    options_.observe(result, *cluster_, false);
     if (result == kClusterBlockReady) return start_block();
     if (result == kClusterSkip) {
       skip_left_ = skip;
@@ -140,7 +137,8 @@ class Driver {
                   (c.in_blockgroup && position < c.blockgroup_end && position < c.cluster_end);
     if (!inside) return finish_group_tail();
     destroy_mkvcluster(cluster_.get());
-    int result = observed(parse_mkvblockgroup(&in1_, has_in2_ ? &in2_ : nullptr, cluster_.get()), true);
+    int result = parse_mkvblockgroup(&in1_, has_in2_ ? &in2_ : nullptr, cluster_.get());
+    options_.observe(result, *cluster_, true);
     if (result == kClusterGroupEnded) return finish_group_tail();
     if (result == kClusterBlockReady) {  // a further Block in the same group
       finish_group_tail();
@@ -151,7 +149,7 @@ class Driver {
 
   void finish_group_tail() {
     group_tail_pending_ = false;
-    outcome_.blocks[group_block_].key = cluster_->reference_block == 0;
+    outcome_.blocks.back().key = cluster_->reference_block == 0;  // no block comes before the tail is read
   }
 
   void start_block() {
@@ -160,10 +158,7 @@ class Driver {
     outcome_.blocks.push_back({c.track_number, static_cast<int64_t>(c.cluster_timecode) + c.block_timecode,
                                simple && (c.block_flags & 0x80), c.block_flags,
                                std::vector<int64_t>(c.frame_sizes, c.frame_sizes + c.frame_count), {}});
-    if (!simple && options_.read_group_tail) {
-      group_tail_pending_ = true;
-      group_block_ = outcome_.blocks.size() - 1;
-    }
+    group_tail_pending_ = !simple && options_.read_group_tail;
     block_ = true;
     frame_index_ = 0;  // frame_left_ is 0: the block before was consumed whole
     data_left_ = c.block_data_left;
@@ -220,7 +215,6 @@ class Driver {
   int64_t data_left_ = 0;      // the block's block_data_left less the frame bytes consumed so far
   Adler32Sum adler_;
   bool group_tail_pending_ = false;  // the last Block's group has children still to read
-  size_t group_block_ = 0;           // index of that Block in outcome_.blocks
   DriveOutcome outcome_;
 };
 
@@ -244,7 +238,6 @@ inline uint64_t FirstClusterOffset(const uint8_t* file, size_t size) {
 }
 
 inline DriveOutcome DriveClusters(const uint8_t* file, size_t size, uint64_t start, const DriveOptions& options) {
-  if (start >= size) return DriveOutcome{{}, false, true};
   return cluster_driver_detail::Driver(file, size, start, options).run();
 }
 

@@ -7,7 +7,6 @@
 #include <sstream>
 #include <string_view>
 #include <system_error>
-#include <type_traits>
 
 #include <gtest/gtest.h>
 
@@ -32,12 +31,7 @@ template <typename T>
 bool ParseNumber(std::string_view text, T* value, int base = 10) {
   if (text.empty()) return false;
   const char* end = text.data() + text.size();
-  std::from_chars_result r;
-  if constexpr (std::is_floating_point_v<T>) {
-    r = std::from_chars(text.data(), end, *value);
-  } else {
-    r = std::from_chars(text.data(), end, *value, base);
-  }
+  const std::from_chars_result r = std::from_chars(text.data(), end, *value, base);
   return r.ec == std::errc() && r.ptr == end;
 }
 
@@ -65,16 +59,16 @@ bool ParseFields(const std::vector<std::string_view>& parts, Values... values) {
   return parts.size() == sizeof...(Values) && (ParseNumber(parts[i++], values) && ...);
 }
 
-// Calls `parse_line(line)` for every line that is neither blank nor a `#`
-// comment; a false result is reported as a malformed line.
+// Calls `parse_line(line)` for every line of FILE that is neither blank nor a
+// `#` comment; a false result is reported as a malformed line.
 template <typename ParseLine>
-void ForEachLine(const std::string& label, const std::string& text, ParseLine parse_line) {
-  std::istringstream in(text);
+void ForEachLine(const std::string& file, ParseLine parse_line) {
+  std::istringstream in(ReadTextOrFail(file));
   std::string line;
   for (int number = 1; std::getline(in, line); ++number) {
     if (!line.empty() && line.back() == '\r') line.pop_back();
     if (line.empty() || line[0] == '#') continue;
-    if (!parse_line(std::string_view(line))) ADD_FAILURE() << label << ":" << number << ": malformed line: " << line;
+    if (!parse_line(std::string_view(line))) ADD_FAILURE() << file << ":" << number << ": malformed line: " << line;
   }
 }
 
@@ -92,7 +86,6 @@ bool ParseTrackToken(std::string_view token, ExpectedTrack* track) {
   else if (key == "width") ok = ParseNumber(value, &track->width);
   else if (key == "height") ok = ParseNumber(value, &track->height);
   else if (key == "default_duration") ok = ParseNumber(value, &track->default_duration);
-  else if (key == "sampling_frequency") ok = ParseNumber(value, &track->sampling_frequency);
   else if (key == "channels") ok = ParseNumber(value, &track->channels);
   else if (key == "flac_sample_rate") ok = ParseNumber(value, &track->flac_sample_rate);
   else if (key == "flac_channels") ok = ParseNumber(value, &track->flac_channels);
@@ -122,59 +115,25 @@ bool ParseExpectedLine(std::string_view line, FixtureExpectation* fx) {
              key == "writing_app" || key == "cue_points") {
     return true;  // read by the tool's checks (check_info.sh)
   } else if (key == "track") {
-    ExpectedTrack track;
+    ExpectedTrack& track = fx->tracks.emplace_back();
     for (std::string_view token : SplitOn(rest, ' ')) {
       if (!ParseTrackToken(token, &track)) return false;
     }
     if (track.fields.count("number") == 0 || track.type.empty()) return false;
-    fx->tracks.push_back(std::move(track));
   } else {
     return false;
   }
   return space != std::string_view::npos;
 }
 
-bool ParseCueLine(std::string_view line, FixtureExpectation* fx) {
-  ExpectedCue cue{};
-  const bool ok = ParseFields(SplitOn(line, ' '), &cue.time_ticks, &cue.track, &cue.cluster_position, &cue.block_number);
-  if (ok) fx->cues.push_back(cue);
-  return ok;
-}
-
-bool ParseBlockLine(std::string_view line, FixtureExpectation* fx) {
-  std::vector<std::string_view> parts = SplitOn(line, ' ');
-  ExpectedBlock block{};
-  if (parts.size() != 5 || !ParseFields({parts[0], parts[1]}, &block.track, &block.ticks) ||
-      (parts[2] != "S" && parts[2] != "B") || (parts[3] != "0" && parts[3] != "1")) {
-    return false;
-  }
-  block.simple = parts[2] == "S";
-  block.key = parts[3] == "1";
-  for (std::string_view entry : SplitOn(parts[4], ',')) {
-    ExpectedFrame& frame = block.frames.emplace_back();
-    if (!ParseFields(SplitOn(entry, ':'), &frame.size, Hex{&frame.adler32})) return false;
-  }
-  fx->blocks.push_back(std::move(block));
-  return true;
-}
-
-bool ParseFullFrameLine(std::string_view line, std::vector<ExpectedBlock>* frames) {
-  ExpectedBlock block{};
-  ExpectedFrame& frame = block.frames.emplace_back();
-  if (!ParseFields(SplitOn(line, ' '), &block.track, &block.ticks, &frame.size, Hex{&frame.adler32})) return false;
-  frames->push_back(std::move(block));
-  return true;
-}
-
 }  // namespace
 
 std::vector<std::string> FixtureNames() {
   std::vector<std::string> names;
-  ForEachLine("index.txt", ReadTextOrFail("index.txt"), [&](std::string_view line) {
+  ForEachLine("index.txt", [&](std::string_view line) {
     std::string_view name = line.substr(0, line.find_first_of(" \t"));
-    if (name.empty()) return false;
-    names.emplace_back(name);
-    return true;
+    if (!name.empty()) names.emplace_back(name);
+    return !name.empty();
   });
   return names;
 }
@@ -182,19 +141,34 @@ std::vector<std::string> FixtureNames() {
 FixtureExpectation LoadFixture(const std::string& name) {
   FixtureExpectation fx;
   fx.name = name;
-  fx.path = FixturePath(name + ".mkv");
-  ForEachLine(name + ".expected", ReadTextOrFail(name + ".expected"),
-              [&](std::string_view line) { return ParseExpectedLine(line, &fx); });
-  ForEachLine(name + ".cues", ReadTextOrFail(name + ".cues"), [&](std::string_view line) { return ParseCueLine(line, &fx); });
-  ForEachLine(name + ".blocks", ReadTextOrFail(name + ".blocks"),
-              [&](std::string_view line) { return ParseBlockLine(line, &fx); });
+  ForEachLine(name + ".expected", [&](std::string_view line) { return ParseExpectedLine(line, &fx); });
+  ForEachLine(name + ".cues", [&](std::string_view line) {
+    ExpectedCue& cue = fx.cues.emplace_back();
+    return ParseFields(SplitOn(line, ' '), &cue.time_ticks, &cue.track, &cue.cluster_position, &cue.block_number);
+  });
+  ForEachLine(name + ".blocks", [&](std::string_view line) {
+    std::vector<std::string_view> parts = SplitOn(line, ' ');
+    ExpectedBlock& block = fx.blocks.emplace_back();
+    if (parts.size() != 5 || !ParseFields({parts[0], parts[1]}, &block.track, &block.ticks) ||
+        (parts[2] != "S" && parts[2] != "B") || (parts[3] != "0" && parts[3] != "1")) {
+      return false;
+    }
+    for (std::string_view entry : SplitOn(parts[4], ',')) {
+      ExpectedFrame& frame = block.frames.emplace_back();
+      if (!ParseFields(SplitOn(entry, ':'), &frame.size, Hex{&frame.adler32})) return false;
+    }
+    return true;
+  });
   return fx;
 }
 
 std::vector<ExpectedBlock> LoadFullFrames(const std::string& name) {
   std::vector<ExpectedBlock> frames;
-  ForEachLine(name + ".frames", ReadTextOrFail(name + ".frames"),
-              [&](std::string_view line) { return ParseFullFrameLine(line, &frames); });
+  ForEachLine(name + ".frames", [&](std::string_view line) {
+    ExpectedBlock& block = frames.emplace_back();
+    ExpectedFrame& frame = block.frames.emplace_back();
+    return ParseFields(SplitOn(line, ' '), &block.track, &block.ticks, &frame.size, Hex{&frame.adler32});
+  });
   return frames;
 }
 

@@ -23,7 +23,6 @@ struct ExpectedTrack {
   std::string type, codec;  // type: video, audio, subtitles or other
   uint32_t codec_private_size = 0;
   uint64_t width = 0, height = 0, default_duration = 0;  // default_duration in ns
-  double sampling_frequency = 0;
   uint64_t channels = 0;
   uint32_t sar_num = 0, sar_den = 0, flac_sample_rate = 0, flac_channels = 0, flac_bits = 0;
   std::map<std::string, std::string> fields;
@@ -40,19 +39,17 @@ struct ExpectedFrame {
   uint32_t adler32;
 };
 
-// One SimpleBlock (simple) or Block in a BlockGroup. ticks = Cluster timecode +
-// the block's relative timecode, in TimecodeScale units. key: the SimpleBlock
-// keyframe flag; for a Block, true when its group has no ReferenceBlock.
+// One SimpleBlock or Block in a BlockGroup. ticks = Cluster timecode + the
+// block's relative timecode, in TimecodeScale units. (The list's kind and key
+// columns are checked for form only: no test reads them yet.)
 struct ExpectedBlock {
   uint64_t track;
   int64_t ticks;
-  bool simple;
-  bool key;
   std::vector<ExpectedFrame> frames;  // in lace order
 };
 
 struct FixtureExpectation {
-  std::string name, path, doc_type;
+  std::string name, doc_type;
   uint64_t timecode_scale = 0, duration_ns = 0, file_size = 0;
   std::vector<ExpectedTrack> tracks;  // in file order
   uint64_t damaged_at = 0;  // the first byte the recipe zeroed, or the length it cut the file to; 0: none
@@ -69,8 +66,7 @@ std::string FixturePath(const std::string& file);
 std::vector<std::string> FixtureNames();
 
 // Reads NAME.expected, NAME.cues and NAME.blocks. A missing file or a
-// malformed line is reported with ADD_FAILURE (file and line named) and the
-// line is skipped.
+// malformed line is reported with ADD_FAILURE (file and line named).
 FixtureExpectation LoadFixture(const std::string& name);
 
 // Reads NAME.frames, written only for a fixture whose track is stored with

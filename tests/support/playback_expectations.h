@@ -39,28 +39,21 @@ inline std::ostream& operator<<(std::ostream& out, const Frame& f) {
 inline std::vector<uint64_t> OfferedTracks(const FixtureExpectation& fixture) {
   std::vector<uint64_t> tracks;
   for (const auto& track : fixture.tracks) {
-    for (const mkv_codec_row& row : supported_codec_id) {
-      if (track.codec == row.codec_id && !track.fields.count("encryption")) {
-        tracks.push_back(track.number);
-        break;
-      }
-    }
+    const auto same_codec = [&track](const mkv_codec_row& row) { return track.codec == row.codec_id; };
+    const bool supported = std::any_of(std::begin(supported_codec_id), std::end(supported_codec_id), same_codec);
+    if (supported && !track.fields.count("encryption")) tracks.push_back(track.number);
   }
   return tracks;
 }
 
-inline std::vector<Frame> ExpectedFrames(const std::string& name, const FixtureExpectation& fixture, uint64_t track) {
-  std::vector<testing_support::ExpectedBlock> blocks = fixture.blocks;
-  for (const auto& t : fixture.tracks) {
-    // Header removal is undone by the plug-in; zlib frames come as stored, as the blocks list them.
-    if (t.number == track && t.fields.count("compression") && t.fields.at("compression") == "header_removal") {
-      blocks = testing_support::LoadFullFrames(name);
-    }
-  }
+inline std::vector<Frame> ExpectedFrames(const std::string& name, const FixtureExpectation& fixture,
+                                         const testing_support::ExpectedTrack& track) {
+  // Header removal is undone by the plug-in; zlib frames come as stored, as the blocks list them.
+  const bool restored = track.fields.count("compression") && track.fields.at("compression") == "header_removal";
   std::vector<Frame> frames;
   const uint64_t scale = fixture.timecode_scale / 1000;
-  for (const auto& block : blocks) {
-    if (block.track != track) continue;
+  for (const auto& block : restored ? testing_support::LoadFullFrames(name) : fixture.blocks) {
+    if (block.track != track.number) continue;
     for (const ExpectedFrame& f : block.frames) frames.push_back({uint64_t(block.ticks) * scale, f.size, f.adler32});
   }
   return frames;
@@ -83,10 +76,8 @@ inline std::string FirstDifference(const std::vector<Frame>& got, const std::vec
     const size_t stop = g < gaps.size() ? gaps[g] : got.size();
     while (j < stop && i < want.size() && got[j] == want[i]) ++i, ++j;
     if (j < stop) break;
-    for (size_t skipped = 0; g < gaps.size() && j < got.size() && i < want.size() && !(got[j] == want[i]); ++skipped) {
-      if (skipped == lost) break;
-      ++i;
-    }
+    const size_t skip_end = g < gaps.size() ? std::min(want.size(), i + lost) : i;
+    while (i < skip_end && j < got.size() && !(got[j] == want[i])) ++i;
   }
   if (j == got.size() && i == want.size()) return "";
   std::ostringstream text;
@@ -105,24 +96,21 @@ inline void CheckRun(const std::string& name, const FixtureExpectation& fixture,
   for (const host::ChannelRun& run : result.channels) {
     SCOPED_TRACE("channel " + std::to_string(run.index));
     const uint64_t track = offered[static_cast<size_t>(run.index)];
+    const auto& t = *std::find_if(fixture.tracks.begin(), fixture.tracks.end(),
+                                  [track](const testing_support::ExpectedTrack& e) { return e.number == track; });
     std::vector<size_t> gaps;
     for (const host::Gap& gap : run.gaps) gaps.push_back(gap.at);
-    EXPECT_EQ(FirstDifference(AsFrames(run.frames), ExpectedFrames(name, fixture, track), gaps,
-                              host::kOutputBufferElements),
-              "")
-        << "track " << track;
+    const std::vector<Frame> want = ExpectedFrames(name, fixture, t);
+    EXPECT_EQ(FirstDifference(AsFrames(run.frames), want, gaps, host::kOutputBufferElements), "") << "track " << track;
     EXPECT_EQ(run.foreign_elements, 0u) << "a frame element points outside the input buffers";
     EXPECT_EQ(run.incomplete_frame && fixture.damaged_at != fixture.file_size, false) << "a frame cut short";
     // The first buffer: the whole CodecPrivate, or the three Vorbis headers without their lacing.
-    for (const auto& t : fixture.tracks) {
-      if (t.number != track) continue;
-      uint64_t total = 0;
-      for (const host::RunFrame& packet : run.config) total += packet.size;
-      const bool vorbis = t.codec == "A_VORBIS";
-      EXPECT_EQ(run.config.size(), t.codec_private_size == 0 ? 0u : vorbis ? 3u : 1u);
-      EXPECT_TRUE(vorbis ? total < t.codec_private_size : total == t.codec_private_size)
-          << total << " bytes of decoder configuration, CodecPrivate " << t.codec_private_size;
-    }
+    uint64_t total = 0;
+    for (const host::RunFrame& packet : run.config) total += packet.size;
+    const bool vorbis = t.codec == "A_VORBIS";
+    EXPECT_EQ(run.config.size(), t.codec_private_size == 0 ? 0u : vorbis ? 3u : 1u);
+    EXPECT_TRUE(vorbis ? total < t.codec_private_size : total == t.codec_private_size)
+        << total << " bytes of decoder configuration, CodecPrivate " << t.codec_private_size;
   }
 }
 
