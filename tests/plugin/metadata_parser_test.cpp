@@ -35,17 +35,6 @@ struct ParsedBlock {
   int result = -1;
 };
 
-std::string Text(const MmfMetadataValue& value) {
-  return std::string(static_cast<const char*>(MmfMetadataData(&value)), static_cast<size_t>(value.Size));
-}
-
-uint32_t Num4(const MmfMetadataValue& value) {
-  uint32_t number = 0;
-  EXPECT_EQ(value.Size, 4);
-  std::memcpy(&number, MmfMetadataData(&value), sizeof number);
-  return number;
-}
-
 struct Found {
   int answer;
   MmfMetadataValue value;
@@ -143,10 +132,13 @@ TEST(ParserQueryMetadataTest, KeysOccurrencesAndPictureSize) {
     ASSERT_EQ(parsed.result, 0);
     Found found = Query(parsed.block, c.key, c.occurrence);
     EXPECT_EQ(found.answer, c.answer);
+    uint32_t number = 0;
     if (found.answer == 1) {
       EXPECT_EQ(found.value.Type, uint32_t{kMmfMetadataNum4});
-      EXPECT_EQ(Num4(found.value), c.number);
+      EXPECT_EQ(found.value.Size, 4);
+      std::memcpy(&number, MmfMetadataData(&found.value), sizeof number);
     }
+    EXPECT_EQ(number, c.number);
   }
 }
 
@@ -191,7 +183,8 @@ TEST(ParserGetMetadataTest, InstanceBlockIsHandedOutAndSurvivesParserFree) {
       Ops().Parser_FreeMetadata(block);
       Found name = Query(block, "name", 0);
       ASSERT_EQ(name.answer, 1);
-      EXPECT_EQ(Text(name.value), LoadFixture("tags").tags.at(0).second);
+      EXPECT_EQ(std::string(static_cast<const char*>(MmfMetadataData(&name.value)), size_t(name.value.Size)),
+                LoadFixture("tags").tags.at(0).second);
     }
     EXPECT_EQ(host::LiveBlockCount(), live_before);
   }

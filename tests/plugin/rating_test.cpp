@@ -39,17 +39,6 @@ uint32_t Fourcc(const std::string& code) {
   return uint32_t(code.at(0)) << 24 | uint32_t(code.at(1)) << 16 | uint32_t(code.at(2)) << 8 | uint32_t(code.at(3));
 }
 
-// FLAC's STREAMINFO is unpacked into the format's own configuration record.
-void CheckFlacConfig(const ExpectedTrack& track, const MkvChannel& channel) {
-  ASSERT_EQ(channel.Format.extra_size, 48u);
-  mkv_flac_config config;
-  std::memcpy(&config, channel.Format.extra_ptr, sizeof config);
-  EXPECT_EQ(config.sample_rate, track.flac_sample_rate);
-  EXPECT_EQ(config.channels, track.flac_channels);
-  EXPECT_EQ(config.bits_per_sample, track.flac_bits);
-  EXPECT_EQ(channel.State->DecoderConfigCount, 1u);
-}
-
 // Which channels are offered, in which order, with which code, picture size
 // and sample rate is checked on every fixture through the tool (check_probe.sh).
 void CheckChannel(const FixtureExpectation& fx, const ExpectedTrack& track, const MkvChannel& channel) {
@@ -77,7 +66,15 @@ void CheckChannel(const FixtureExpectation& fx, const ExpectedTrack& track, cons
     EXPECT_EQ(format.media.audio.channels, track.channels ? track.channels : 1);
     EXPECT_EQ(format.media.audio.bits_per_sample, 16u);
   }
-  if (track.codec == "A_FLAC") CheckFlacConfig(track, channel);
+  if (track.codec != "A_FLAC") return;
+  // FLAC's STREAMINFO is unpacked into the format's own configuration record.
+  ASSERT_EQ(format.extra_size, 48u);
+  mkv_flac_config config;
+  std::memcpy(&config, format.extra_ptr, sizeof config);
+  EXPECT_EQ(config.sample_rate, track.flac_sample_rate);
+  EXPECT_EQ(config.channels, track.flac_channels);
+  EXPECT_EQ(config.bits_per_sample, track.flac_bits);
+  EXPECT_EQ(channel.State->DecoderConfigCount, 1u);
 }
 
 TEST(RateInputFormatFixturesTest, OffersEverySupportedTrackWithItsFormat) {
@@ -187,13 +184,6 @@ const MmfReadRequest& NextScanRequest(const Connected& c) {
   return *next->Request;
 }
 
-int ToPosition(const Connected& c, uint64_t time, uint64_t* position) {
-  return HostPlugin().converter()->ConvertToPosition(c.graph->handle(), 0, time, position);
-}
-int ToTime(const Connected& c, uint64_t position, uint64_t* time) {
-  return HostPlugin().converter()->ConvertToTime(c.graph->handle(), 0, position, time);
-}
-
 constexpr uint64_t kPast48Bits = 281474977000;  // ms: 2^48 us and a bit
 
 Bytes EncryptedTrack(uint64_t number, const Bytes& encryption) {
@@ -267,9 +257,10 @@ std::vector<Case> Cases() {
        [](auto& c, auto&, auto&) {
          EXPECT_EQ(c.context()->ByteRate, 800);
          uint64_t position = 0, time = 0;
-         EXPECT_EQ(ToPosition(c, kPast48Bits * 1000 + 1000001, &position), 0);
+         const MmfTimeConverterOps& converter = *HostPlugin().converter();
+         EXPECT_EQ(converter.ConvertToPosition(c.graph->handle(), 0, kPast48Bits * 1000 + 1000001, &position), 0);
          EXPECT_EQ(position, InFile(c, 900));
-         EXPECT_EQ(ToTime(c, position, &time), 0);
+         EXPECT_EQ(converter.ConvertToTime(c.graph->handle(), 0, position, &time), 0);
          EXPECT_EQ(time, (kPast48Bits + 1000) * 1000);
        }},
       {"a seek to a cue position with a codec state",

@@ -35,10 +35,6 @@ struct Read {
   bool operator==(const Read&) const = default;
 };
 
-std::ostream& operator<<(std::ostream& out, const Read& r) {
-  return out << "{" << r.time << " us at " << r.offset << ", " << r.bytes << " bytes}";
-}
-
 // A file with the streamer, its list maker and the graph clock connected as
 // the framework connects them; `channels` are the outputs acquired. With
 // `plays` the plug-in reads its input from the streamer in buffers of 4096.
