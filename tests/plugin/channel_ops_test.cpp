@@ -15,7 +15,6 @@ namespace {
 
 using host::FrameworkCall;
 using plugin_test::Connected;
-using plugin_test::ConnectFile;
 using plugin_test::HostPlugin;
 
 enum class Op { kAcquire, kRelease, kSetFormat, kSetPool, kNextBuffer, kReadList };
@@ -40,7 +39,7 @@ struct Sequence {
 Connected Unconfigured(const char* fixture = "avc_aac") {
   host::SetupOptions options;
   options.configure_outputs = false;
-  return ConnectFile(fixture, true, options);
+  return plugin_test::ConnectFile(fixture, true, options);
 }
 
 TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {

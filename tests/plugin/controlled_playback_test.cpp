@@ -13,7 +13,6 @@
 
 #include "filter/mkv_context.h"
 #include "host/graph_runner.h"
-#include "host/memory_pools.h"
 #include "platform/mmf_status.h"
 #include "tests/plugin/graph_harness.h"
 #include "tests/support/playback_expectations.h"

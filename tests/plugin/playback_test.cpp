@@ -5,7 +5,6 @@
 // type of each track type. (Every fixture is played in tests/conformance.)
 
 #include <algorithm>
-#include <cstdio>
 #include <fstream>
 #include <span>
 #include <string>

@@ -26,14 +26,11 @@
 namespace {
 
 using namespace ebml;
-using plugin_test::ConnectBytes;
-using plugin_test::ConnectFile;
 using plugin_test::Connected;
 using plugin_test::FixtureFile;
 using plugin_test::HostPlugin;
 using testing_support::ExpectedTrack;
 using testing_support::FixtureExpectation;
-using testing_support::LogRecorder;
 
 uint32_t Fourcc(const std::string& code) {
   return uint32_t(code.at(0)) << 24 | uint32_t(code.at(1)) << 16 | uint32_t(code.at(2)) << 8 | uint32_t(code.at(3));
@@ -81,7 +78,7 @@ TEST(RateInputFormatFixturesTest, OffersEverySupportedTrackWithItsFormat) {
   for (const std::string& name : testing_support::FixtureNames()) {
     SCOPED_TRACE(name);
     FixtureExpectation fx = testing_support::LoadFixture(name);
-    Connected c = ConnectFile(name);
+    Connected c = plugin_test::ConnectFile(name);
     ASSERT_TRUE(c.graph);
     const bool matroska = fx.doc_type == "matroska";
     EXPECT_EQ(c.graph->sniff(), matroska ? 80 : 0);
@@ -286,8 +283,8 @@ std::vector<Case> Cases() {
 TEST(RateInputFormatCasesTest, TrackSetUpFollowsTheCodecRules) {
   for (const Case& test : Cases()) {
     SCOPED_TRACE(test.name);
-    LogRecorder log;
-    Connected c = ConnectBytes(test.file);
+    testing_support::LogRecorder log;
+    Connected c = plugin_test::ConnectBytes(test.file);
     ASSERT_EQ(c.graph->rating(), 80);
     ASSERT_GE(c.channel_count(), 1);
     test.check(c, *c.channel(0).State, c.channel(0).Format);
