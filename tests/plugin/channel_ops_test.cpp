@@ -163,20 +163,19 @@ TEST(OutputChannelOrderTest, ReleaseGivesTheFramePrefixBufferBackOnce) {
   }
 }
 
-// The offered format's other fields are pinned by the rating of every fixture.
-TEST(OutputChannelListTest, ChannelsAndFormatsAreListedOncePerChannelIndex) {
+// The set-up's walk over the channels and their formats (one format per
+// channel, as many times as there are channels) is pinned by the rating of
+// every fixture, the offered format's fields too.
+TEST(OutputChannelListTest, ChannelsAreListedFromTheIteratorAndFormatsMatchOnTheBufferSize) {
   const MmfMediaOutputOps& ops = *HostPlugin().output();
   Connected c = Unconfigured();
   int32_t iterator = 1;
-  EXPECT_EQ(ops.IterateOutputChannels(c.graph->handle(), &iterator), AsFrameworkChannel(&c.channel(1)));
+  MmfChannel* second = AsFrameworkChannel(&c.channel(1));
+  EXPECT_EQ(ops.IterateOutputChannels(c.graph->handle(), &iterator), second);
   EXPECT_EQ(ops.IterateOutputChannels(c.graph->handle(), &iterator), nullptr);
   EXPECT_EQ(iterator, 2);
-  MmfChannel* second = AsFrameworkChannel(&c.channel(1));
-  MmfMediaFormat offered{};
-  iterator = 0;
-  for (int answer : {100, 100, 0}) EXPECT_EQ(ops.IterateOutputFormats(second, &offered, &iterator), answer);
-  EXPECT_EQ(c.channel(1).Format.buffer_count, 0u);
-  MmfMediaFormat other = offered;
+  MmfMediaFormat offered = c.graph->outputs()[1].offered, other = offered;
+  EXPECT_EQ(c.channel(1).Format.buffer_count, 0u) << "the ring's buffers are added to the copy offered";
   EXPECT_EQ(ops.VerifyOutputFormat(second, &offered, &other), 100);
   other.buffer_size += 1;
   EXPECT_EQ(ops.VerifyOutputFormat(second, &offered, &other), 0);

@@ -24,15 +24,13 @@ const MmfMediaFilterOps& Filter() { return *HostPlugin().filter(); }
 // The first two Create calls of the process, made before any test runs.
 std::string first_names[2];
 
-class FirstInstancesEnvironment : public testing::Environment {
- public:
+struct FirstInstancesEnvironment : testing::Environment {
   void SetUp() override {
-    MmfFilterHandle* first = Filter().Create();
-    MmfFilterHandle* second = Filter().Create();
-    first_names[0] = first ? first->Name : "";
-    first_names[1] = second ? second->Name : "";
-    Filter().Destroy(first);
-    Filter().Destroy(second);
+    MmfFilterHandle* const made[2] = {Filter().Create(), Filter().Create()};
+    for (int i = 0; i < 2; ++i) {
+      first_names[i] = made[i] ? made[i]->Name : "";
+      Filter().Destroy(made[i]);
+    }
   }
 };
 [[maybe_unused]] const testing::Environment* const first_instances =
