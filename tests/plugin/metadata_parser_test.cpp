@@ -82,9 +82,10 @@ TEST(ParserParseMetadataTest, RefusedInputLeavesNoBlock) {
   }
 }
 
-TEST(ParserMetadataTest, NullArgumentsAnswer22) {
+TEST(ParserMetadataTest, NullArgumentsAnswer22AndAnInstanceNotRatedHasNoBlock) {
   ParsedBlock parsed("tags");
-  MmfMetadata* block = nullptr;
+  auto* const untouched = reinterpret_cast<MmfMetadata*>(0x1234);
+  MmfMetadata* block = untouched;
   MmfMetadataValue value{};
   int32_t index = 0;
   char* key = nullptr;
@@ -101,6 +102,8 @@ TEST(ParserMetadataTest, NullArgumentsAnswer22) {
   EXPECT_EQ(Ops().Parser_GetMetadata(handle, nullptr), 22);
   EXPECT_EQ(Ops().Parser_GetMetadata(nullptr, &block), 22);
   Ops().Parser_FreeMetadata(nullptr);
+  EXPECT_EQ(Ops().Parser_GetMetadata(handle, &block), 4044) << "an instance not rated has no block";
+  EXPECT_EQ(block, untouched);
   plugin_test::HostPlugin().filter()->Destroy(handle);
 }
 
@@ -164,14 +167,7 @@ TEST(ParserFreeMetadataTest, FreesOnlyBlocksOfACompleteParseThatNoInstanceOwns) 
 // flag bit 0): a block freed twice would show in the live count (or to ASan).
 TEST(ParserGetMetadataTest, InstanceBlockIsHandedOutAndSurvivesParserFree) {
   const int64_t live_before = host::LiveBlockCount();
-  MmfFilterHandle* handle = plugin_test::HostPlugin().filter()->Create();
-  ASSERT_NE(handle, nullptr);
-  auto* untouched = reinterpret_cast<MmfMetadata*>(0x1234);
-  MmfMetadata* block = untouched;
-  EXPECT_EQ(Ops().Parser_GetMetadata(handle, &block), 4044);
-  EXPECT_EQ(block, untouched);
-  EXPECT_EQ(plugin_test::HostPlugin().filter()->Destroy(handle), 0);
-
+  MmfMetadata* block = nullptr;
   for (uint32_t graph_flags : {0u, 1u}) {
     SCOPED_TRACE(graph_flags);
     {
