@@ -35,17 +35,6 @@ struct ParsedBlock {
   int result = -1;
 };
 
-struct Found {
-  int answer;
-  MmfMetadataValue value;
-};
-
-Found Query(MmfMetadata* block, const char* key, uint32_t occurrence) {
-  Found found{};
-  found.answer = Ops().Parser_QueryMetadata(block, key, occurrence, &found.value);
-  return found;
-}
-
 // Not Matroska (also WebM), an EBML header with nothing after it, and a
 // stream that cannot go back to 0: no block, nothing leaked, the stream at 0.
 TEST(ParserParseMetadataTest, RefusedInputLeavesNoBlock) {
@@ -133,13 +122,14 @@ TEST(ParserQueryMetadataTest, KeysOccurrencesAndPictureSize) {
     SCOPED_TRACE(std::string(c.fixture) + " " + c.key + " #" + std::to_string(c.occurrence));
     ParsedBlock parsed(c.fixture);
     ASSERT_EQ(parsed.result, 0);
-    Found found = Query(parsed.block, c.key, c.occurrence);
-    EXPECT_EQ(found.answer, c.answer);
+    MmfMetadataValue value{};
+    const int answer = Ops().Parser_QueryMetadata(parsed.block, c.key, c.occurrence, &value);
+    EXPECT_EQ(answer, c.answer);
     uint32_t number = 0;
-    if (found.answer == 1) {
-      EXPECT_EQ(found.value.Type, uint32_t{kMmfMetadataNum4});
-      EXPECT_EQ(found.value.Size, 4);
-      std::memcpy(&number, MmfMetadataData(&found.value), sizeof number);
+    if (answer == 1) {
+      EXPECT_EQ(value.Type, uint32_t{kMmfMetadataNum4});
+      EXPECT_EQ(value.Size, 4);
+      std::memcpy(&number, MmfMetadataData(&value), sizeof number);
     }
     EXPECT_EQ(number, c.number);
   }
@@ -177,9 +167,9 @@ TEST(ParserGetMetadataTest, InstanceBlockIsHandedOutAndSurvivesParserFree) {
       ASSERT_EQ(Ops().Parser_GetMetadata(c.graph->handle(), &block), 0);
       EXPECT_EQ(c.context()->Metadata->source_stream, graph_flags ? c.stream->record() : nullptr);
       Ops().Parser_FreeMetadata(block);
-      Found name = Query(block, "name", 0);
-      ASSERT_EQ(name.answer, 1);
-      EXPECT_EQ(std::string(static_cast<const char*>(MmfMetadataData(&name.value)), size_t(name.value.Size)),
+      MmfMetadataValue name{};
+      ASSERT_EQ(Ops().Parser_QueryMetadata(block, "name", 0, &name), 1);
+      EXPECT_EQ(std::string(static_cast<const char*>(MmfMetadataData(&name)), size_t(name.Size)),
                 LoadFixture("tags").tags.at(0).second);
     }
     EXPECT_EQ(host::LiveBlockCount(), live_before);
