@@ -55,12 +55,6 @@ Bytes OneCluster(std::initializer_list<Bytes> blocks, uint64_t track_type = 2) {
   return MatroskaFile(cat({AudioHeader(track_type), element(kCluster, cluster)}));
 }
 
-std::string WriteTemp(const Bytes& bytes, const std::string& name) {
-  std::string path = testing::TempDir() + name;
-  std::ofstream(path, std::ios::binary).write(reinterpret_cast<const char*>(bytes.data()), bytes.size());
-  return path;
-}
-
 // Each element's property type (0 for a buffer element), as the sinks consumed them.
 void Record(void* user, int32_t, MmfMra* mra) {
   for (const host::MraElement& e : std::span(host::MraElements(mra), mra->ElementCount)) {
@@ -100,7 +94,8 @@ class PlaybackLaceTest : public testing::TestWithParam<LaceCase> {};
 
 TEST_P(PlaybackLaceTest, DeliversEveryFrameOnceAndPassesOverTheRest) {
   const LaceCase& c = GetParam();
-  const std::string path = WriteTemp(c.file, std::string(c.name) + ".mkv");
+  const std::string path = testing::TempDir() + c.name + ".mkv";
+  std::ofstream(path, std::ios::binary).write(reinterpret_cast<const char*>(c.file.data()), c.file.size());
   std::vector<std::pair<uint32_t, uint32_t>> want;
   for (const Bytes& f : c.frames) want.emplace_back(f.size(), testing_support::Adler32(f.data(), f.size()));
   for (uint32_t size : {7u, 64u, 100u, 1000u, 32768u}) {
