@@ -15,7 +15,6 @@ namespace {
 
 using host::FrameworkCall;
 using plugin_test::Connected;
-using plugin_test::ConnectFile;
 using plugin_test::HostPlugin;
 
 enum class Op { kAcquire, kRelease, kSetFormat, kSetPool, kNextBuffer, kReadList };
@@ -40,7 +39,7 @@ struct Sequence {
 Connected Unconfigured(const char* fixture = "avc_aac") {
   host::SetupOptions options;
   options.configure_outputs = false;
-  return ConnectFile(fixture, true, options);
+  return plugin_test::ConnectFile(fixture, true, options);
 }
 
 TEST(OutputChannelOrderTest, EachOperationAnswersByTheChannelState) {
@@ -139,55 +138,31 @@ TEST(OutputChannelOrderTest, NullArgumentsAnswer22) {
   EXPECT_EQ(ops.IterateOutputChannels(nullptr, &iterator), nullptr);
 }
 
-TEST(OutputChannelOrderTest, ReleaseGivesTheFramePrefixBufferBackOnce) {
-  const MmfMediaOutputOps& ops = *HostPlugin().output();
-  host::MemoryPool input_pool(64, 2);
-  static const MmfMediaOutputOps upstream{};
-  Connected c = Unconfigured();
-  MmfChannel* input = c.graph->handle()->InputChannel;
-  input->Flags |= 1u;
-  ASSERT_EQ(HostPlugin().input()->SetMediaOutput(input, &upstream), 0);
-  ASSERT_EQ(HostPlugin().input()->SetInputChannelMemoryPool(input, host::MemoryPool::Ops(), input_pool.handle()), 0);
-  MmfChannel* channel = AsFrameworkChannel(&c.channel(0));
-  for (int round = 0; round < 2; ++round) {
-    SCOPED_TRACE(round);
-    ASSERT_EQ(ops.AcquireOutputChannel(channel), 0);
-    if (round == 0) {
-      MmfPoolBuffer* prefix = nullptr;
-      ASSERT_EQ(host::MemoryPool::Ops()->AcquireBuffer(input_pool.handle(), &prefix, 0), 0);
-      host::MemoryPool::Ops()->MapBuffer(prefix);
-      c.channel(0).State->ConfigBuffer = prefix;
-    }
-    ASSERT_EQ(ops.ReleaseOutputChannel(channel), 0);
-    EXPECT_EQ(input_pool.FreeCount(), 2u);
-    EXPECT_EQ(c.channel(0).State->ConfigBuffer, nullptr);
-  }
-}
-
-// The offered format's other fields are pinned by the rating of every fixture.
-TEST(OutputChannelListTest, ChannelsAndFormatsAreListedOncePerChannelIndex) {
+// The set-up's walk over the channels and their formats (one format per
+// channel, as many times as there are channels) is pinned by the rating of
+// every fixture, the offered format's fields too.
+TEST(OutputChannelListTest, ChannelsAreListedFromTheIteratorAndFormatsMatchOnTheBufferSize) {
   const MmfMediaOutputOps& ops = *HostPlugin().output();
   Connected c = Unconfigured();
   int32_t iterator = 1;
-  EXPECT_EQ(ops.IterateOutputChannels(c.graph->handle(), &iterator), AsFrameworkChannel(&c.channel(1)));
+  MmfChannel* second = AsFrameworkChannel(&c.channel(1));
+  EXPECT_EQ(ops.IterateOutputChannels(c.graph->handle(), &iterator), second);
   EXPECT_EQ(ops.IterateOutputChannels(c.graph->handle(), &iterator), nullptr);
   EXPECT_EQ(iterator, 2);
-  MmfChannel* second = AsFrameworkChannel(&c.channel(1));
-  MmfMediaFormat offered{};
-  iterator = 0;
-  for (int answer : {100, 100, 0}) EXPECT_EQ(ops.IterateOutputFormats(second, &offered, &iterator), answer);
-  EXPECT_EQ(c.channel(1).Format.buffer_count, 0u);
-  MmfMediaFormat other = offered;
+  MmfMediaFormat offered = c.graph->outputs()[1].offered, other = offered;
+  EXPECT_EQ(c.channel(1).Format.buffer_count, 0u) << "the ring's buffers are added to the copy offered";
   EXPECT_EQ(ops.VerifyOutputFormat(second, &offered, &other), 100);
   other.buffer_size += 1;
   EXPECT_EQ(ops.VerifyOutputFormat(second, &offered, &other), 0);
   EXPECT_EQ(ops.VerifyOutputFormat(second, &offered, nullptr), 0);
 }
 
-TEST(InputChannelOrderTest, FormatThenMediaOutputThenPool) {
+// Then an output channel's frame prefix buffer, from that input pool, goes
+// back to it once at the channel's release.
+TEST(InputChannelOrderTest, FormatThenMediaOutputThenPoolWhoseFramePrefixBufferReleaseGivesBackOnce) {
   const MmfMediaInputOps& ops = *HostPlugin().input();
   static const MmfMediaOutputOps upstream{};
-  host::MemoryPool pool(4096, 1);
+  host::MemoryPool pool(64, 2);
   Connected c = Unconfigured();
   MmfChannel* input = c.graph->handle()->InputChannel;
   MmfMediaFormat format = c.graph->input_format();
@@ -206,6 +181,22 @@ TEST(InputChannelOrderTest, FormatThenMediaOutputThenPool) {
   EXPECT_EQ(ops.SetInputChannelMemoryPool(input, host::MemoryPool::Ops(), pool.handle()), 0);
   EXPECT_EQ(c.context()->MediaOutput, &upstream);
   EXPECT_EQ(c.context()->InputPoolParam, pool.handle());
+
+  const MmfMediaOutputOps& output = *HostPlugin().output();
+  MmfChannel* channel = AsFrameworkChannel(&c.channel(0));
+  for (int round = 0; round < 2; ++round) {
+    SCOPED_TRACE(round);
+    ASSERT_EQ(output.AcquireOutputChannel(channel), 0);
+    if (round == 0) {
+      MmfPoolBuffer* prefix = nullptr;
+      ASSERT_EQ(host::MemoryPool::Ops()->AcquireBuffer(pool.handle(), &prefix, 0), 0);
+      host::MemoryPool::Ops()->MapBuffer(prefix);
+      c.channel(0).State->ConfigBuffer = prefix;
+    }
+    ASSERT_EQ(output.ReleaseOutputChannel(channel), 0);
+    EXPECT_EQ(pool.FreeCount(), 2u);
+    EXPECT_EQ(c.channel(0).State->ConfigBuffer, nullptr);
+  }
 }
 
 }  // namespace

@@ -13,7 +13,6 @@
 
 #include "filter/mkv_context.h"
 #include "host/graph_runner.h"
-#include "host/memory_pools.h"
 #include "platform/mmf_status.h"
 #include "tests/plugin/graph_harness.h"
 #include "tests/support/playback_expectations.h"
@@ -24,39 +23,26 @@ using namespace playback_test;
 
 enum class Op { kStart, kStop, kPause, kResume, kStatus };
 
-struct ControlCase {
-  const char* name;
-  uint32_t before;
-  Op op;
-  int result;  // -1: the state after (Status)
-  uint32_t after;
-};
-
-class MediaControlTest : public testing::TestWithParam<ControlCase> {};
-
-TEST_P(MediaControlTest, OperationMovesTheState) {
-  const ControlCase& c = GetParam();
+TEST(MediaControlTest, EachOperationMovesTheState) {
+  const struct {
+    uint32_t before;
+    Op op;
+    int result;  // -1: the state after (Status)
+    uint32_t after;
+  } rows[] = {{16, Op::kStart, 0, 64}, {64, Op::kResume, 0, 256}, {256, Op::kPause, 0, 64}, {1, Op::kPause, 0, 64},
+              {16, Op::kPause, 0, 16},  // paused when stopped: nothing changes
+              {64, Op::kStop, 0, 16}, {16, Op::kStop, 0, 16}, {1, Op::kStop, 4041, 16}, {256, Op::kStatus, -1, 256}};
   plugin_test::Connected connected = plugin_test::ConnectFile("tiny_avc");
   ASSERT_TRUE(connected.graph->rated());
-  connected.context()->ControlState = c.before;
   const auto* control = plugin_test::HostPlugin().Get<MmfMediaControlOps>("MediaControl");
   int (*const call[])(MmfFilterHandle*) = {control->Start, control->Stop, control->Pause, control->Resume, control->Status};
-  EXPECT_EQ(call[int(c.op)](connected.graph->handle()), c.result == -1 ? int(c.after) : c.result);
-  EXPECT_EQ(connected.context()->ControlState, c.after);
+  for (const auto& c : rows) {
+    SCOPED_TRACE(testing::Message() << "operation " << int(c.op) << " in state " << c.before);
+    connected.context()->ControlState = c.before;
+    EXPECT_EQ(call[int(c.op)](connected.graph->handle()), c.result == -1 ? int(c.after) : c.result);
+    EXPECT_EQ(connected.context()->ControlState, c.after);
+  }
 }
-
-INSTANTIATE_TEST_SUITE_P(
-    States, MediaControlTest,
-    testing::Values(ControlCase{"StartFromStopped", 16, Op::kStart, 0, 64},
-                    ControlCase{"ResumeFromRunning", 64, Op::kResume, 0, 256},
-                    ControlCase{"PauseAfterResume", 256, Op::kPause, 0, 64},
-                    ControlCase{"PauseAfterError", 1, Op::kPause, 0, 64},
-                    ControlCase{"PauseWhenStoppedChangesNothing", 16, Op::kPause, 0, 16},
-                    ControlCase{"StopWhenRunning", 64, Op::kStop, 0, 16},
-                    ControlCase{"StopWhenStopped", 16, Op::kStop, 0, 16},
-                    ControlCase{"StopAfterErrorAnswers4041", 1, Op::kStop, 4041, 16},
-                    ControlCase{"StatusAnswersTheState", 256, Op::kStatus, -1, 256}),
-    [](const testing::TestParamInfo<ControlCase>& info) { return info.param.name; });
 
 // The metadata event goes out once, at the first call, whatever the state.
 TEST(MediaControlNextBufferTest, StatesBelowRunningExceptFourAreAnsweredAtOnce) {

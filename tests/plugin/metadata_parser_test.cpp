@@ -35,28 +35,6 @@ struct ParsedBlock {
   int result = -1;
 };
 
-std::string Text(const MmfMetadataValue& value) {
-  return std::string(static_cast<const char*>(MmfMetadataData(&value)), static_cast<size_t>(value.Size));
-}
-
-uint32_t Num4(const MmfMetadataValue& value) {
-  uint32_t number = 0;
-  EXPECT_EQ(value.Size, 4);
-  std::memcpy(&number, MmfMetadataData(&value), sizeof number);
-  return number;
-}
-
-struct Found {
-  int answer;
-  MmfMetadataValue value;
-};
-
-Found Query(MmfMetadata* block, const char* key, uint32_t occurrence) {
-  Found found{};
-  found.answer = Ops().Parser_QueryMetadata(block, key, occurrence, &found.value);
-  return found;
-}
-
 // Not Matroska (also WebM), an EBML header with nothing after it, and a
 // stream that cannot go back to 0: no block, nothing leaked, the stream at 0.
 TEST(ParserParseMetadataTest, RefusedInputLeavesNoBlock) {
@@ -93,9 +71,10 @@ TEST(ParserParseMetadataTest, RefusedInputLeavesNoBlock) {
   }
 }
 
-TEST(ParserMetadataTest, NullArgumentsAnswer22) {
+TEST(ParserMetadataTest, NullArgumentsAnswer22AndAnInstanceNotRatedHasNoBlock) {
   ParsedBlock parsed("tags");
-  MmfMetadata* block = nullptr;
+  auto* const untouched = reinterpret_cast<MmfMetadata*>(0x1234);
+  MmfMetadata* block = untouched;
   MmfMetadataValue value{};
   int32_t index = 0;
   char* key = nullptr;
@@ -112,6 +91,8 @@ TEST(ParserMetadataTest, NullArgumentsAnswer22) {
   EXPECT_EQ(Ops().Parser_GetMetadata(handle, nullptr), 22);
   EXPECT_EQ(Ops().Parser_GetMetadata(nullptr, &block), 22);
   Ops().Parser_FreeMetadata(nullptr);
+  EXPECT_EQ(Ops().Parser_GetMetadata(handle, &block), 4044) << "an instance not rated has no block";
+  EXPECT_EQ(block, untouched);
   plugin_test::HostPlugin().filter()->Destroy(handle);
 }
 
@@ -141,12 +122,16 @@ TEST(ParserQueryMetadataTest, KeysOccurrencesAndPictureSize) {
     SCOPED_TRACE(std::string(c.fixture) + " " + c.key + " #" + std::to_string(c.occurrence));
     ParsedBlock parsed(c.fixture);
     ASSERT_EQ(parsed.result, 0);
-    Found found = Query(parsed.block, c.key, c.occurrence);
-    EXPECT_EQ(found.answer, c.answer);
-    if (found.answer == 1) {
-      EXPECT_EQ(found.value.Type, uint32_t{kMmfMetadataNum4});
-      EXPECT_EQ(Num4(found.value), c.number);
+    MmfMetadataValue value{};
+    const int answer = Ops().Parser_QueryMetadata(parsed.block, c.key, c.occurrence, &value);
+    EXPECT_EQ(answer, c.answer);
+    uint32_t number = 0;
+    if (answer == 1) {
+      EXPECT_EQ(value.Type, uint32_t{kMmfMetadataNum4});
+      EXPECT_EQ(value.Size, 4);
+      std::memcpy(&number, MmfMetadataData(&value), sizeof number);
     }
+    EXPECT_EQ(number, c.number);
   }
 }
 
@@ -172,14 +157,7 @@ TEST(ParserFreeMetadataTest, FreesOnlyBlocksOfACompleteParseThatNoInstanceOwns) 
 // flag bit 0): a block freed twice would show in the live count (or to ASan).
 TEST(ParserGetMetadataTest, InstanceBlockIsHandedOutAndSurvivesParserFree) {
   const int64_t live_before = host::LiveBlockCount();
-  MmfFilterHandle* handle = plugin_test::HostPlugin().filter()->Create();
-  ASSERT_NE(handle, nullptr);
-  auto* untouched = reinterpret_cast<MmfMetadata*>(0x1234);
-  MmfMetadata* block = untouched;
-  EXPECT_EQ(Ops().Parser_GetMetadata(handle, &block), 4044);
-  EXPECT_EQ(block, untouched);
-  EXPECT_EQ(plugin_test::HostPlugin().filter()->Destroy(handle), 0);
-
+  MmfMetadata* block = nullptr;
   for (uint32_t graph_flags : {0u, 1u}) {
     SCOPED_TRACE(graph_flags);
     {
@@ -189,9 +167,10 @@ TEST(ParserGetMetadataTest, InstanceBlockIsHandedOutAndSurvivesParserFree) {
       ASSERT_EQ(Ops().Parser_GetMetadata(c.graph->handle(), &block), 0);
       EXPECT_EQ(c.context()->Metadata->source_stream, graph_flags ? c.stream->record() : nullptr);
       Ops().Parser_FreeMetadata(block);
-      Found name = Query(block, "name", 0);
-      ASSERT_EQ(name.answer, 1);
-      EXPECT_EQ(Text(name.value), LoadFixture("tags").tags.at(0).second);
+      MmfMetadataValue name{};
+      ASSERT_EQ(Ops().Parser_QueryMetadata(block, "name", 0, &name), 1);
+      EXPECT_EQ(std::string(static_cast<const char*>(MmfMetadataData(&name)), size_t(name.Size)),
+                LoadFixture("tags").tags.at(0).second);
     }
     EXPECT_EQ(host::LiveBlockCount(), live_before);
   }

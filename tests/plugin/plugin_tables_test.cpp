@@ -24,15 +24,13 @@ const MmfMediaFilterOps& Filter() { return *HostPlugin().filter(); }
 // The first two Create calls of the process, made before any test runs.
 std::string first_names[2];
 
-class FirstInstancesEnvironment : public testing::Environment {
- public:
+struct FirstInstancesEnvironment : testing::Environment {
   void SetUp() override {
-    MmfFilterHandle* first = Filter().Create();
-    MmfFilterHandle* second = Filter().Create();
-    first_names[0] = first ? first->Name : "";
-    first_names[1] = second ? second->Name : "";
-    Filter().Destroy(first);
-    Filter().Destroy(second);
+    MmfFilterHandle* const made[2] = {Filter().Create(), Filter().Create()};
+    for (int i = 0; i < 2; ++i) {
+      first_names[i] = made[i] ? made[i]->Name : "";
+      Filter().Destroy(made[i]);
+    }
   }
 };
 [[maybe_unused]] const testing::Environment* const first_instances =
@@ -160,13 +158,6 @@ class ResourcesTest : public testing::Test {
 
   const AoResourceAccessOps& Ops() { return *HostPlugin().resources(); }
   int Set(const char* name, int32_t value) { return Ops().SetResource(handle_, name, &value); }
-  int32_t Int32(const char* name) {
-    for (const AoResource* row = Ops().GetResources(handle_); row && row->Name; ++row) {
-      if (std::strcmp(row->Name, name) == 0) return *static_cast<const int32_t*>(row->Value);
-    }
-    ADD_FAILURE() << "no resource " << name;
-    return 0;
-  }
 
   MmfFilterHandle* handle_ = nullptr;
   MkvContext* context_ = nullptr;
@@ -221,25 +212,27 @@ TEST_F(ResourcesTest, TableRowsPointIntoThisInstanceWithTheirRanges) {
   EXPECT_TRUE(end.Name == nullptr && end.Value == nullptr && end.Type == 0);
 }
 
+// Each row's value is read back from the context field that its resource row points to.
 struct SetCase {
   const char* name;
   int32_t value;
   int result;
-  const char* read_back;  // resource whose value is checked, or null
+  int32_t MkvContext::*read_back;  // or null
   int32_t stored;
 };
 
 const SetCase kSetCases[] = {
-    {"TrickTime", 2000, 0, "TrickTime", 1000},          {"TrickTime", 750, 0, "TrickTime", 750},
-    {"TrickTime", -5, 0, "TrickTime", 500},
-    {"TrickPlaySkipStartSpeed", 0, 0, "TrickPlaySkipStartSpeed", 500},
-    {"TrickPlaySkipStartSpeed", 1001, 0, "TrickPlaySkipStartSpeed", 1000},
-    {"EnablePreroll", -kMax32 - 1, 0, "EnablePreroll", -kMax32},
-    {"EnablePreroll", kMax32, 0, "EnablePreroll", kMax32},
-    {"Duration", 5, 1, nullptr, 0},                     {"TrackAudioLang", 5, 1, nullptr, 0},
-    {"TrackCountAudio", 5, 1, "TrackCountAudio", 0},    {"AVSyncDelay", 5, 22, "AVSyncDelay", 0},
-    {"CurrentAudioTrack", 5, 22, "CurrentAudioTrack", 0}, {"tricktime", 700, 4032, "TrickTime", 500},
-    {"TrickTime ", 700, 4032, "TrickTime", 500},        {"Volume", 1, 4032, nullptr, 0},
+    {"TrickTime", 2000, 0, &MkvContext::TrickTime, 1000}, {"TrickTime", 750, 0, &MkvContext::TrickTime, 750},
+    {"TrickTime", -5, 0, &MkvContext::TrickTime, 500},
+    {"TrickPlaySkipStartSpeed", 0, 0, &MkvContext::TrickPlaySkipStartSpeed, 500},
+    {"TrickPlaySkipStartSpeed", 1001, 0, &MkvContext::TrickPlaySkipStartSpeed, 1000},
+    {"EnablePreroll", -kMax32 - 1, 0, &MkvContext::EnablePreroll, -kMax32},
+    {"EnablePreroll", kMax32, 0, &MkvContext::EnablePreroll, kMax32}, {"Duration", 5, 1, nullptr, 0},
+    {"TrackAudioLang", 5, 1, nullptr, 0}, {"TrackCountAudio", 5, 1, &MkvContext::TrackCountAudio, 0},
+    {"AVSyncDelay", 5, 22, &MkvContext::AVSyncDelay, 0},
+    {"CurrentAudioTrack", 5, 22, &MkvContext::CurrentAudioTrack, 0},
+    {"tricktime", 700, 4032, &MkvContext::TrickTime, 500},
+    {"TrickTime ", 700, 4032, &MkvContext::TrickTime, 500}, {"Volume", 1, 4032, nullptr, 0},
 };
 
 TEST_F(ResourcesTest, SetResourceAnswersAndStoresPerRow) {
@@ -247,7 +240,7 @@ TEST_F(ResourcesTest, SetResourceAnswersAndStoresPerRow) {
     SCOPED_TRACE(std::string(c.name) + " = " + std::to_string(c.value));
     context_->Duration = 42;
     EXPECT_EQ(Set(c.name, c.value), c.result);
-    EXPECT_TRUE(!c.read_back || Int32(c.read_back) == c.stored) << "not stored as " << c.stored;
+    EXPECT_TRUE(!c.read_back || context_->*c.read_back == c.stored) << "not stored as " << c.stored;
     EXPECT_EQ(context_->Duration, 42u);
     context_->TrickTime = 500;
     context_->TrickPlaySkipStartSpeed = 0;
@@ -262,7 +255,7 @@ TEST_F(ResourcesTest, SetResourceAnswersAndStoresPerRow) {
   EXPECT_EQ(Set("TrickTime", 800), 22);
   EXPECT_EQ(Ops().GetResources(handle_), nullptr);
   handle_->Kind = 2;
-  EXPECT_EQ(Int32("TrickTime"), 500);
+  EXPECT_EQ(context_->TrickTime, 500);
 }
 
 TEST_F(ResourcesTest, EventProducerListsEvent4AndIgnoresRegistration) {

@@ -26,28 +26,14 @@
 namespace {
 
 using namespace ebml;
-using plugin_test::ConnectBytes;
-using plugin_test::ConnectFile;
 using plugin_test::Connected;
 using plugin_test::FixtureFile;
 using plugin_test::HostPlugin;
 using testing_support::ExpectedTrack;
 using testing_support::FixtureExpectation;
-using testing_support::LogRecorder;
 
 uint32_t Fourcc(const std::string& code) {
   return uint32_t(code.at(0)) << 24 | uint32_t(code.at(1)) << 16 | uint32_t(code.at(2)) << 8 | uint32_t(code.at(3));
-}
-
-// FLAC's STREAMINFO is unpacked into the format's own configuration record.
-void CheckFlacConfig(const ExpectedTrack& track, const MkvChannel& channel) {
-  ASSERT_EQ(channel.Format.extra_size, 48u);
-  mkv_flac_config config;
-  std::memcpy(&config, channel.Format.extra_ptr, sizeof config);
-  EXPECT_EQ(config.sample_rate, track.flac_sample_rate);
-  EXPECT_EQ(config.channels, track.flac_channels);
-  EXPECT_EQ(config.bits_per_sample, track.flac_bits);
-  EXPECT_EQ(channel.State->DecoderConfigCount, 1u);
 }
 
 // Which channels are offered, in which order, with which code, picture size
@@ -77,14 +63,22 @@ void CheckChannel(const FixtureExpectation& fx, const ExpectedTrack& track, cons
     EXPECT_EQ(format.media.audio.channels, track.channels ? track.channels : 1);
     EXPECT_EQ(format.media.audio.bits_per_sample, 16u);
   }
-  if (track.codec == "A_FLAC") CheckFlacConfig(track, channel);
+  if (track.codec != "A_FLAC") return;
+  // FLAC's STREAMINFO is unpacked into the format's own configuration record.
+  ASSERT_EQ(format.extra_size, 48u);
+  mkv_flac_config config;
+  std::memcpy(&config, format.extra_ptr, sizeof config);
+  EXPECT_EQ(config.sample_rate, track.flac_sample_rate);
+  EXPECT_EQ(config.channels, track.flac_channels);
+  EXPECT_EQ(config.bits_per_sample, track.flac_bits);
+  EXPECT_EQ(channel.State->DecoderConfigCount, 1u);
 }
 
 TEST(RateInputFormatFixturesTest, OffersEverySupportedTrackWithItsFormat) {
   for (const std::string& name : testing_support::FixtureNames()) {
     SCOPED_TRACE(name);
     FixtureExpectation fx = testing_support::LoadFixture(name);
-    Connected c = ConnectFile(name);
+    Connected c = plugin_test::ConnectFile(name);
     ASSERT_TRUE(c.graph);
     const bool matroska = fx.doc_type == "matroska";
     EXPECT_EQ(c.graph->sniff(), matroska ? 80 : 0);
@@ -120,10 +114,8 @@ TEST(RateInputFormatFixturesTest, OffersEverySupportedTrackWithItsFormat) {
 
     // A seekable input is left at the first Cluster's ID.
     uint8_t id[4] = {};
-    uint64_t cluster = c.context()->FileInfo.first_cluster_position;
-    EXPECT_EQ(uint64_t(c.stream->Tell()), cluster);
-    ASSERT_EQ(c.stream->Read(id, 4), 4);
-    EXPECT_EQ(std::memcmp(id, "\x1F\x43\xB6\x75", 4), 0);
+    EXPECT_EQ(uint64_t(c.stream->Tell()), c.context()->FileInfo.first_cluster_position);
+    EXPECT_TRUE(c.stream->Read(id, 4) == 4 && std::memcmp(id, "\x1F\x43\xB6\x75", 4) == 0);
   }
 }
 
@@ -185,13 +177,6 @@ const MmfReadRequest& NextScanRequest(const Connected& c) {
   const auto* list_maker = HostPlugin().Get<MmfListMakerOps>("MediaListMaker");
   EXPECT_EQ(list_maker->GetNextReadList(c.graph->handle()->InputChannel, &next, previous), 0);
   return *next->Request;
-}
-
-int ToPosition(const Connected& c, uint64_t time, uint64_t* position) {
-  return HostPlugin().converter()->ConvertToPosition(c.graph->handle(), 0, time, position);
-}
-int ToTime(const Connected& c, uint64_t position, uint64_t* time) {
-  return HostPlugin().converter()->ConvertToTime(c.graph->handle(), 0, position, time);
 }
 
 constexpr uint64_t kPast48Bits = 281474977000;  // ms: 2^48 us and a bit
@@ -267,9 +252,10 @@ std::vector<Case> Cases() {
        [](auto& c, auto&, auto&) {
          EXPECT_EQ(c.context()->ByteRate, 800);
          uint64_t position = 0, time = 0;
-         EXPECT_EQ(ToPosition(c, kPast48Bits * 1000 + 1000001, &position), 0);
+         const MmfTimeConverterOps& converter = *HostPlugin().converter();
+         EXPECT_EQ(converter.ConvertToPosition(c.graph->handle(), 0, kPast48Bits * 1000 + 1000001, &position), 0);
          EXPECT_EQ(position, InFile(c, 900));
-         EXPECT_EQ(ToTime(c, position, &time), 0);
+         EXPECT_EQ(converter.ConvertToTime(c.graph->handle(), 0, position, &time), 0);
          EXPECT_EQ(time, (kPast48Bits + 1000) * 1000);
        }},
       {"a seek to a cue position with a codec state",
@@ -295,8 +281,8 @@ std::vector<Case> Cases() {
 TEST(RateInputFormatCasesTest, TrackSetUpFollowsTheCodecRules) {
   for (const Case& test : Cases()) {
     SCOPED_TRACE(test.name);
-    LogRecorder log;
-    Connected c = ConnectBytes(test.file);
+    testing_support::LogRecorder log;
+    Connected c = plugin_test::ConnectBytes(test.file);
     ASSERT_EQ(c.graph->rating(), 80);
     ASSERT_GE(c.channel_count(), 1);
     test.check(c, *c.channel(0).State, c.channel(0).Format);
