@@ -14,8 +14,7 @@ missing=$work/missing.mkv
 
 # exit code | stream (out, err) | expected substrings, parted by & | arguments (words; $mkv, $fixtures, $not_mkv, $missing, $work expand)
 while IFS='|' read -r code stream want args; do
-  want=${want//\$missing/$missing}; want=${want//\$not_mkv/$not_mkv}; want=${want//\$work/$work}
-  args=${args//\$mkv/$mkv}; args=${args//\$fixtures/$fixtures}; args=${args//\$missing/$missing}; args=${args//\$not_mkv/$not_mkv}; args=${args//\$work/$work}
+  for v in mkv fixtures missing not_mkv work; do want=${want//\$$v/${!v}} args=${args//\$$v/${!v}}; done
   # shellcheck disable=SC2086
   "${kelvane[@]}" $args </dev/null >"$work/out" 2>"$work/err"
   got=$?
@@ -135,9 +134,7 @@ EOF2
 
 # Every help text names every option the command accepts.
 for command in info probe packets metadata extract; do
-  help=$("${kelvane[@]}" "$command" --help)
-  accepted=$(grep -o -- '--[a-z-]*' <<<"$help" | sort -u)
-  for option in $accepted; do
+  for option in $("${kelvane[@]}" "$command" --help | grep -o -- '--[a-z-]*' | sort -u); do
     "${kelvane[@]}" "$command" "$option" >/dev/null 2>"$work/err" </dev/null
     grep -q "unknown option '$option'" "$work/err" && fail "$command --help mentions $option, which it refuses"
   done
