@@ -36,8 +36,7 @@ done <<'EOF'
 2|err|no command given|
 2|err|unknown command 'frob'|frob
 2|err|try 'kelvane --help'|help frob
-0|out|usage: kelvane info [--json] [--tree] FILE|info --help
-0|out|the demuxer's own header parser|info -h
+0|out|usage: kelvane info [--json] [--tree] FILE&the demuxer's own header parser|info -h
 0|out|usage: kelvane info|help info
 2|err|kelvane info: no FILE given|info
 2|err|kelvane info: unknown option '--frob'&try 'kelvane info --help'|info --frob $mkv
@@ -50,8 +49,7 @@ done <<'EOF'
 0|out|Language: eng (not stated: the default), BCP 47: en&Duration: 00:00:02.048 (2048000000 ns)|info $fixtures/multi_audio.mkv
 0|out|Tracks: 3 (video 1, audio 0, subtitles 2, other 0)|info $fixtures/subtitles_srt.mkv
 0|out|SimpleBlock: track 1, timecode 0, keyframe|info --tree $mkv
-0|out|usage: kelvane probe [--json] [--plugin PATH] FILE|probe --help
-0|out|--plugin PATH|probe -h
+0|out|usage: kelvane probe [--json] [--plugin PATH] FILE&--plugin PATH|probe -h
 2|err|kelvane probe: no FILE given|probe --json
 2|err|kelvane probe: --plugin needs a PATH|probe $mkv --plugin
 2|err|kelvane probe: unknown option '--frob'|probe --frob $mkv
@@ -62,8 +60,7 @@ done <<'EOF'
 1|err|kelvane probe: cannot load the plug-in $missing|probe --plugin $missing $mkv
 0|out|fourcc: AVC1|probe $mkv
 0|out|channel 1 (track 2) is stored with zlib compression|probe $fixtures/rich_headers.mkv
-0|out|usage: kelvane packets [OPTIONS] FILE|packets --help
-0|out|--channels K,K,...&--buffer-size BYTES&--no-hash&--trick-time MS|packets -h
+0|out|usage: kelvane packets [OPTIONS] FILE&--channels K,K,...&--buffer-size BYTES&--no-hash&--trick-time MS|packets -h
 0|out|--seek TIME[@AT]|help packets
 2|err|kelvane packets: no FILE given|packets --no-hash
 2|err|kelvane packets: --buffer-size: '0' is not a number of bytes|packets --buffer-size 0 $mkv
@@ -81,13 +78,11 @@ done <<'EOF'
 2|err|kelvane packets: FILE cannot be standard input|packets -
 1|err|kelvane packets: cannot open $missing: No such file or directory|packets $missing
 1|err|kelvane packets: $not_mkv: not a Matroska file|packets $not_mkv
-2|err|kelvane packets: --buffer-size: '0' is not a number of bytes|packets --buffer-size=0 $mkv
 2|err|kelvane packets: --frames: '0' is not N|packets --frames 0 $mkv
 0|out|1 2 seek|packets --seek 1 --frames 1 $mkv
 1|out|"error": "the plug-in refused the file"|packets --json $not_mkv
 0|out|0 1 0 2300 66fcf3ed|packets $mkv
-0|out|usage: kelvane metadata [--json] [--plugin PATH] FILE|metadata --help
-0|out|NUM4|metadata -h
+0|out|usage: kelvane metadata [--json] [--plugin PATH] FILE&NUM4|metadata -h
 2|err|kelvane metadata: no FILE given|metadata
 2|err|kelvane metadata: unknown option '--frob'|metadata --frob $mkv
 2|err|kelvane metadata: FILE cannot be standard input|metadata -

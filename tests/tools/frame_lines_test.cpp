@@ -64,13 +64,9 @@ std::string Written(FrameLines& lines, int32_t channel, bool in_memory) {
 }
 
 TEST(FrameLinesTest, EveryChannelsLinesComeOutWholeAndInOrder) {
-  struct Case {
-    const char* name;
-    bool hash;
-    std::vector<size_t> frames;  // per channel
-    size_t batch;                // frames per call, as a sink hands over one output buffer's
-    bool in_place;               // gathered in the room FrameLines gives, as the runner's sinks do
-  };
+  // frames per channel; batch: frames per call, as a sink hands over one output buffer's; in_place:
+  // gathered in the room FrameLines gives, as the runner's sinks do.
+  struct Case { const char* name; bool hash; std::vector<size_t> frames; size_t batch; bool in_place; };
   const Case cases[] = {
       {"one short channel", false, {5}, 256, false},
       {"four channels through many chunks and blocks", false, {40'000, 9'000, 2'048, 0}, 256, false},
