@@ -102,9 +102,8 @@ done <<'EOF'
 EOF
 
 # --until and --frames end playback early: the audio frames before 0.5 s as mkvinfo lists them, 3 per channel.
-want=$(awk '$1 == 2 && $2 < 500 { n += split($5, f, ",") } END { print n }' "$fixtures/avc_aac.blocks")
-got=$("${kelvane[@]}" packets --no-hash --channels 1 --until 0.5 "$mkv" | awk '$3 != "config"' | wc -l)
-[[ $got == "$want" ]] || fail "packets --until 0.5: $got audio frames, mkvinfo lists $want before 0.5 s"
+expect "packets --until 0.5: audio frames" "$(awk '$1 == 2 && $2 < 500 { n += split($5, f, ",") } END { print n }' \
+  "$fixtures/avc_aac.blocks")" "$("${kelvane[@]}" packets --no-hash --channels 1 --until 0.5 "$mkv" | grep -vc config)"
 got=$("${kelvane[@]}" packets --no-hash --frames 3 "$mkv" | awk '$3 != "config" { n[$1]++ } END { print n[0], n[1] }')
 [[ $got == "3 3" ]] || fail "packets --frames 3: $got frames on the channels"
 

@@ -51,12 +51,9 @@ std::string Written(FrameLines& lines, int32_t channel, bool in_memory) {
   EXPECT_NE(out, nullptr);
   std::fputs("config line\n", out);
   EXPECT_TRUE(lines.Write(channel, out));
-  std::string text;
-  if (!in_memory) {
-    text.resize(static_cast<size_t>(std::ftell(out)));
-    std::rewind(out);
-    EXPECT_EQ(std::fread(text.data(), 1, text.size(), out), text.size());
-  }
+  std::string text(in_memory ? 0 : static_cast<size_t>(std::ftell(out)), '\0');
+  if (!in_memory) std::rewind(out);
+  EXPECT_EQ(std::fread(text.data(), 1, text.size(), out), text.size());
   std::fclose(out);
   if (in_memory) text.assign(memory, memory_size);
   std::free(memory);
