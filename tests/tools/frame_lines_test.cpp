@@ -51,12 +51,9 @@ std::string Written(FrameLines& lines, int32_t channel, bool in_memory) {
   EXPECT_NE(out, nullptr);
   std::fputs("config line\n", out);
   EXPECT_TRUE(lines.Write(channel, out));
-  std::string text;
-  if (!in_memory) {
-    text.resize(static_cast<size_t>(std::ftell(out)));
-    std::rewind(out);
-    EXPECT_EQ(std::fread(text.data(), 1, text.size(), out), text.size());
-  }
+  std::string text(in_memory ? 0 : static_cast<size_t>(std::ftell(out)), '\0');
+  if (!in_memory) std::rewind(out);
+  EXPECT_EQ(std::fread(text.data(), 1, text.size(), out), text.size());
   std::fclose(out);
   if (in_memory) text.assign(memory, memory_size);
   std::free(memory);
@@ -64,13 +61,9 @@ std::string Written(FrameLines& lines, int32_t channel, bool in_memory) {
 }
 
 TEST(FrameLinesTest, EveryChannelsLinesComeOutWholeAndInOrder) {
-  struct Case {
-    const char* name;
-    bool hash;
-    std::vector<size_t> frames;  // per channel
-    size_t batch;                // frames per call, as a sink hands over one output buffer's
-    bool in_place;               // gathered in the room FrameLines gives, as the runner's sinks do
-  };
+  // frames per channel; batch: frames per call, as a sink hands over one output buffer's; in_place:
+  // gathered in the room FrameLines gives, as the runner's sinks do.
+  struct Case { const char* name; bool hash; std::vector<size_t> frames; size_t batch; bool in_place; };
   const Case cases[] = {
       {"one short channel", false, {5}, 256, false},
       {"four channels through many chunks and blocks", false, {40'000, 9'000, 2'048, 0}, 256, false},
