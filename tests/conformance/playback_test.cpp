@@ -5,9 +5,9 @@
 // sinks at different speeds on their own threads (run under ThreadSanitizer),
 // and, for the small files, in buffers of every size up to 64 bytes and split
 // at every byte. The small files are then damaged: every truncation, flipped
-// bit and, for the smallest, every failed allocation must end (ctest's timeout
-// fails a hung case) with no frame element outside the input and no block
-// left allocated.
+// bit, overwritten block or lace header byte and, for the smallest, every
+// failed allocation must end (ctest's timeout fails a hung case) with no frame
+// element outside the input and no block left allocated.
 //
 // KELVANE_FIXTURES names another fixture directory (drawn_remuxes.sh).
 // KELVANE_SWEEP=quick (the default of a cross build run under an emulator)
@@ -33,6 +33,7 @@
 #include "host/graph_runner.h"
 #include "host/heap_control.h"
 #include "host/log_control.h"
+#include "tests/support/cluster_driver.h"
 #include "tests/support/fixtures.h"
 #include "tests/support/playback_expectations.h"
 #include "tests/support/plugin_under_test.h"
@@ -42,7 +43,7 @@ namespace {
 using namespace playback_test;
 
 constexpr size_t kTiny = 7500;    // split at every byte; the only files swept in quick mode
-constexpr size_t kSmall = 10000;  // every buffer size, truncation and flipped bit
+constexpr size_t kSmall = 10000;  // every buffer size, truncation, flipped bit and header byte
 
 bool Quick() {
   const char* mode = std::getenv("KELVANE_SWEEP");
@@ -231,8 +232,33 @@ TEST_P(ConformanceTest, ChannelsAtDifferentSpeedsEachGetTheirWholeTrack) {
   }
 }
 
-// Every truncation delivers a prefix of the full run's frames; every flipped bit ends.
-TEST_P(ConformanceTest, EveryTruncationAndFlippedBitEnds) {
+// Byte ranges [start, end) of every SimpleBlock's and Block's element header,
+// block header and lace header (cut at 24 bytes of the block's data).
+std::vector<std::pair<size_t, size_t>> BlockHeaders(const std::vector<uint8_t>& b) {
+  using testing_support::cluster_driver_detail::read_vint;
+  std::vector<std::pair<size_t, size_t>> out;
+  std::vector<std::pair<uint64_t, uint64_t>> ranges = {{0, b.size()}};
+  while (!ranges.empty()) {
+    auto [pos, end] = ranges.back();
+    ranges.pop_back();
+    while (pos < end) {
+      uint64_t start = pos, id = 0, size = 0;
+      if (!read_vint(b.data(), b.size(), &pos, &id, true) || !read_vint(b.data(), b.size(), &pos, &size, false)) break;
+      const uint64_t data_end = size > end - std::min(end, pos) ? end : pos + size;
+      if (id == 0x18538067 || id == 0x1F43B675 || id == 0xA0) {  // Segment, Cluster, BlockGroup
+        ranges.push_back({pos, data_end});
+      } else if (id == 0xA3 || id == 0xA1) {  // SimpleBlock, Block
+        out.push_back({start, std::min(data_end, pos + 24)});
+      }
+      pos = data_end;
+    }
+  }
+  return out;
+}
+
+// Every truncation delivers a prefix of the full run's frames; every flipped bit and every
+// overwritten byte of a block or lace header ends.
+TEST_P(ConformanceTest, EveryTruncationFlippedBitAndOverwrittenHeaderByteEnds) {
   if (!Swept(kSmall)) GTEST_SKIP() << "the small files only";
   const host::RunResult full = FullRun();
   for (size_t length = 0; length < bytes_.size() && !HasFatalFailure(); length += Stride(1, 7)) {
@@ -243,6 +269,19 @@ TEST_P(ConformanceTest, EveryTruncationAndFlippedBitEnds) {
     std::vector<uint8_t> flipped = bytes_;
     flipped[bit / 8] ^= static_cast<uint8_t>(0x80 >> (bit % 8));
     PlayDamaged(flipped, "bit " + std::to_string(bit) + " flipped", nullptr);
+  }
+  // Values that single flipped bits never give a size or lace count: zero, one, the largest.
+  const auto headers = BlockHeaders(bytes_);
+  ASSERT_EQ(headers.size(), fixture_.blocks.size());  // the walker found the blocks, not noise
+  for (size_t h = 0; h < headers.size(); h += Quick() ? 3 : 1) {
+    for (size_t pos = headers[h].first; pos < headers[h].second; ++pos) {
+      for (uint8_t value : {0x00, 0x01, 0x7F, 0x80, 0xFE, 0xFF}) {
+        if (bytes_[pos] == value) continue;
+        std::vector<uint8_t> changed = bytes_;
+        changed[pos] = value;
+        PlayDamaged(changed, "byte " + std::to_string(pos) + " set to " + std::to_string(value), nullptr);
+      }
+    }
   }
 }
 
