@@ -3,7 +3,7 @@
 // does: consecutive buffers as inbuff1 and inbuff2, the caller applying each
 // skip result and consuming each block's frames by their sizes (crossing into
 // the next buffer as needed), and checksumming the frame bytes it consumed.
-// Header-only, so the fuzzer and the benchmark can use it without GoogleTest.
+// Header-only, so the cluster fuzzer can use it without GoogleTest.
 
 #include <cstddef>
 #include <cstdint>
